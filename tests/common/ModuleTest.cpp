@@ -1,0 +1,124 @@
+#include "common/Module.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <cstdio>
+#include <vector>
+
+namespace TavoPlayer {
+namespace {
+
+class TestModule : public Module {
+public:
+    explicit TestModule(const std::string& name) : Module(name) {}
+    TestModule(const TestModule& other) : android::RefBase(), Module(other) {}
+    unsigned int start() override { return 0; }
+    unsigned int stop() override { return 0; }
+    size_t outputCount() const { return mOutputs.size(); }
+    const OutputList& outputs() const { return mOutputs; }
+    bool hasInput() const { return mInput != nullptr; }
+    size_t listenerCount() const { return mErrorListeners.size(); }
+};
+
+struct Call {
+    int listener;
+    unsigned int code;
+    const Module* module;
+};
+
+class RecordingListener : public ErrorListener {
+public:
+    RecordingListener(int id, std::vector<Call>* calls) : mId(id), mCalls(calls) {}
+    void onError(unsigned int code, const Module* module) const override {
+        mCalls->push_back({mId, code, module});
+    }
+
+private:
+    int mId;
+    std::vector<Call>* mCalls;
+};
+
+std::string dumpToString(Module& module, FILE* (*open)(), int indent) {
+    FILE* f = open();
+    module.dump(f, indent);
+    fflush(f);
+    rewind(f);
+    std::string text;
+    char buffer[256];
+    size_t n;
+    while ((n = fread(buffer, 1, sizeof buffer, f)) > 0) text.append(buffer, n);
+    fclose(f);
+    return text;
+}
+
+class ModuleTest : public ::testing::Test {
+protected:
+    android::sp<TestModule> module = new TestModule("TS Parser");
+    std::vector<Call> calls;
+};
+
+TEST_F(ModuleTest, OnErrorWithoutListenersReturnsZero) {
+    EXPECT_EQ(0u, module->onError(0x21003));
+    EXPECT_TRUE(calls.empty());
+}
+
+TEST_F(ModuleTest, OnErrorReachesListenersInOrderWithTheModule) {
+    RecordingListener first(1, &calls);
+    RecordingListener second(2, &calls);
+    module->addErrorListener(first);
+    module->addErrorListener(second);
+    EXPECT_EQ(0u, module->onError(0x21003));
+    ASSERT_EQ(2u, calls.size());
+    EXPECT_EQ(1, calls[0].listener);
+    EXPECT_EQ(2, calls[1].listener);
+    for (const Call& call : calls) {
+        EXPECT_EQ(0x21003u, call.code);
+        EXPECT_EQ(module.get(), call.module);
+    }
+}
+
+TEST_F(ModuleTest, RemoveOutputKeepsOrderAndAdvancesIterator) {
+    android::sp<RingBuffer> a = new RingBuffer, b = new RingBuffer, c = new RingBuffer;
+    Module::OutputList::iterator whereB;
+    EXPECT_EQ(0u, module->addOutput(a, nullptr));
+    EXPECT_EQ(0u, module->addOutput(b, &whereB));
+    EXPECT_EQ(0u, module->addOutput(c, nullptr));
+    module->removeOutput(&whereB);
+    ASSERT_EQ(2u, module->outputCount());
+    EXPECT_EQ(a, module->outputs().front());
+    EXPECT_EQ(c, module->outputs().back());
+    EXPECT_EQ(c, *whereB);
+    // The module held the only other reference to b besides this test.
+    EXPECT_EQ(1, b->getStrongCount());
+}
+
+TEST_F(ModuleTest, CopyKeepsOnlyTheName) {
+    RecordingListener listener(1, &calls);
+    module->addErrorListener(listener);
+    module->setInput(new RingBuffer);
+    module->addOutput(new RingBuffer, nullptr);
+    android::sp<TestModule> copy = new TestModule(*module);
+    EXPECT_EQ("TS Parser", copy->getModuleName());
+    EXPECT_EQ(0u, copy->outputCount());
+    EXPECT_FALSE(copy->hasInput());
+    EXPECT_EQ(0u, copy->listenerCount());
+}
+
+TEST_F(ModuleTest, SetInputReplacesTheReference) {
+    android::sp<RingBuffer> first = new RingBuffer, second = new RingBuffer;
+    module->setInput(first);
+    EXPECT_EQ(2, first->getStrongCount());
+    module->setInput(second);
+    EXPECT_EQ(1, first->getStrongCount());
+    EXPECT_EQ(2, second->getStrongCount());
+}
+
+TEST_F(ModuleTest, DumpWritesIndentedName) {
+    EXPECT_EQ(0u, module->dump(nullptr, 2));
+    EXPECT_EQ("\t\t - Module Name: TS Parser\n", dumpToString(*module, tmpfile, 2));
+    EXPECT_EQ(" - Module Name: TS Parser\n", dumpToString(*module, tmpfile, 0));
+}
+
+}  // namespace
+}  // namespace TavoPlayer

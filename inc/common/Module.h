@@ -36,7 +36,8 @@ public:
     virtual unsigned int stop() = 0;
     // Appends `ring`; when `where` is not null it receives an iterator to the new
     // element, for a later removeOutput of exactly this output. Returns 0.
-    virtual unsigned int addOutput(const android::sp<RingBuffer>& ring, OutputList::iterator* where);
+    virtual unsigned int addOutput(const android::sp<RingBuffer>& ring,
+                                   OutputList::iterator* where);
     // Erases *where and moves *where to the following element.
     virtual void removeOutput(OutputList::iterator* where);
     virtual unsigned int setInput(const android::sp<RingBuffer>& ring);

@@ -28,18 +28,21 @@ std::string AudioFragmentData::toString() {
 }
 
 bool AudioFragmentData::fromString(char* text) {
-    if (text == nullptr) return false;
+    if (text == nullptr)
+        return false;
     unsigned long long pts = mPTS;
     int rate = static_cast<int>(mSamplingRate);
     // Kept as designed: "lu" after the time, and the channel count and sample width
     // read as single characters. toString() output stops matching after mPTS.
-    const int assigned = sscanf(
-        text,
-        "mType = %u\nmSize = %u\nmPTS = %llulu\nmNumberChannels = %c\nmBitsPerSample = %c\nmSamplingRate = %d\n",
-        &mType, &mSize, &pts, reinterpret_cast<char*>(&mNumberChannels),
-        reinterpret_cast<char*>(&mBitsPerSample), &rate);
-    if (assigned >= 3) mPTS = pts;
-    if (assigned >= 6) mSamplingRate = static_cast<uint32_t>(rate);
+    const int assigned = sscanf(text,
+                                "mType = %u\nmSize = %u\nmPTS = %llulu\nmNumberChannels = "
+                                "%c\nmBitsPerSample = %c\nmSamplingRate = %d\n",
+                                &mType, &mSize, &pts, reinterpret_cast<char*>(&mNumberChannels),
+                                reinterpret_cast<char*>(&mBitsPerSample), &rate);
+    if (assigned >= 3)
+        mPTS = pts;
+    if (assigned >= 6)
+        mSamplingRate = static_cast<uint32_t>(rate);
     return assigned == 6;
 }
 

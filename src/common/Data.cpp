@@ -8,7 +8,8 @@ namespace TavoPlayer {
 
 void Data::appendLine(char* buffer, const char* format, ...) {
     const size_t used = strnlen(buffer, kToStringBufferSize);
-    if (used + 1 >= kToStringBufferSize) return;
+    if (used + 1 >= kToStringBufferSize)
+        return;
     va_list args;
     va_start(args, format);
     vsnprintf(buffer + used, kToStringBufferSize - used, format, args);

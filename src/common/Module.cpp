@@ -21,12 +21,14 @@ std::string Module::getModuleName() const {
 
 unsigned int Module::addOutput(const android::sp<RingBuffer>& ring, OutputList::iterator* where) {
     auto added = mOutputs.insert(mOutputs.end(), ring);
-    if (where != nullptr) *where = added;
+    if (where != nullptr)
+        *where = added;
     return 0;
 }
 
 void Module::removeOutput(OutputList::iterator* where) {
-    if (where == nullptr) return;
+    if (where == nullptr)
+        return;
     *where = mOutputs.erase(*where);
 }
 
@@ -36,7 +38,8 @@ unsigned int Module::setInput(const android::sp<RingBuffer>& ring) {
 }
 
 unsigned int Module::dump(FILE* stream, int indent) {
-    if (stream == nullptr) return 0;
+    if (stream == nullptr)
+        return 0;
     const std::string prefix(indent > 0 ? static_cast<size_t>(indent) : 0, '\t');
     fprintf(stream, "%s - Module Name: %s\n", prefix.c_str(), mName.c_str());
     return 0;

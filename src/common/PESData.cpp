@@ -29,16 +29,20 @@ std::string PESData::toString() {
 }
 
 bool PESData::fromString(char* text) {
-    if (text == nullptr) return false;
+    if (text == nullptr)
+        return false;
     unsigned long long pts = mPTS;
     unsigned long long dts = mDTS;
     // The format expects the letters "lu" after each time, on purpose: a text made
     // by toString() stops matching after mPTS, so this returns false for it.
-    const int assigned =
-        sscanf(text, "mType = %u\nmSize = %u\nmPTS = %llulu\nmDTS = %llulu\nmOffsetES = %u\nmSizeES = %u\n",
-               &mType, &mSize, &pts, &dts, &mOffsetES, &mSizeES);
-    if (assigned >= 3) mPTS = pts;
-    if (assigned >= 4) mDTS = dts;
+    const int assigned = sscanf(
+        text,
+        "mType = %u\nmSize = %u\nmPTS = %llulu\nmDTS = %llulu\nmOffsetES = %u\nmSizeES = %u\n",
+        &mType, &mSize, &pts, &dts, &mOffsetES, &mSizeES);
+    if (assigned >= 3)
+        mPTS = pts;
+    if (assigned >= 4)
+        mDTS = dts;
     return assigned == 6;
 }
 

@@ -134,13 +134,15 @@ unsigned int RingBuffer::configureImpl(const char* function, std::string name, u
 
 bool RingBuffer::waitForSpace(uint32_t bytes) {
     pthread_mutex_lock(&mWriteLock);
-    if (waitForSpace_l(bytes)) return true;
+    if (waitForSpace_l(bytes))
+        return true;
     pthread_mutex_unlock(&mWriteLock);
     return false;
 }
 
 bool RingBuffer::waitForSpace_l(uint32_t bytes) {
-    if (freeSpace() >= bytes) return true;
+    if (freeSpace() >= bytes)
+        return true;
     const timespec deadline = waitDeadline();
     pthread_cond_timedwait(&mSpaceAvailable, &mWriteLock, &deadline);
     return freeSpace() >= bytes;
@@ -236,7 +238,8 @@ std::string RingBuffer::getRepresentation() const {
 }
 
 void RingBuffer::dump(FILE* stream, int indent) {
-    if (stream == nullptr) return;
+    if (stream == nullptr)
+        return;
     const std::string prefix(indent > 0 ? static_cast<size_t>(indent) : 0, '\t');
     const char* p = prefix.c_str();
     fprintf(stream, "\e[2K\r%s - RingBuffer %s\n", p, mName.c_str());
@@ -253,7 +256,8 @@ void RingBuffer::dump(FILE* stream, int indent) {
             static_cast<double>(head - tail) / mSize * 100.0);
     fprintf(stream, "\e[2K\r%s\tPointer: %p\n", p, static_cast<void*>(mBuffer));
     auto lockText = [](pthread_mutex_t* lock) {
-        if (pthread_mutex_trylock(lock) != 0) return "\e[01;31mLocked\e[m";
+        if (pthread_mutex_trylock(lock) != 0)
+            return "\e[01;31mLocked\e[m";
         pthread_mutex_unlock(lock);
         return "\e[01;32mUnlocked\e[m";
     };

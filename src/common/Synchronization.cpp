@@ -67,7 +67,8 @@ void Synchronization::setBasePCR(Uint33 pcr, module_t module) {
     Uint33 expected = 0;
     uint64_t diff = 0;
     if (mValid[module]) {
-        if (!mResyncEnabled) return;
+        if (!mResyncEnabled)
+            return;
         const uint64_t elapsed = now - mBaseTime[module];
         expected = mask33(mBasePCR[module] + elapsed * kTicksPerMs);
         diff = static_cast<uint64_t>(std::llabs(diff33(adjusted, expected)));
@@ -112,7 +113,8 @@ void Synchronization::setBasePCR(Uint33 pcr, module_t module) {
 }
 
 void Synchronization::checkForBadRealPCR(unsigned long now) {
-    if (!mValid[RealPCR]) return;
+    if (!mValid[RealPCR])
+        return;
     const Uint33 real = currentPCR_l(RealPCR, now);
     const int64_t dA = mValid[Audio] ? diff33(real, currentPCR_l(Audio, now)) : 0;
     const int64_t dV = mValid[Video] ? diff33(real, currentPCR_l(Video, now)) : 0;
@@ -129,15 +131,18 @@ void Synchronization::checkForBadRealPCR(unsigned long now) {
 }
 
 void Synchronization::setOffsetTime(int timeInMs, module_t module) {
-    TAVO_LOGD("%s timeInMs = %d currentModule = %d\n", __func__, timeInMs, static_cast<int>(module));
-    if (module < 4) mOffsetTime[module] = timeInMs;
+    TAVO_LOGD("%s timeInMs = %d currentModule = %d\n", __func__, timeInMs,
+              static_cast<int>(module));
+    if (module < 4)
+        mOffsetTime[module] = timeInMs;
 }
 
 void Synchronization::resetPCR() {
     TAVO_LOGD("%s\n", __func__);
     std::lock_guard<std::mutex> lock(mLock);
     mPauseTime = 0;
-    for (bool& valid : mValid) valid = false;
+    for (bool& valid : mValid)
+        valid = false;
     mCurrentModule = None;
 }
 
@@ -153,12 +158,15 @@ void Synchronization::resume() {
     Uint33 pcr = 0;
     {
         std::lock_guard<std::mutex> lock(mLock);
-        if (mPauseTime == 0) return;
+        if (mPauseTime == 0)
+            return;
         const uint64_t now = getTimestamp();
-        if (now == mPauseTime) return;  // the pause stays recorded
+        if (now == mPauseTime)
+            return;  // the pause stays recorded
         // When the clock cannot be read this is -mPauseTime, accepted as designed.
         const uint64_t paused = now - mPauseTime;
-        for (uint64_t& baseTime : mBaseTime) baseTime += paused;
+        for (uint64_t& baseTime : mBaseTime)
+            baseTime += paused;
         mPauseTime = 0;
         pcr = currentPCR_l(mCurrentModule, getTimestamp());
     }
@@ -170,7 +178,8 @@ void Synchronization::resume() {
 
 Uint33 Synchronization::getPCR() {
     std::lock_guard<std::mutex> lock(mLock);
-    if (mCurrentModule == None) return 0;
+    if (mCurrentModule == None)
+        return 0;
     return currentPCR_l(mCurrentModule, getTimestamp());
 }
 
@@ -180,7 +189,8 @@ void Synchronization::addPCRListener(PCRListener* listener) {
 }
 
 void Synchronization::dump(FILE* stream, int indent) {
-    if (stream == nullptr) return;
+    if (stream == nullptr)
+        return;
     const std::string prefix(indent > 0 ? static_cast<size_t>(indent) : 0, '\t');
     const char* p = prefix.c_str();
     const uint64_t now = getTimestamp();

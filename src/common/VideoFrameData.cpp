@@ -34,12 +34,15 @@ std::string VideoFrameData::toString() {
 }
 
 bool VideoFrameData::fromString(char* text) {
-    if (text == nullptr) return false;
+    if (text == nullptr)
+        return false;
     unsigned long long pts = mPTS;
     // The trailing "lu" does not match toString() output, but all three fields are
     // assigned before that point, so the round trip succeeds for this record.
-    const int assigned = sscanf(text, "mType = %u\nmSize = %u\nmPTS = %llulu\n", &mType, &mSize, &pts);
-    if (assigned >= 3) mPTS = pts;
+    const int assigned =
+        sscanf(text, "mType = %u\nmSize = %u\nmPTS = %llulu\n", &mType, &mSize, &pts);
+    if (assigned >= 3)
+        mPTS = pts;
     return assigned == 3;
 }
 

@@ -47,7 +47,8 @@ std::string dumpToString(Module& module, FILE* (*open)(), int indent) {
     std::string text;
     char buffer[256];
     size_t n;
-    while ((n = fread(buffer, 1, sizeof buffer, f)) > 0) text.append(buffer, n);
+    while ((n = fread(buffer, 1, sizeof buffer, f)) > 0)
+        text.append(buffer, n);
     fclose(f);
     return text;
 }

@@ -22,7 +22,8 @@ size_t TraceCapture::count(const std::string& fragment) const {
     std::lock_guard<std::mutex> lock(mMutex);
     size_t n = 0;
     for (const Line& line : mLines) {
-        if (line.text.find(fragment) != std::string::npos) ++n;
+        if (line.text.find(fragment) != std::string::npos)
+            ++n;
     }
     return n;
 }
@@ -31,7 +32,8 @@ size_t TraceCapture::count(uint32_t severity, const std::string& fragment) const
     std::lock_guard<std::mutex> lock(mMutex);
     size_t n = 0;
     for (const Line& line : mLines) {
-        if (line.severity == severity && line.text.find(fragment) != std::string::npos) ++n;
+        if (line.severity == severity && line.text.find(fragment) != std::string::npos)
+            ++n;
     }
     return n;
 }
@@ -46,7 +48,8 @@ std::string TraceCapture::all() const {
     std::string text;
     for (const Line& line : mLines) {
         text += line.text;
-        if (text.empty() || text.back() != '\n') text += '\n';
+        if (text.empty() || text.back() != '\n')
+            text += '\n';
     }
     return text;
 }

@@ -57,12 +57,12 @@ bool OneSegPGL_TraceEnabled(uint32_t severity);
 void OneSegPGL_Trace(uint32_t severity, const char* format, ...)
     __attribute__((format(printf, 2, 3)));
 
-#define TAVO_TRACE_AT(sev, ...)                                   \
-    do {                                                          \
-        if (OneSegPGL_TraceEnabled(sev)) {                        \
-            OneSegPGL_SetDebugLocation(__FILE__, __LINE__);       \
-            OneSegPGL_Trace(sev, __VA_ARGS__);                    \
-        }                                                         \
+#define TAVO_TRACE_AT(sev, ...)                             \
+    do {                                                    \
+        if (OneSegPGL_TraceEnabled(sev)) {                  \
+            OneSegPGL_SetDebugLocation(__FILE__, __LINE__); \
+            OneSegPGL_Trace(sev, __VA_ARGS__);              \
+        }                                                   \
     } while (0)
 
 #define TAVO_LOGE(...) TAVO_TRACE_AT(::TavoPlayer::TRACE_ERROR, __VA_ARGS__)

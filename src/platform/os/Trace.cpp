@@ -4,13 +4,13 @@
 #include <syslog.h>
 #include <time.h>
 
+#include <strings.h>
 #include <atomic>
 #include <cstdarg>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <mutex>
-#include <strings.h>
 
 namespace TavoPlayer {
 namespace {
@@ -30,31 +30,46 @@ thread_local const char* tFile = "";
 thread_local int tLine = 0;
 
 uint32_t parseLevel(const char* text) {
-    if (text == nullptr) return TRACE_INFO;
-    if (strcasecmp(text, "error") == 0) return TRACE_ERROR;
-    if (strcasecmp(text, "warning") == 0 || strcasecmp(text, "warn") == 0) return TRACE_WARNING;
-    if (strcasecmp(text, "info") == 0) return TRACE_INFO;
-    if (strcasecmp(text, "debug") == 0) return TRACE_DEBUG;
-    if (strcasecmp(text, "none") == 0 || strcasecmp(text, "off") == 0) return kTraceNone;
+    if (text == nullptr)
+        return TRACE_INFO;
+    if (strcasecmp(text, "error") == 0)
+        return TRACE_ERROR;
+    if (strcasecmp(text, "warning") == 0 || strcasecmp(text, "warn") == 0)
+        return TRACE_WARNING;
+    if (strcasecmp(text, "info") == 0)
+        return TRACE_INFO;
+    if (strcasecmp(text, "debug") == 0)
+        return TRACE_DEBUG;
+    if (strcasecmp(text, "none") == 0 || strcasecmp(text, "off") == 0)
+        return kTraceNone;
     return TRACE_INFO;
 }
 
 const char* severityName(uint32_t severity) {
     switch (severity) {
-        case TRACE_ERROR: return "E";
-        case TRACE_WARNING: return "W";
-        case TRACE_INFO: return "I";
-        case TRACE_DEBUG: return "D";
-        default: return "?";
+        case TRACE_ERROR:
+            return "E";
+        case TRACE_WARNING:
+            return "W";
+        case TRACE_INFO:
+            return "I";
+        case TRACE_DEBUG:
+            return "D";
+        default:
+            return "?";
     }
 }
 
 int syslogPriority(uint32_t severity) {
     switch (severity) {
-        case TRACE_ERROR: return LOG_ERR;
-        case TRACE_WARNING: return LOG_WARNING;
-        case TRACE_INFO: return LOG_INFO;
-        default: return LOG_DEBUG;
+        case TRACE_ERROR:
+            return LOG_ERR;
+        case TRACE_WARNING:
+            return LOG_WARNING;
+        case TRACE_INFO:
+            return LOG_INFO;
+        default:
+            return LOG_DEBUG;
     }
 }
 
@@ -68,7 +83,8 @@ void writeLine(const TraceRecord& record) {
     pthread_getname_np(pthread_self(), threadName, sizeof threadName);
     // The message's own newline is the line's end; add one where it has none.
     size_t len = record.text.size();
-    while (len > 0 && record.text[len - 1] == '\n') --len;
+    while (len > 0 && record.text[len - 1] == '\n')
+        --len;
     if (gUseSyslog.load(std::memory_order_relaxed)) {
         syslog(syslogPriority(record.severity), "%s [%s] %s:%d %.*s", severityName(record.severity),
                threadName, baseName(record.file), record.line, static_cast<int>(len),
@@ -78,8 +94,8 @@ void writeLine(const TraceRecord& record) {
     timespec now{};
     clock_gettime(CLOCK_MONOTONIC, &now);
     fprintf(stderr, "%5lld.%03ld %s [%s] %s:%d %.*s\n", static_cast<long long>(now.tv_sec),
-            now.tv_nsec / 1000000, severityName(record.severity), threadName,
-            baseName(record.file), record.line, static_cast<int>(len), record.text.c_str());
+            now.tv_nsec / 1000000, severityName(record.severity), threadName, baseName(record.file),
+            record.line, static_cast<int>(len), record.text.c_str());
 }
 
 }  // namespace
@@ -103,7 +119,8 @@ using namespace TavoPlayer;
 
 void OneSegPGL_InitializeDebug() {
     bool expected = false;
-    if (!gInitialized.compare_exchange_strong(expected, true)) return;
+    if (!gInitialized.compare_exchange_strong(expected, true))
+        return;
     gLevel.store(parseLevel(getenv("TAVOPLAYER_LOG_LEVEL")), std::memory_order_relaxed);
     const char* output = getenv("TAVOPLAYER_LOG_OUTPUT");
     if (output != nullptr && strcasecmp(output, "syslog") == 0) {
@@ -118,15 +135,18 @@ void OneSegPGL_SetDebugLocation(const char* file, int line) {
 }
 
 bool OneSegPGL_TraceEnabled(uint32_t severity) {
-    if (!gInitialized.load(std::memory_order_acquire)) OneSegPGL_InitializeDebug();
+    if (!gInitialized.load(std::memory_order_acquire))
+        OneSegPGL_InitializeDebug();
     // A capturing sink sees everything, so tests do not depend on the environment.
-    if (gHaveSink.load(std::memory_order_acquire)) return true;
+    if (gHaveSink.load(std::memory_order_acquire))
+        return true;
     const uint32_t level = gLevel.load(std::memory_order_relaxed);
     return level != kTraceNone && severity >= level;
 }
 
 void OneSegPGL_Trace(uint32_t severity, const char* format, ...) {
-    if (!OneSegPGL_TraceEnabled(severity)) return;
+    if (!OneSegPGL_TraceEnabled(severity))
+        return;
     char stackBuffer[512];
     va_list args;
     va_start(args, format);

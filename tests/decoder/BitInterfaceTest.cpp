@@ -1,0 +1,237 @@
+#include <gtest/gtest.h>
+
+#include <array>
+#include <cstdint>
+#include <vector>
+
+#include "decoder/ReadBitInterface.h"
+#include "decoder/WriteBitInterface.h"
+#include "support/TraceCapture.h"
+
+namespace TavoPlayer {
+namespace {
+
+// A reference bit reader, one bit at a time, for comparing against the word loads.
+uint32_t referenceBits(const std::vector<uint8_t>& bytes, size_t bitOffset, unsigned count) {
+    uint32_t value = 0;
+    for (unsigned i = 0; i < count; ++i) {
+        const size_t bit = bitOffset + i;
+        value = (value << 1) | ((bytes[bit / 8] >> (7 - bit % 8)) & 1u);
+    }
+    return value;
+}
+
+const std::vector<uint8_t> kPattern = {0xA5, 0x3C, 0x96, 0x0F, 0xF0, 0x81, 0x7E, 0xC3, 0x5A, 0x24};
+
+class ReadBitInterfaceTest : public ::testing::Test {
+protected:
+    std::vector<uint8_t> mBytes = kPattern;
+};
+
+TEST_F(ReadBitInterfaceTest, ZeroCountsReturnZeroAndDoNotMove) {
+    ReadBitInterface reader(mBytes.data(), mBytes.size());
+    reader.readBits(3);
+    EXPECT_EQ(reader.readBits(0), 0u);
+    EXPECT_EQ(reader.peekBits(0), 0u);
+    EXPECT_EQ(reader.getBitCounter(), 3);
+    EXPECT_EQ(reader.currentByte(), mBytes.data());
+    EXPECT_EQ(reader.remainingBytes(), mBytes.size());
+}
+
+TEST_F(ReadBitInterfaceTest, EveryStartAndWidthMatchesBitByBitReference) {
+    for (unsigned start = 0; start < 8; ++start) {
+        for (unsigned count = 1; count <= 25; ++count) {
+            ReadBitInterface reader(mBytes.data(), mBytes.size());
+            reader.skipBits(static_cast<unsigned char>(start), nullptr);
+            const uint32_t expected = referenceBits(mBytes, start, count);
+            EXPECT_EQ(reader.peekBits(static_cast<unsigned char>(count)), expected)
+                << "start " << start << " count " << count;
+            EXPECT_EQ(reader.readBits(static_cast<unsigned char>(count)), expected)
+                << "start " << start << " count " << count;
+            EXPECT_EQ(reader.getBitCounter(), (start + count) % 8);
+            EXPECT_EQ(reader.currentByte() - mBytes.data(), (start + count) / 8);
+            EXPECT_EQ(reader.remainingBytes(), mBytes.size() - (start + count) / 8);
+        }
+    }
+}
+
+TEST_F(ReadBitInterfaceTest, ByteAndSpanningReadsAdvanceAsDesigned) {
+    ReadBitInterface reader(mBytes.data(), mBytes.size());
+    EXPECT_EQ(reader.readBits(8), 0xA5u);
+    EXPECT_EQ(reader.getBitCounter(), 0);
+    EXPECT_EQ(reader.currentByte(), mBytes.data() + 1);
+    reader.readBits(6);
+    // 3 bits at position 6 of 0x3C, 0x96: the last two bits of 0x3C (00), the first of 0x96 (1).
+    EXPECT_EQ(reader.readBits(3), 0b001u);
+    EXPECT_EQ(reader.getBitCounter(), 1);
+    EXPECT_EQ(reader.currentByte(), mBytes.data() + 2);
+}
+
+TEST_F(ReadBitInterfaceTest, BitCounterIsPositionInByteNotRunningTotal) {
+    ReadBitInterface reader(mBytes.data(), mBytes.size());
+    reader.readBits(13);
+    EXPECT_EQ(reader.getBitCounter(), 5);
+    EXPECT_FALSE(reader.isByteAligned());
+    reader.resetBitCounter();
+    EXPECT_EQ(reader.getBitCounter(), 0);
+    EXPECT_TRUE(reader.isByteAligned());
+    EXPECT_EQ(reader.currentByte(), mBytes.data() + 1);  // the pointer is not moved
+}
+
+TEST_F(ReadBitInterfaceTest, FieldEndingOnLastByteLoadsNoByteBeyond) {
+    // A 3-byte heap buffer: ASan reports any load of a fourth byte.
+    auto bytes = std::make_unique<uint8_t[]>(3);
+    bytes[0] = 0x12;
+    bytes[1] = 0x34;
+    bytes[2] = 0x56;
+    ReadBitInterface reader(bytes.get(), 3);
+    reader.readBits(4);
+    EXPECT_EQ(reader.peekBits(20), 0x23456u);
+    EXPECT_EQ(reader.readBits(20), 0x23456u);
+    EXPECT_EQ(reader.remainingBytes(), 0u);
+}
+
+TEST_F(ReadBitInterfaceTest, ReadBitsLongAtEveryStartPosition) {
+    for (unsigned start = 0; start < 8; ++start) {
+        for (unsigned count = 25; count <= 32; ++count) {
+            ReadBitInterface reader(mBytes.data(), mBytes.size());
+            reader.skipBits(static_cast<unsigned char>(start), nullptr);
+            EXPECT_EQ(reader.readBitsLong(static_cast<unsigned char>(count)),
+                      referenceBits(mBytes, start, count))
+                << "start " << start << " count " << count;
+            EXPECT_EQ(reader.getBitCounter(), (start + count) % 8);
+            EXPECT_EQ(reader.currentByte() - mBytes.data(), (start + count) / 8);
+        }
+    }
+}
+
+TEST_F(ReadBitInterfaceTest, ReadBitsLongOutOfRangeLogsAndDoesNotMove) {
+    struct Case {
+        unsigned char count;
+        const char* message;
+    };
+    const Case cases[] = {{24, "readBitsLong: bitCount value is out of range (24)"},
+                          {33, "readBitsLong: bitCount value is out of range (33)"},
+                          {0, "readBitsLong: bitCount value is out of range (0)"}};
+    for (const Case& c : cases) {
+        test::TraceCapture trace;
+        ReadBitInterface reader(mBytes.data(), mBytes.size());
+        reader.readBits(2);
+        EXPECT_EQ(reader.readBitsLong(c.count), 0u);
+        EXPECT_EQ(trace.count(TRACE_ERROR, c.message), 1u) << trace.all();
+        EXPECT_EQ(reader.getBitCounter(), 2);
+        EXPECT_EQ(reader.currentByte(), mBytes.data());
+    }
+}
+
+TEST_F(ReadBitInterfaceTest, ExternalBufferFormLeavesOwnPointerAlone) {
+    std::vector<uint8_t> other = {0xFF, 0x00, 0xAA};
+    ReadBitInterface reader(mBytes.data(), mBytes.size());
+    reader.readBits(5);
+    int advanced = -1;
+    // 7 bits at position 5 of FF 00: 111 0000 -> 0x70; 12 bits spanned -> 1 byte, position 4.
+    EXPECT_EQ(reader.readBits(other.data(), 7, &advanced), 0x70u);
+    EXPECT_EQ(advanced, 1);
+    EXPECT_EQ(reader.getBitCounter(), 4);
+    EXPECT_EQ(reader.currentByte(), mBytes.data());
+    EXPECT_EQ(reader.remainingBytes(), mBytes.size());
+}
+
+TEST_F(ReadBitInterfaceTest, ByteAlignReportsWhetherItMoved) {
+    ReadBitInterface reader(mBytes.data(), mBytes.size());
+    int moved = -1;
+    reader.byteAlign(&moved);
+    EXPECT_EQ(moved, 0);
+    EXPECT_EQ(reader.currentByte(), mBytes.data());
+    reader.readBits(3);
+    reader.byteAlign(&moved);
+    EXPECT_EQ(moved, 1);
+    EXPECT_EQ(reader.currentByte(), mBytes.data() + 1);
+    EXPECT_EQ(reader.remainingBytes(), mBytes.size() - 1);
+    EXPECT_TRUE(reader.isByteAligned());
+    reader.readBits(1);
+    reader.byteAlign(nullptr);  // a null argument is allowed
+    EXPECT_EQ(reader.currentByte(), mBytes.data() + 2);
+}
+
+TEST_F(ReadBitInterfaceTest, SkipBitsReportsWholeBytesPassed) {
+    ReadBitInterface reader(mBytes.data(), mBytes.size());
+    int advanced = -1;
+    reader.skipBits(5, &advanced);
+    EXPECT_EQ(advanced, 0);
+    reader.skipBits(20, &advanced);  // 25 bits from the start: 3 bytes, position 1
+    EXPECT_EQ(advanced, 3);
+    EXPECT_EQ(reader.getBitCounter(), 1);
+    EXPECT_EQ(reader.readBits(7), referenceBits(mBytes, 25, 7));
+}
+
+class WriteBitInterfaceTest : public ::testing::Test {};
+
+TEST_F(WriteBitInterfaceTest, FirstByteIsClearedBeforeUseInDirtyBuffer) {
+    for (uint8_t fill : {uint8_t{0x00}, uint8_t{0xFF}}) {
+        std::array<uint8_t, 4> out;
+        out.fill(fill);
+        WriteBitInterface writer(out.data(), out.size());
+        writer.writeBits(0b11111, 5);
+        writer.writeBits(0b000001, 6);
+        // MSB first: 11111 000 | 001 then the unwritten rest of that byte (already zeroed).
+        EXPECT_EQ(out[0], 0xF8) << "fill " << int(fill);
+        EXPECT_EQ(out[1], 0x20) << "fill " << int(fill);
+        EXPECT_EQ(out[2], fill) << "a byte never written into is untouched";
+        EXPECT_EQ(writer.getBitCounter(), 3);
+    }
+}
+
+TEST_F(WriteBitInterfaceTest, RoundTripsThroughReaderForEveryWidthAndOffset) {
+    for (unsigned start = 0; start < 8; ++start) {
+        for (unsigned count = 1; count <= 16; ++count) {
+            std::array<uint8_t, 8> out;
+            out.fill(0xCC);
+            WriteBitInterface writer(out.data(), out.size());
+            writer.writeBits(0, start);
+            const unsigned value = (0xB6D5u * (count + start)) & ((1u << count) - 1);
+            EXPECT_EQ(writer.writeBits(value, count), 0);
+            writer.writeBits(0b101, 3);
+            ReadBitInterface reader(out.data(), out.size());
+            reader.skipBits(static_cast<unsigned char>(start), nullptr);
+            EXPECT_EQ(reader.readBits(static_cast<unsigned char>(count)), value)
+                << "start " << start << " count " << count;
+            EXPECT_EQ(reader.readBits(3), 0b101u);
+            EXPECT_EQ(writer.getBitCounter(), (start + count + 3) % 8);
+            EXPECT_EQ(writer.currentByte() - out.data(), (start + count + 3) / 8);
+        }
+    }
+}
+
+TEST_F(WriteBitInterfaceTest, CountAboveSixteenWritesNothing) {
+    std::array<uint8_t, 4> out = {0x11, 0x22, 0x33, 0x44};
+    WriteBitInterface writer(out.data(), out.size());
+    EXPECT_EQ(writer.writeBits(0xFFFFFF, 24), 0);
+    EXPECT_EQ(writer.writeBits(0xFFFF, 0), 0);
+    EXPECT_EQ(out, (std::array<uint8_t, 4>{0x11, 0x22, 0x33, 0x44}));
+    EXPECT_EQ(writer.currentByte(), out.data());
+    EXPECT_EQ(writer.getBitCounter(), 0);
+}
+
+TEST_F(WriteBitInterfaceTest, AlignAndSkipWriteZeroBits) {
+    std::array<uint8_t, 4> out;
+    out.fill(0xFF);
+    WriteBitInterface writer(out.data(), out.size());
+    int moved = -1;
+    writer.byteAlign(&moved);
+    EXPECT_EQ(moved, 0);
+    writer.writeBits(0b111, 3);
+    writer.byteAlign(&moved);
+    EXPECT_EQ(moved, 1);
+    EXPECT_EQ(out[0], 0xE0);
+    EXPECT_TRUE(writer.isByteAligned());
+    writer.writeBits(1, 1);
+    writer.skipBits(9, nullptr);
+    writer.writeBits(1, 1);
+    EXPECT_EQ(out[1], 0x80);
+    EXPECT_EQ(out[2], 0x20);
+    EXPECT_EQ(writer.remainingBytes(), 2u);
+}
+
+}  // namespace
+}  // namespace TavoPlayer

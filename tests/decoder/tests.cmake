@@ -1,0 +1,2 @@
+# The extractor tests compare with libavcodec's own parsers on the same bytes.
+target_link_libraries(${TEST_TARGET} PRIVATE PkgConfig::FFMPEG)

@@ -1,0 +1,301 @@
+#include <gtest/gtest.h>
+#include <unistd.h>
+
+#include <cstring>
+#include <new>
+
+#include "common/RingBuffer.h"
+#include "common/data/AudioFragmentData.h"
+#include "common/data/ClosedCaptionFragmentData.h"
+#include "common/data/PESData.h"
+#include "common/data/VideoFrameData.h"
+#include "platform/gui/GraphicBuffer.h"
+#include "support/TraceCapture.h"
+
+namespace TavoPlayer {
+namespace {
+
+const unsigned int kPage = static_cast<unsigned int>(sysconf(_SC_PAGE_SIZE));
+
+template <typename T>
+uint32_t fieldOffset(const T& record, const void* field) {
+    return static_cast<uint32_t>(reinterpret_cast<const uint8_t*>(field) -
+                                 reinterpret_cast<const uint8_t*>(&record));
+}
+
+class RecordInRingTest : public ::testing::Test {
+protected:
+    void SetUp() override { ASSERT_EQ(0u, ring->configure("records", 16)); }
+    android::sp<RingBuffer> ring = new RingBuffer;
+};
+
+// A PES packet of n bytes makes a record of 40 + n bytes that advances the ring by
+// that size rounded up to 4.
+struct PesSizeCase {
+    uint32_t pesBytes;
+    uint32_t recordSize;
+    uint32_t advance;
+};
+
+class PESDataSizeTest : public RecordInRingTest,
+                        public ::testing::WithParamInterface<PesSizeCase> {};
+
+TEST_P(PESDataSizeTest, RecordSizeAndAdvance) {
+    const PesSizeCase& c = GetParam();
+    ASSERT_TRUE(ring->waitForSpace(PESData::kHeaderSize + c.pesBytes));
+    auto* record = new (ring->writePointer()) PESData;
+    record->mSize = PESData::kHeaderSize + c.pesBytes;
+    memset(record->pesBytes(), 0x5A, c.pesBytes);
+    record->mSizeES = c.pesBytes > 9 ? c.pesBytes - 9 : 0;
+    record->mOffsetES = record->mSize - record->mSizeES;
+    ring->commitWrite(record->mSize);
+    EXPECT_EQ(c.recordSize, record->mSize);
+    EXPECT_EQ(c.advance, ring->head());
+
+    ASSERT_TRUE(ring->waitForData(PESData::kHeaderSize));
+    auto* read = reinterpret_cast<Data*>(ring->readPointer());
+    EXPECT_EQ(Data::TYPE_PES, read->mType);
+    unsigned char* raw = nullptr;
+    unsigned int rawSize = 0;
+    EXPECT_EQ(0, read->getRaw(&raw, &rawSize));  // dispatched through the record's own header
+    EXPECT_EQ(ring->readPointer() + 40, raw);
+    EXPECT_EQ(c.pesBytes, rawSize);
+    ring->consume(read->mSize);
+    EXPECT_EQ(c.advance, ring->tail());
+}
+
+INSTANTIATE_TEST_SUITE_P(Sizes, PESDataSizeTest,
+                         ::testing::Values(PesSizeCase{2000, 2040, 2040},
+                                           PesSizeCase{2001, 2041, 2044},
+                                           PesSizeCase{2002, 2042, 2044},
+                                           PesSizeCase{2003, 2043, 2044}, PesSizeCase{0, 40, 40}));
+
+TEST_F(RecordInRingTest, VideoFrameAlwaysAdvancesByEighty) {
+    for (int i = 0; i < 3; ++i) {
+        ASSERT_TRUE(ring->waitForSpace(VideoFrameData::kRecordSize));
+        auto* frame = new (ring->writePointer()) VideoFrameData;
+        frame->mBufferIndex = i;
+        ring->commitWrite(frame->mSize);
+    }
+    EXPECT_EQ(240u, ring->head());
+}
+
+TEST_F(RecordInRingTest, CaptionRecordOfTenBytesTakesFortyFour) {
+    ASSERT_TRUE(ring->waitForSpace(44));
+    auto* caption = new (ring->writePointer()) ClosedCaptionFragmentData;
+    caption->mSize = ClosedCaptionFragmentData::kHeaderSize + 10;
+    memcpy(caption->textBytes(), "0123456789", 10);
+    ring->commitWrite(caption->mSize);
+    EXPECT_EQ(42u, caption->mSize);
+    EXPECT_EQ(44u, ring->head());
+}
+
+// ---------------------------------------------------------------------------------
+// Byte layouts, read back from the raw bytes of each record.
+
+uint32_t u32At(const void* record, size_t offset) {
+    uint32_t v;
+    memcpy(&v, static_cast<const uint8_t*>(record) + offset, 4);
+    return v;
+}
+uint64_t u64At(const void* record, size_t offset) {
+    uint64_t v;
+    memcpy(&v, static_cast<const uint8_t*>(record) + offset, 8);
+    return v;
+}
+
+TEST(RecordLayoutTest, PESDataFieldsSitAtTheirOffsets) {
+    PESData r;
+    r.mSize = 0x11223344;
+    r.mPTS = 0x1ABCDEF01;
+    r.mDTS = 0x0FEDCBA98;
+    r.mOffsetES = 0x55;
+    r.mSizeES = 0x66;
+    EXPECT_EQ(0u, u32At(&r, 8));
+    EXPECT_EQ(0x11223344u, u32At(&r, 12));
+    EXPECT_EQ(0x1ABCDEF01u, u64At(&r, 16));
+    EXPECT_EQ(0x0FEDCBA98u, u64At(&r, 24));
+    EXPECT_EQ(0x55u, u32At(&r, 32));
+    EXPECT_EQ(0x66u, u32At(&r, 36));
+}
+
+TEST(RecordLayoutTest, AudioFragmentFieldsSitAtTheirOffsets) {
+    AudioFragmentData r;
+    r.mPTS = 90000;
+    r.mNumberChannels = 2;
+    r.mSamplingRate = 48000;
+    EXPECT_EQ(1u, u32At(&r, 8));
+    EXPECT_EQ(32u, u32At(&r, 12));
+    EXPECT_EQ(90000u, u64At(&r, 16));
+    EXPECT_EQ(2, reinterpret_cast<uint8_t*>(&r)[24]);
+    EXPECT_EQ(16, reinterpret_cast<uint8_t*>(&r)[25]);
+    EXPECT_EQ(48000u, u32At(&r, 28));
+}
+
+TEST(RecordLayoutTest, CaptionPartPrecedesTheSharedBase) {
+    ClosedCaptionFragmentData r;
+    r.mPTS = 0x123456789;
+    EXPECT_EQ(0x123456789u, u64At(&r, 8));
+    EXPECT_EQ(3u, u32At(&r, 24));
+    EXPECT_EQ(32u, u32At(&r, 28));
+    const Data& base = r;
+    EXPECT_EQ(16u, fieldOffset(r, &base));
+    EXPECT_EQ(24u, fieldOffset(r, &base.mType));
+}
+
+// ---------------------------------------------------------------------------------
+// Text forms: toString output, and fromString with its scan formats kept as designed.
+
+TEST(RecordTextTest, PESDataToStringAndItsOwnTextDoesNotScanBack) {
+    PESData r;
+    r.mSize = 2040;
+    r.mPTS = 8589934591;  // 2^33 - 1
+    r.mDTS = 90000;
+    r.mOffsetES = 54;
+    r.mSizeES = 1986;
+    std::string text = r.toString();
+    EXPECT_EQ(
+        "mType = 0\nmSize = 2040\nmPTS = 8589934591\nmDTS = 90000\nmOffsetES = 54\nmSizeES = "
+        "1986\n",
+        text);
+    PESData back;
+    EXPECT_FALSE(back.fromString(text.data()));
+    // The scan stops after mPTS: three fields were assigned, the rest untouched.
+    EXPECT_EQ(2040u, back.mSize);
+    EXPECT_EQ(8589934591u, back.mPTS);
+    EXPECT_EQ(0u, back.mDTS);
+    EXPECT_EQ(0u, back.mSizeES);
+}
+
+TEST(RecordTextTest, PESDataScansTheDesignedFormat) {
+    char text[] = "mType = 0\nmSize = 100\nmPTS = 5lu\nmDTS = 7lu\nmOffsetES = 60\nmSizeES = 40\n";
+    PESData r;
+    EXPECT_TRUE(r.fromString(text));
+    EXPECT_EQ(100u, r.mSize);
+    EXPECT_EQ(5u, r.mPTS);
+    EXPECT_EQ(7u, r.mDTS);
+    EXPECT_EQ(60u, r.mOffsetES);
+    EXPECT_EQ(40u, r.mSizeES);
+}
+
+TEST(RecordTextTest, AudioFragmentToStringAndItsOwnTextDoesNotScanBack) {
+    AudioFragmentData r;
+    r.mSize = 4128;
+    r.mPTS = 123456;
+    r.mNumberChannels = 2;
+    r.mSamplingRate = 48000;
+    std::string text = r.toString();
+    EXPECT_EQ(
+        "mType = 1\nmSize = 4128\nmPTS = 123456\nmNumberChannels = 2\nmBitsPerSample = 16\n"
+        "mSamplingRate = 48000\n",
+        text);
+    AudioFragmentData back;
+    EXPECT_FALSE(back.fromString(text.data()));
+    EXPECT_EQ(123456u, back.mPTS);
+}
+
+TEST(RecordTextTest, AudioFragmentReadsChannelsAndWidthAsCharacters) {
+    char text[] =
+        "mType = 1\nmSize = 36\nmPTS = 9lu\nmNumberChannels = 2\nmBitsPerSample = X\nmSamplingRate "
+        "= 44100\n";
+    AudioFragmentData r;
+    EXPECT_TRUE(r.fromString(text));
+    EXPECT_EQ('2', r.mNumberChannels);  // the character, not the number
+    EXPECT_EQ('X', r.mBitsPerSample);
+    EXPECT_EQ(44100u, r.mSamplingRate);
+}
+
+TEST(RecordTextTest, VideoFrameRoundTrips) {
+    VideoFrameData r;
+    r.mPTS = 0x1FFFFFFFF;
+    std::string text = r.toString();
+    EXPECT_EQ("mType = 2\nmSize = 80\nmPTS = 8589934591\n", text);
+    VideoFrameData back;
+    back.mSize = 0;
+    EXPECT_TRUE(back.fromString(text.data()));
+    EXPECT_EQ(80u, back.mSize);
+    EXPECT_EQ(0x1FFFFFFFFu, back.mPTS);
+}
+
+TEST(RecordTextTest, CaptionRecordHasNoTextForm) {
+    test::TraceCapture trace;
+    ClosedCaptionFragmentData r;
+    char text[] = "anything";
+    EXPECT_TRUE(r.fromString(text));
+    EXPECT_EQ("", r.toString());
+    EXPECT_TRUE(trace.contains("toString: caption records have no text form"));
+    unsigned char sentinel = 0;
+    unsigned char* data = &sentinel;
+    unsigned int size = 77;
+    EXPECT_EQ(0, r.getRaw(&data, &size));
+    EXPECT_EQ(&sentinel, data);  // untouched
+    EXPECT_EQ(77u, size);
+}
+
+// ---------------------------------------------------------------------------------
+// getRaw of a video frame with a picture buffer attached.
+
+class FakeGraphicBuffer : public GraphicBuffer {
+public:
+    explicit FakeGraphicBuffer(int lockStatus) : mLockStatus(lockStatus) {
+        for (size_t i = 0; i < sizeof mPixels; ++i)
+            mPixels[i] = static_cast<uint8_t>(i);
+    }
+    int lock(uint32_t usage, void** vaddr) override {
+        mUsage = usage;
+        if (mLockStatus != 0)
+            return mLockStatus;
+        ++mLocked;
+        *vaddr = mPixels;
+        return 0;
+    }
+    int unlock() override {
+        --mLocked;
+        return 0;
+    }
+    size_t getByteSize() const override { return sizeof mPixels; }
+
+    int mLockStatus;
+    uint32_t mUsage = 0;
+    int mLocked = 0;
+    uint8_t mPixels[96];
+};
+
+TEST(VideoFrameRawTest, CopiesTheLockedPictureAndUnlocks) {
+    android::sp<FakeGraphicBuffer> buffer = new FakeGraphicBuffer(0);
+    VideoFrameData frame;
+    frame.mGraphicBuffer = buffer.get();
+    unsigned char* data = nullptr;
+    unsigned int size = 0;
+    EXPECT_EQ(0, frame.getRaw(&data, &size));
+    ASSERT_NE(nullptr, data);
+    EXPECT_NE(buffer->mPixels, data);  // a copy the caller owns
+    EXPECT_EQ(96u, size);
+    EXPECT_EQ(0, memcmp(buffer->mPixels, data, 96));
+    EXPECT_EQ(3u, buffer->mUsage);
+    EXPECT_EQ(0, buffer->mLocked);
+    delete[] data;
+}
+
+TEST(VideoFrameRawTest, ReturnsTheLockStatusWhenLockingFails) {
+    android::sp<FakeGraphicBuffer> buffer = new FakeGraphicBuffer(-22);
+    VideoFrameData frame;
+    frame.mGraphicBuffer = buffer.get();
+    unsigned char* data = reinterpret_cast<unsigned char*>(1);
+    unsigned int size = 5;
+    EXPECT_EQ(-22, frame.getRaw(&data, &size));
+    EXPECT_EQ(nullptr, data);
+    EXPECT_EQ(0u, size);
+}
+
+TEST(VideoFrameRawTest, DecoderRecordHasNoPayload) {
+    VideoFrameData frame;
+    unsigned char* data = nullptr;
+    unsigned int size = 1;
+    EXPECT_EQ(0, frame.getRaw(&data, &size));
+    EXPECT_EQ(reinterpret_cast<unsigned char*>(&frame) + 80, data);
+    EXPECT_EQ(0u, size);
+}
+
+}  // namespace
+}  // namespace TavoPlayer

@@ -1,0 +1,270 @@
+#include "common/Synchronization.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <cstdio>
+#include <memory>
+#include <vector>
+
+#include "support/TraceCapture.h"
+
+namespace TavoPlayer {
+namespace {
+
+using test::TraceCapture;
+using M = Synchronization::module_t;
+
+// A monotonic clock the test moves by hand, in milliseconds.
+struct FakeClock {
+    uint64_t nowMs = 1'000'000;
+    bool readable = true;
+    Synchronization::MonotonicClock reader() {
+        return [this](timespec* ts) {
+            if (!readable)
+                return false;
+            ts->tv_sec = static_cast<time_t>(nowMs / 1000);
+            ts->tv_nsec = static_cast<long>((nowMs % 1000) * 1'000'000);
+            return true;
+        };
+    }
+};
+
+class RecordingPCRListener : public Synchronization::PCRListener {
+public:
+    void onPCRChanged(unsigned long pcr) override { values.push_back(pcr); }
+    std::vector<unsigned long> values;
+};
+
+class SynchronizationTest : public ::testing::Test {
+protected:
+    FakeClock clock;
+    android::sp<Synchronization> sync = new Synchronization(clock.reader());
+    TraceCapture trace;
+};
+
+TEST(SignedThirtyThreeTest, DifferencesAcrossTheWrap) {
+    struct Case {
+        uint64_t a, b;
+        int64_t diff;
+    } cases[] = {
+        {0x10, 0x1FFFFFFF0, 0x20},       // just after the wrap minus just before
+        {0x1FFFFFFF0, 0x10, -0x20},      // and the reverse
+        {90000, 0, 90000},               // plain
+        {0, 0x100000000, -0x100000000},  // half the range reads negative
+        {0xFFFFFFFF, 0, 0xFFFFFFFF},     // largest positive
+    };
+    for (const Case& c : cases) {
+        EXPECT_EQ(c.diff, diff33(c.a, c.b)) << std::hex << c.a << " - " << c.b;
+    }
+    EXPECT_EQ(0x5u, add33(0x1FFFFFFFF, 6));
+    EXPECT_EQ(0x1FFFFFFFFu, mask33(~0ull));
+}
+
+TEST_F(SynchronizationTest, FirstVideoStampLeavesTheClockWithoutSource) {
+    sync->setBasePCR(1'000'000, M::Video);
+    EXPECT_TRUE(sync->isValid(M::Video));
+    EXPECT_EQ(M::None, sync->currentModule());
+    EXPECT_EQ(0u, sync->getPCR());
+    EXPECT_EQ(1u, trace.count("setBasePCR Using None as PCR"));
+}
+
+struct ChoiceCase {
+    uint64_t video, audio;
+    M expected;
+};
+
+class SourceChoiceTest : public SynchronizationTest,
+                         public ::testing::WithParamInterface<ChoiceCase> {};
+
+TEST_P(SourceChoiceTest, TheLaterRunningStreamDrivesTheClock) {
+    sync->setBasePCR(GetParam().video, M::Video);
+    sync->setBasePCR(GetParam().audio, M::Audio);
+    EXPECT_EQ(GetParam().expected, sync->currentModule());
+}
+
+INSTANTIATE_TEST_SUITE_P(VideoAndAudio, SourceChoiceTest,
+                         ::testing::Values(ChoiceCase{1'000'000, 1'000'090, M::Video},
+                                           ChoiceCase{1'000'090, 1'000'000, M::Audio},
+                                           ChoiceCase{1'000'000, 1'000'000, M::Video},
+                                           // across the wrap, "smaller" is in 33-bit terms
+                                           ChoiceCase{0x1FFFFFF00, 0x100, M::Video}));
+
+TEST_F(SynchronizationTest, RealPCRWinsWhenItIsNotBad) {
+    sync->setBasePCR(1'000'000, M::Video);
+    sync->setBasePCR(1'000'000, M::Audio);
+    sync->setBasePCR(1'000'500, M::RealPCR);
+    EXPECT_EQ(M::RealPCR, sync->currentModule());
+    EXPECT_EQ(1'000'500u, sync->getPCR());
+    clock.nowMs += 1000;
+    EXPECT_EQ(1'090'500u, sync->getPCR());
+}
+
+// Re-basing: a stamp of an already valid source re-bases it only when it differs
+// from the extrapolated value by more than 90,000 ticks and arrives at least 11 ms
+// after the base.
+struct RebaseCase {
+    const char* name;
+    uint64_t base;
+    uint64_t elapsedMs;
+    int64_t offsetFromExpected;
+    bool rebased;
+};
+
+class RebaseTest : public SynchronizationTest, public ::testing::WithParamInterface<RebaseCase> {};
+
+TEST_P(RebaseTest, ThresholdAndMinimumInterval) {
+    const RebaseCase& c = GetParam();
+    sync->setBasePCR(c.base, M::RealPCR);
+    clock.nowMs += c.elapsedMs;
+    const uint64_t expected = mask33(c.base + c.elapsedMs * 90);
+    const uint64_t stamp = mask33(expected + static_cast<uint64_t>(c.offsetFromExpected));
+    sync->setBasePCR(stamp, M::RealPCR);
+    EXPECT_EQ(c.rebased ? stamp : expected, sync->getPCR()) << c.name;
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Cases, RebaseTest,
+    ::testing::Values(RebaseCase{"exactly 90000 later", 1'000'000, 1000, 90'000, false},
+                      RebaseCase{"90001 later", 1'000'000, 1000, 90'001, true},
+                      RebaseCase{"exactly 90000 earlier", 1'000'000, 1000, -90'000, false},
+                      RebaseCase{"90001 earlier", 1'000'000, 1000, -90'001, true},
+                      RebaseCase{"big jump within 10 ms", 1'000'000, 10, 900'000, false},
+                      RebaseCase{"big jump at 11 ms", 1'000'000, 11, 900'000, true},
+                      // 0x1FFFFFFF0 then 0x10 one second later: a small signed step
+                      RebaseCase{"wrap", 0x1FFFFFFF0, 1000, 0x20 - 90'000, false}),
+    [](const auto& info) {
+        std::string name = info.param.name;
+        for (char& ch : name) {
+            if (!isalnum(static_cast<unsigned char>(ch)))
+                ch = '_';
+        }
+        return name;
+    });
+
+TEST_F(SynchronizationTest, RealPCRTwentySecondsAwayIsIgnoredUntilItComesBack) {
+    sync->setBasePCR(10'000'000, M::Video);
+    sync->setBasePCR(10'000'000, M::Audio);
+    sync->setBasePCR(10'000'000 + 1'800'000, M::RealPCR);  // exactly 20 s ahead: bad
+    EXPECT_TRUE(sync->isBadRealPCR());
+    EXPECT_EQ(M::Video, sync->currentModule());
+    EXPECT_EQ(1u, trace.count(TRACE_WARNING,
+                              "Ignoring real PCR due to high difference. (1800000) (1800000)"));
+
+    // 1,799,999 ticks is acceptable: a real PCR that near never counts as bad.
+    android::sp<Synchronization> near = new Synchronization(clock.reader());
+    near->setBasePCR(10'000'000, M::Video);
+    near->setBasePCR(10'000'000 + 1'799'999, M::RealPCR);
+    EXPECT_FALSE(near->isBadRealPCR());
+    EXPECT_EQ(M::RealPCR, near->currentModule());
+
+    clock.nowMs += 100;
+    // Re-based 800,000 ticks back: now 1,000,000 ticks from both streams.
+    sync->setBasePCR(10'000'000 + 9'000 + 1'000'000, M::RealPCR);
+    EXPECT_FALSE(sync->isBadRealPCR());
+    EXPECT_EQ(M::RealPCR, sync->currentModule());
+    EXPECT_EQ(1u, trace.count(TRACE_WARNING, "Real PCR normalized. (1000000) (1000000)"));
+}
+
+TEST_F(SynchronizationTest, PauseAndResumeContinueWhereTheClockStopped) {
+    RecordingPCRListener listener;
+    sync->setBasePCR(500'000, M::RealPCR);
+    sync->addPCRListener(&listener);
+    clock.nowMs += 2000;
+    const uint64_t atPause = sync->getPCR();
+    EXPECT_EQ(500'000u + 180'000u, atPause);
+    sync->pause();
+    clock.nowMs += 5000;
+    sync->resume();
+    EXPECT_EQ(atPause, sync->getPCR());
+    ASSERT_EQ(1u, listener.values.size());
+    EXPECT_EQ(atPause, listener.values[0]);
+    clock.nowMs += 1000;
+    EXPECT_EQ(atPause + 90'000, sync->getPCR());
+    // A second resume without pause changes nothing.
+    sync->resume();
+    EXPECT_EQ(atPause + 90'000, sync->getPCR());
+}
+
+TEST_F(SynchronizationTest, ResumeAtThePauseInstantKeepsThePause) {
+    sync->setBasePCR(500'000, M::RealPCR);
+    sync->pause();
+    sync->resume();  // same millisecond: the pause stays recorded
+    clock.nowMs += 3000;
+    sync->resume();
+    EXPECT_EQ(500'000u, sync->getPCR());
+}
+
+TEST_F(SynchronizationTest, OffsetBasesTheSourceEarlierThanTheStamp) {
+    sync->setOffsetTime(2000, M::RealPCR);
+    sync->setBasePCR(1'000'000, M::RealPCR);
+    EXPECT_EQ(1'000'000u - 180'000u, sync->getPCR());
+    EXPECT_EQ(1u, trace.count(TRACE_DEBUG, "setOffsetTime timeInMs = 2000 currentModule = 3"));
+}
+
+TEST_F(SynchronizationTest, OffsetLargerThanTheStampWrapsThroughTheMask) {
+    sync->setOffsetTime(2000, M::RealPCR);
+    sync->setBasePCR(90'000, M::RealPCR);
+    EXPECT_EQ(mask33(90'000 - 180'000), sync->getPCR());
+}
+
+TEST_F(SynchronizationTest, ListenersHearOnlyRebasesOfTheDrivingSource) {
+    RecordingPCRListener first, second;
+    sync->addPCRListener(&first);
+    sync->addPCRListener(&second);
+    sync->setBasePCR(1'000'000, M::Video);  // source None: no call
+    EXPECT_TRUE(first.values.empty());
+    sync->setBasePCR(2'000'000, M::RealPCR);
+    ASSERT_EQ(1u, first.values.size());
+    EXPECT_EQ(2'000'000u, first.values[0]);
+    EXPECT_EQ(first.values, second.values);
+    clock.nowMs += 500;
+    sync->setBasePCR(5'000'000, M::Video);  // re-bases Video, which does not drive
+    EXPECT_EQ(1u, first.values.size());
+}
+
+TEST_F(SynchronizationTest, ResetInvalidatesEverySource) {
+    sync->setBasePCR(1'000'000, M::Video);
+    sync->setBasePCR(1'000'000, M::RealPCR);
+    sync->resetPCR();
+    EXPECT_FALSE(sync->isValid(M::Video));
+    EXPECT_FALSE(sync->isValid(M::RealPCR));
+    EXPECT_EQ(M::None, sync->currentModule());
+    EXPECT_EQ(0u, sync->getPCR());
+    // A stamp after reset bases anew, however close to the old base.
+    sync->setBasePCR(1'000'001, M::RealPCR);
+    EXPECT_EQ(1'000'001u, sync->getPCR());
+}
+
+TEST_F(SynchronizationTest, NoneIsRefused) {
+    sync->setBasePCR(1'000'000, M::None);
+    EXPECT_FALSE(sync->isValid(M::None));
+    EXPECT_EQ(1u, trace.count(TRACE_ERROR, "setBasePCR: cannot set PCR for None"));
+}
+
+TEST_F(SynchronizationTest, UnreadableClockCountsAsZero) {
+    clock.readable = false;
+    EXPECT_EQ(0u, sync->getTimestamp());
+    EXPECT_EQ(1u,
+              trace.count(TRACE_ERROR, "getTimestamp: Error on attempt of obtaining system time"));
+}
+
+TEST_F(SynchronizationTest, DumpNamesTheSourceAndEachClock) {
+    sync->setBasePCR(1'000'000, M::Video);
+    sync->setBasePCR(1'000'000, M::Audio);
+    char* buffer = nullptr;
+    size_t length = 0;
+    FILE* f = open_memstream(&buffer, &length);
+    sync->dump(f, 1);
+    fclose(f);
+    EXPECT_EQ(std::string("\t - Current PCR generated by: Video\n"
+                          "\t - Video PCR: 1000000 (Valid)\n"
+                          "\t - Audio PCR: 1000000 (Valid)\n"
+                          "\t - Real PCR: 0 (Invalid)\n"),
+              std::string(buffer, length));
+    free(buffer);
+    sync->dump(nullptr, 0);  // no stream: nothing happens
+}
+
+}  // namespace
+}  // namespace TavoPlayer

@@ -1,0 +1,47 @@
+#include "tsparser/PESParsedData.h"
+
+namespace TavoPlayer {
+
+PESParsedData::PESParsedData()
+    : mStreamId(0),
+      mPESPacketLength(0),
+      mScramblingControl(0),
+      mPriority(0),
+      mDataAlignmentIndicator(0),
+      mCopyright(0),
+      mOriginalOrCopy(0),
+      mPTSDTSFlags(0),
+      mESCRFlag(0),
+      mESRateFlag(0),
+      mDSMTrickModeFlag(0),
+      mAdditionalCopyInfoFlag(0),
+      mCRCFlag(0),
+      mExtensionFlag(0),
+      mHeaderDataLength(0),
+      mPTS(0),
+      mDTS(0),
+      mESCRBase(0),
+      mESCRExtension(0),
+      mESRate(0),
+      mDSMTrickMode(0),
+      mAdditionalCopyInfo(0),
+      mPreviousPESCRC(0),
+      mPESPrivateDataFlag(0),
+      mPackHeaderFieldFlag(0),
+      mProgramPacketSequenceCounterFlag(0),
+      mPSTDBufferFlag(0),
+      mPESExtensionFlag2(0),
+      mPESPrivateData{},
+      mPackFieldLength(0),
+      mProgramPacketSequenceCounter(0),
+      mMPEG1MPEG2Identifier(0),
+      mOriginalStuffLength(0),
+      mPSTDBufferScale(0),
+      mPSTDBufferSize(0),
+      mPESExtensionFieldLength(0),
+      mStreamIdExtensionFlag(0),
+      mStreamIdExtension(0),
+      mElementaryStream(nullptr),
+      mElementaryStreamSize(0) {}
+
+}  // namespace TavoPlayer

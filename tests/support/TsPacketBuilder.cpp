@@ -1,0 +1,196 @@
+#include "TsPacketBuilder.h"
+
+#include <algorithm>
+#include <cstring>
+#include <stdexcept>
+
+namespace TavoPlayer::test {
+namespace {
+
+// PCR and OPCR: 33-bit base, 6 reserved bits, 9-bit extension (ISO/IEC 13818-1, 2.4.3.5).
+void appendClock(std::vector<uint8_t>* out, uint64_t base, uint16_t extension) {
+    out->push_back(static_cast<uint8_t>(base >> 25));
+    out->push_back(static_cast<uint8_t>(base >> 17));
+    out->push_back(static_cast<uint8_t>(base >> 9));
+    out->push_back(static_cast<uint8_t>(base >> 1));
+    out->push_back(static_cast<uint8_t>(((base & 1) << 7) | 0x7E | ((extension >> 8) & 1)));
+    out->push_back(static_cast<uint8_t>(extension));
+}
+
+}  // namespace
+
+TsPacketBuilder& TsPacketBuilder::pid(uint16_t pid) {
+    mPid = pid;
+    return *this;
+}
+TsPacketBuilder& TsPacketBuilder::unitStart(bool on) {
+    mUnitStart = on;
+    return *this;
+}
+TsPacketBuilder& TsPacketBuilder::continuity(uint8_t counter) {
+    mContinuity = counter & 0x0F;
+    return *this;
+}
+TsPacketBuilder& TsPacketBuilder::scrambling(uint8_t control) {
+    mScrambling = control & 3;
+    return *this;
+}
+TsPacketBuilder& TsPacketBuilder::transportError(bool on) {
+    mTransportError = on;
+    return *this;
+}
+TsPacketBuilder& TsPacketBuilder::priority(bool on) {
+    mPriority = on;
+    return *this;
+}
+TsPacketBuilder& TsPacketBuilder::syncByte(uint8_t byte) {
+    mSync = byte;
+    return *this;
+}
+TsPacketBuilder& TsPacketBuilder::adaptationControl(uint8_t control) {
+    mControl = control & 3;
+    return *this;
+}
+TsPacketBuilder& TsPacketBuilder::discontinuity(bool on) {
+    mDiscontinuity = on;
+    return *this;
+}
+TsPacketBuilder& TsPacketBuilder::randomAccess(bool on) {
+    mRandomAccess = on;
+    return *this;
+}
+TsPacketBuilder& TsPacketBuilder::pcr(uint64_t base, uint16_t extension) {
+    mPcr = {base, extension};
+    return *this;
+}
+TsPacketBuilder& TsPacketBuilder::opcr(uint64_t base, uint16_t extension) {
+    mOpcr = {base, extension};
+    return *this;
+}
+TsPacketBuilder& TsPacketBuilder::spliceCountdown(uint8_t countdown) {
+    mSplice = countdown;
+    return *this;
+}
+TsPacketBuilder& TsPacketBuilder::privateData(std::vector<uint8_t> bytes) {
+    mPrivate = std::move(bytes);
+    return *this;
+}
+TsPacketBuilder& TsPacketBuilder::extension(uint8_t length, uint8_t flags,
+                                            std::vector<uint8_t> body) {
+    std::vector<uint8_t> bytes{length, flags};
+    bytes.insert(bytes.end(), body.begin(), body.end());
+    mExtension = std::move(bytes);
+    return *this;
+}
+TsPacketBuilder& TsPacketBuilder::rawAfterHeader(std::vector<uint8_t> bytes) {
+    mRaw = std::move(bytes);
+    return *this;
+}
+TsPacketBuilder& TsPacketBuilder::payload(std::vector<uint8_t> bytes) {
+    mPayload = std::move(bytes);
+    return *this;
+}
+
+TsPacket TsPacketBuilder::build() const {
+    TsPacket packet;
+    packet.fill(0xFF);
+
+    // Adaptation field body: flags byte and optional parts.
+    const bool anyField =
+        mDiscontinuity || mRandomAccess || mPcr || mOpcr || mSplice || mPrivate || mExtension;
+    std::vector<uint8_t> field;
+    if (anyField) {
+        uint8_t flags = 0;
+        if (mDiscontinuity)
+            flags |= 0x80;
+        if (mRandomAccess)
+            flags |= 0x40;
+        if (mPcr)
+            flags |= 0x10;
+        if (mOpcr)
+            flags |= 0x08;
+        if (mSplice)
+            flags |= 0x04;
+        if (mPrivate)
+            flags |= 0x02;
+        if (mExtension)
+            flags |= 0x01;
+        field.push_back(flags);
+        if (mPcr)
+            appendClock(&field, mPcr->first, mPcr->second);
+        if (mOpcr)
+            appendClock(&field, mOpcr->first, mOpcr->second);
+        if (mSplice)
+            field.push_back(*mSplice);
+        if (mPrivate) {
+            field.push_back(static_cast<uint8_t>(mPrivate->size()));
+            field.insert(field.end(), mPrivate->begin(), mPrivate->end());
+        }
+        if (mExtension)
+            field.insert(field.end(), mExtension->begin(), mExtension->end());
+    }
+    const size_t payloadSize = mPayload ? mPayload->size() : 0;
+    const bool hasField = anyField || (mPayload && payloadSize < 184) || !mPayload;
+    if (mPayload && payloadSize + (hasField ? 1 + field.size() : 0) > 184) {
+        throw std::length_error("TsPacketBuilder: payload does not fit");
+    }
+    if (hasField) {
+        // Stuffing fills the field so the payload ends the packet (2.4.3.5).
+        const size_t fieldLength = 183 - payloadSize;
+        if (field.empty() && fieldLength > 0)
+            field.push_back(0x00);  // flags, all clear
+        field.resize(fieldLength, 0xFF);
+    }
+
+    uint8_t control = mPayload ? (hasField ? 3 : 1) : 2;
+    if (mControl)
+        control = *mControl;
+
+    packet[0] = mSync;
+    packet[1] = static_cast<uint8_t>((mTransportError ? 0x80 : 0) | (mUnitStart ? 0x40 : 0) |
+                                     (mPriority ? 0x20 : 0) | ((mPid >> 8) & 0x1F));
+    packet[2] = static_cast<uint8_t>(mPid);
+    packet[3] = static_cast<uint8_t>((mScrambling << 6) | (control << 4) | mContinuity);
+    if (mRaw) {
+        std::copy_n(mRaw->begin(), std::min<size_t>(mRaw->size(), 184), packet.begin() + 4);
+        return packet;
+    }
+    size_t at = 4;
+    if (hasField) {
+        packet[at++] = static_cast<uint8_t>(field.size());
+        std::copy(field.begin(), field.end(), packet.begin() + at);
+        at += field.size();
+    }
+    if (mPayload)
+        std::copy(mPayload->begin(), mPayload->end(), packet.begin() + at);
+    return packet;
+}
+
+std::vector<TsPacket> packetizePes(uint16_t pid, const std::vector<uint8_t>& pes,
+                                   uint8_t* counter) {
+    std::vector<TsPacket> packets;
+    size_t offset = 0;
+    do {
+        const size_t take = std::min<size_t>(184, pes.size() - offset);
+        std::vector<uint8_t> chunk(pes.begin() + offset, pes.begin() + offset + take);
+        packets.push_back(TsPacketBuilder()
+                              .pid(pid)
+                              .unitStart(offset == 0)
+                              .continuity(*counter)
+                              .payload(std::move(chunk))
+                              .build());
+        *counter = (*counter + 1) & 0x0F;
+        offset += take;
+    } while (offset < pes.size());
+    return packets;
+}
+
+std::vector<uint8_t> concatPackets(const std::vector<TsPacket>& packets) {
+    std::vector<uint8_t> bytes;
+    bytes.reserve(packets.size() * 188);
+    for (const auto& p : packets)
+        bytes.insert(bytes.end(), p.begin(), p.end());
+    return bytes;
+}
+
+}  // namespace TavoPlayer::test

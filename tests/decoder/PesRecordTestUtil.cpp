@@ -1,5 +1,7 @@
 #include "PesRecordTestUtil.h"
 
+#include <algorithm>
+#include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <fstream>
@@ -94,6 +96,115 @@ std::vector<PesChunk> cutAt(const std::vector<uint8_t>& es, const std::vector<si
         chunks.push_back(std::move(chunk));
     }
     return chunks;
+}
+
+std::vector<ExtractedUnit> runExtractor(MediaExtractor& extractor, RingBuffer& ring,
+                                        const std::vector<PesChunk>& chunks, size_t outputSize,
+                                        unsigned* ringFaults) {
+    std::vector<ExtractedUnit> units;
+    std::vector<uint8_t> out(outputSize);
+    auto pull = [&]() {
+        unsigned long length = 0;
+        long long pts = 0;
+        unsigned char flags = 0;
+        const unsigned int result =
+            extractor.getDecodableUnit(out.data(), out.size(), &length, &pts, &flags);
+        if (result == MediaExtractor::RESULT_RING_FAULT && ringFaults != nullptr) {
+            ++*ringFaults;
+        }
+        if (result == MediaExtractor::RESULT_OK && length > 0) {
+            units.push_back({std::vector<uint8_t>(out.begin(), out.begin() + length), pts, flags});
+        }
+        return result;
+    };
+    for (const PesChunk& chunk : chunks) {
+        const uint32_t need = RingBuffer::roundUp4(PESData::kHeaderSize + 14 +
+                                                   static_cast<uint32_t>(chunk.es.size()));
+        while (ring.freeSpace() < need) {
+            if (pull() != MediaExtractor::RESULT_OK) {
+                break;
+            }
+        }
+        writePesRecord(ring, chunk.es, chunk.pts);
+    }
+    while (pull() == MediaExtractor::RESULT_OK) {
+    }
+    return units;
+}
+
+std::vector<PesChunk> fixedCuts(const std::vector<uint8_t>& es, size_t size, uint64_t firstPts,
+                                uint64_t ptsStep) {
+    std::vector<PesChunk> chunks;
+    for (size_t at = 0, index = 0; at < es.size(); at += size, ++index) {
+        const size_t end = std::min(es.size(), at + size);
+        chunks.push_back({std::vector<uint8_t>(es.begin() + static_cast<long>(at),
+                                               es.begin() + static_cast<long>(end)),
+                          firstPts + index * ptsStep});
+    }
+    return chunks;
+}
+
+std::vector<PesChunk> pesFromTs(const std::vector<uint8_t>& ts, uint16_t pid) {
+    std::vector<PesChunk> chunks;
+    std::vector<uint8_t> pes;
+    uint64_t lastPts = 0;
+    auto flush = [&]() {
+        // 2.4.3.6: prefix, stream_id, length, flags; PTS when PTS_DTS_flags has bit 1.
+        if (pes.size() < 9 || pes[0] != 0 || pes[1] != 0 || pes[2] != 1) {
+            pes.clear();
+            return;
+        }
+        const size_t headerEnd = 9u + pes[8];
+        if ((pes[7] & 0x80) != 0 && pes.size() >= 14) {
+            lastPts = (static_cast<uint64_t>(pes[9] & 0x0E) << 29) |
+                      (static_cast<uint64_t>(pes[10]) << 22) |
+                      (static_cast<uint64_t>(pes[11] & 0xFE) << 14) |
+                      (static_cast<uint64_t>(pes[12]) << 7) | (pes[13] >> 1);
+        }
+        if (headerEnd <= pes.size()) {
+            chunks.push_back(
+                {std::vector<uint8_t>(pes.begin() + static_cast<long>(headerEnd), pes.end()),
+                 lastPts});
+        }
+        pes.clear();
+    };
+    for (size_t at = 0; at + 188 <= ts.size(); at += 188) {
+        const uint8_t* packet = &ts[at];
+        if (packet[0] != 0x47 || (((packet[1] & 0x1F) << 8) | packet[2]) != pid) {
+            continue;
+        }
+        const bool unitStart = (packet[1] & 0x40) != 0;
+        const uint8_t control = (packet[3] >> 4) & 3;
+        size_t offset = 4;
+        if (control & 2) {
+            offset += 1u + packet[4];
+        }
+        if (!(control & 1) || offset >= 188) {
+            continue;
+        }
+        if (unitStart) {
+            flush();
+        }
+        pes.insert(pes.end(), packet + offset, packet + 188);
+    }
+    flush();
+    return chunks;
+}
+
+int probePid(const std::string& path, const std::string& type) {
+    const std::string command = "ffprobe -v error -select_streams " + type +
+                                ":0 -show_entries stream=id -of csv=p=0 '" + path + "'";
+    FILE* pipe = popen(command.c_str(), "r");
+    if (pipe == nullptr) {
+        return -1;
+    }
+    char line[64] = {};
+    const bool got = fgets(line, sizeof line, pipe) != nullptr;
+    pclose(pipe);
+    if (!got) {
+        return -1;
+    }
+    return static_cast<int>(std::strtol(line, nullptr, 0));
 }
 
 std::vector<uint8_t> readFile(const std::string& path) {

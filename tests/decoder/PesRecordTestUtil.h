@@ -10,6 +10,7 @@
 #include <utils/StrongPointer.h>
 
 #include "common/RingBuffer.h"
+#include "decoder/MediaExtractor.h"
 
 namespace TavoPlayer::test {
 
@@ -39,6 +40,36 @@ bool writeRawRecord(RingBuffer& ring, uint32_t size, uint32_t offsetES, uint32_t
 // chunk that starts at offsets[i] the PTS ptsOf[i].
 std::vector<PesChunk> cutAt(const std::vector<uint8_t>& es, const std::vector<size_t>& offsets,
                             const std::vector<uint64_t>& ptsOf);
+
+// One unit as an extractor delivered it.
+struct ExtractedUnit {
+    std::vector<uint8_t> bytes;
+    long long pts = 0;
+    unsigned char flags = 0;
+    bool operator==(const ExtractedUnit&) const = default;
+};
+
+// Feeds `chunks` as PESData records into `ring` (writing only while the ring has room,
+// so one thread can do both sides) and collects every unit `extractor` delivers until
+// it reports that no input is left. Results of 1 are counted in *ringFaults.
+std::vector<ExtractedUnit> runExtractor(MediaExtractor& extractor, RingBuffer& ring,
+                                        const std::vector<PesChunk>& chunks,
+                                        size_t outputSize = 4u << 20,
+                                        unsigned* ringFaults = nullptr);
+
+// Re-cuts an elementary stream into PES chunks of `size` bytes; every chunk carries
+// the PTS `firstPts` + index x `ptsStep`.
+std::vector<PesChunk> fixedCuts(const std::vector<uint8_t>& es, size_t size, uint64_t firstPts,
+                                uint64_t ptsStep);
+
+// The PES packets of `pid` in a 188-byte-packet transport stream (ISO/IEC 13818-1,
+// 2.4.3.2 and 2.4.3.6), each as its ES payload with its PTS (the last PTS seen when
+// a packet has none). A small, independent splitter for test inputs only.
+std::vector<PesChunk> pesFromTs(const std::vector<uint8_t>& ts, uint16_t pid);
+
+// The PID of the first stream of `type` ("v" or "a") in a TS, found with ffprobe;
+// -1 when ffprobe finds none.
+int probePid(const std::string& path, const std::string& type);
 
 // Reads a whole file; empty when it cannot be read.
 std::vector<uint8_t> readFile(const std::string& path);

@@ -1,0 +1,237 @@
+#include "AudioEncoder.h"
+
+extern "C" {
+#include <libavcodec/avcodec.h>
+#include <libavutil/channel_layout.h>
+#include <libavutil/error.h>
+#include <libavutil/frame.h>
+#include <libavutil/mathematics.h>
+#include <libavutil/samplefmt.h>
+}
+
+#include <cmath>
+
+namespace TavoPlayer::tsgen {
+
+namespace {
+
+std::string avError(int code) {
+    char text[AV_ERROR_MAX_STRING_SIZE] = {};
+    av_strerror(code, text, sizeof text);
+    return text;
+}
+
+const char* encoderName(AudioCodec codec) {
+    switch (codec) {
+        case AudioCodec::kAacLatm:
+        case AudioCodec::kAacAdts:
+            return "aac";
+        case AudioCodec::kMp2:
+            return "mp2";
+        case AudioCodec::kMp3:
+            return "libmp3lame";
+        case AudioCodec::kNone:
+            break;
+    }
+    return nullptr;
+}
+
+}  // namespace
+
+AudioEncoder::AudioEncoder(const Options& options) : mOptions(options) {
+    mTotalSamples = static_cast<int64_t>(std::llround(options.durationSec * options.audioRate));
+    // A tone per seed, on a 10 Hz grid from 300 Hz to 1.5 kHz, unless asked for.
+    mToneHz = options.toneHz > 0 ? options.toneHz : 300.0 + 10.0 * (options.seed % 121);
+}
+
+AudioEncoder::~AudioEncoder() {
+    av_packet_free(&mPacket);
+    av_frame_free(&mFrame);
+    avcodec_free_context(&mContext);
+}
+
+int AudioEncoder::frameSamples() const {
+    return mContext != nullptr && mContext->frame_size > 0 ? mContext->frame_size : 1024;
+}
+
+int AudioEncoder::open() {
+    const char* name = encoderName(mOptions.audioCodec);
+    const AVCodec* codec = name ? avcodec_find_encoder_by_name(name) : nullptr;
+    if (codec == nullptr) {
+        mError = std::string("libavcodec has no ") + (name ? name : "audio") + " encoder";
+        return 1;
+    }
+    mContext = avcodec_alloc_context3(codec);
+    mFrame = av_frame_alloc();
+    mPacket = av_packet_alloc();
+    if (mContext == nullptr || mFrame == nullptr || mPacket == nullptr) {
+        mError = "out of memory";
+        return 1;
+    }
+    const AVSampleFormat* formats = codec->sample_fmts;
+    mContext->sample_fmt = formats ? formats[0] : AV_SAMPLE_FMT_S16;
+    mContext->sample_rate = mOptions.audioRate;
+    av_channel_layout_default(&mContext->ch_layout, mOptions.audioChannels);
+    mContext->bit_rate = mOptions.effectiveAudioBitrate();
+    mContext->time_base = AVRational{1, mOptions.audioRate};
+    mContext->thread_count = 1;
+    if (mOptions.audioCodec == AudioCodec::kAacLatm ||
+        mOptions.audioCodec == AudioCodec::kAacAdts) {
+        mContext->profile = FF_PROFILE_AAC_LOW;
+        const int index = AacFramer::samplingFrequencyIndex(mOptions.audioRate);
+        if (index < 0) {
+            mError = "AAC has no sampling frequency index for " +
+                     std::to_string(mOptions.audioRate) + " Hz";
+            return 1;
+        }
+        mFramer = std::make_unique<AacFramer>(2, index, mOptions.audioChannels);
+    }
+    int rc = avcodec_open2(mContext, codec, nullptr);
+    if (rc < 0) {
+        mError = std::string("cannot open the ") + name + " encoder: " + avError(rc);
+        return 1;
+    }
+    mFrame->format = mContext->sample_fmt;
+    mFrame->nb_samples = frameSamples();
+    mFrame->sample_rate = mContext->sample_rate;
+    rc = av_channel_layout_copy(&mFrame->ch_layout, &mContext->ch_layout);
+    if (rc >= 0) {
+        rc = av_frame_get_buffer(mFrame, 0);
+    }
+    if (rc < 0) {
+        mError = "cannot allocate audio samples: " + avError(rc);
+        return 1;
+    }
+    return 0;
+}
+
+void AudioEncoder::fillTone() {
+    const int n = mFrame->nb_samples;
+    const int channels = mOptions.audioChannels;
+    const auto format = static_cast<AVSampleFormat>(mFrame->format);
+    const bool planar = av_sample_fmt_is_planar(format) != 0;
+    const AVSampleFormat packed = av_get_packed_sample_fmt(format);
+    for (int i = 0; i < n; ++i) {
+        const int64_t t = mSamplesSent + i;
+        for (int ch = 0; ch < channels; ++ch) {
+            // The right channel an octave up, so that a channel swap is audible.
+            const double hz = mToneHz * (ch == 0 ? 1.0 : 2.0);
+            // Phase from an integer sample count keeps the tone exact over hours.
+            const double phase = 2.0 * M_PI *
+                                 std::fmod(hz * static_cast<double>(t), mOptions.audioRate) /
+                                 mOptions.audioRate;
+            const double s = t < mTotalSamples ? 0.25 * std::sin(phase) : 0.0;
+            const int plane = planar ? ch : 0;
+            const int index = planar ? i : i * channels + ch;
+            switch (packed) {
+                case AV_SAMPLE_FMT_S16:
+                    reinterpret_cast<int16_t*>(mFrame->data[plane])[index] =
+                        static_cast<int16_t>(std::lrint(s * 32767.0));
+                    break;
+                case AV_SAMPLE_FMT_S32:
+                    reinterpret_cast<int32_t*>(mFrame->data[plane])[index] =
+                        static_cast<int32_t>(std::lrint(s * 2147483647.0));
+                    break;
+                case AV_SAMPLE_FMT_FLT:
+                    reinterpret_cast<float*>(mFrame->data[plane])[index] = static_cast<float>(s);
+                    break;
+                default:
+                    reinterpret_cast<double*>(mFrame->data[plane])[index] = s;
+                    break;
+            }
+        }
+    }
+}
+
+int AudioEncoder::sendNextFrame() {
+    if (mSamplesSent >= mTotalSamples) {
+        if (!mFlushed) {
+            mFlushed = true;
+            return avcodec_send_frame(mContext, nullptr);
+        }
+        return AVERROR_EOF;
+    }
+    int rc = av_frame_make_writable(mFrame);
+    if (rc < 0) {
+        return rc;
+    }
+    fillTone();
+    mFrame->pts = mSamplesSent;
+    mSamplesSent += mFrame->nb_samples;
+    return avcodec_send_frame(mContext, mFrame);
+}
+
+int AudioEncoder::encodeFrame(std::vector<uint8_t>& out) {
+    while (true) {
+        int rc = avcodec_receive_packet(mContext, mPacket);
+        if (rc == 0) {
+            break;
+        }
+        if (rc == AVERROR_EOF) {
+            return 1;
+        }
+        if (rc != AVERROR(EAGAIN)) {
+            mError = "audio encoder failed: " + avError(rc);
+            return -1;
+        }
+        rc = sendNextFrame();
+        if (rc < 0 && rc != AVERROR_EOF) {
+            mError = "audio encoder refused samples: " + avError(rc);
+            return -1;
+        }
+    }
+    int rc = 0;
+    switch (mOptions.audioCodec) {
+        case AudioCodec::kAacLatm:
+            rc = mFramer->appendLoas(mPacket->data, static_cast<size_t>(mPacket->size), out);
+            break;
+        case AudioCodec::kAacAdts:
+            rc = mFramer->appendAdts(mPacket->data, static_cast<size_t>(mPacket->size), out);
+            break;
+        default:
+            out.insert(out.end(), mPacket->data, mPacket->data + mPacket->size);
+            break;
+    }
+    av_packet_unref(mPacket);
+    if (rc != 0) {
+        mError = "an AAC access unit is too long for its transport";
+        return -1;
+    }
+    return 0;
+}
+
+int AudioEncoder::next(PesUnit& unit) {
+    if (mEnded) {
+        return 1;
+    }
+    unit.payload.clear();
+    // Time stamps count output frames from the first picture's PTS; the
+    // encoder's priming delay is not compensated, the tone has no onset to keep.
+    unit.pts =
+        mOptions.startPts + av_rescale(mFramesOut * frameSamples(), 90000, mOptions.audioRate);
+    unit.dts = unit.pts;
+    unit.hasDts = false;
+    unit.randomAccess = true;
+    int frames = 0;
+    while (frames < mOptions.audioFramesPerPes) {
+        // Stop at the requested duration; the encoder's flush would add frames
+        // of silence beyond it.
+        if (mFramesOut * frameSamples() >= mTotalSamples) {
+            mEnded = true;
+            break;
+        }
+        const int rc = encodeFrame(unit.payload);
+        if (rc < 0) {
+            return rc;
+        }
+        if (rc == 1) {
+            mEnded = true;
+            break;
+        }
+        ++frames;
+        ++mFramesOut;
+    }
+    return frames > 0 ? 0 : 1;
+}
+
+}  // namespace TavoPlayer::tsgen

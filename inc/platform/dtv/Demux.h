@@ -1,0 +1,118 @@
+// Demux: the process's demux service behind the DemuxBinder_ calls.
+//
+// One source (DemuxSource, chosen by the property tavoplayer.demux.source) is read
+// by one source thread, "DemuxSource", which aligns the bytes to TS packets, paces
+// them by their PCR when the source is a file, and fans every packet out to the
+// queue of each filter on its PID (several filters may share a PID). Each filter's
+// queue is bounded (PacketQueue): a filter that is not read fast enough loses its
+// oldest packets, counted, and never holds back the others (unless the source asks
+// the demux to wait a little first, overflow=wait).
+//
+// The source is opened by the first startFiltering() and closed, its thread joined,
+// when the last filter stops; the next startFiltering() reads the property again.
+//
+// Locks: mControlLock serialises startFiltering/stopFiltering (and with them the
+// source's lifetime); mLock guards the filters and their queues, and is what
+// select() waits on. The source thread takes only mLock. Never take mControlLock
+// while holding mLock.
+#pragma once
+
+#include <array>
+#include <atomic>
+#include <condition_variable>
+#include <cstdint>
+#include <cstdio>
+#include <memory>
+#include <mutex>
+#include <string>
+#include <vector>
+
+#include <utils/StrongPointer.h>
+
+#include "platform/dtv/DemuxBinder.h"
+#include "platform/dtv/DemuxSource.h"
+#include "platform/dtv/DemuxSourceSpec.h"
+#include "platform/dtv/PacketQueue.h"
+
+namespace TavoPlayer {
+
+class Demux {
+public:
+    static constexpr const char* kSourceProperty = "tavoplayer.demux.source";
+    // With overflow=wait, how long the source waits for a reader before dropping.
+    static constexpr int kOverflowWaitMs = 2000;
+
+    static Demux& instance();
+
+    Demux();
+    ~Demux();
+    Demux(const Demux&) = delete;
+    Demux& operator=(const Demux&) = delete;
+
+    int startFiltering(uint16_t pid, int filterKind);
+    int stopFiltering(int handle);
+    int select(DemuxHandleSet* set, int timeoutMs);
+    int readData(int handle, uint8_t* buffer, int size);
+
+    struct FilterStats {
+        uint16_t pid = 0;
+        size_t queued = 0;      // packets waiting to be read
+        uint64_t received = 0;  // packets queued since the filter started
+        uint64_t dropped = 0;   // of those, dropped on overflow
+    };
+    bool filterStats(int handle, FilterStats* stats) const;
+
+    struct SourceStats {
+        bool open = false;
+        bool ended = false;    // the source reached its end (or failed)
+        uint64_t packets = 0;  // aligned packets handed to the filters
+        uint64_t syncLosses = 0;
+        uint64_t bytesSkipped = 0;     // garbage and broken packets, truncated tails included
+        uint64_t discontinuities = 0;  // PCR discontinuities re-anchored by the pacing
+    };
+    SourceStats sourceStats() const;
+
+    void dump(FILE* stream, int indent);
+
+private:
+    class SourceThread;
+    friend class SourceThread;
+
+    struct Filter {
+        Filter(uint16_t pid, int kind, size_t capacity) : pid(pid), kind(kind), queue(capacity) {}
+        uint16_t pid;
+        int kind;
+        PacketQueue queue;
+        bool overflowLogged = false;
+        bool stalled = false;  // overflow=wait gave up on this reader until it reads again
+    };
+
+    int openSource_c();
+    void closeSource_c();
+    int allocateHandle_l() const;
+    // Source thread: hands `count` aligned packets to the filters.
+    void deliver(const uint8_t* packets, size_t count);
+    void noteEnded();
+
+    std::mutex mControlLock;
+    std::unique_ptr<DemuxSource> mSource;  // mControlLock
+    android::sp<SourceThread> mThread;     // mControlLock
+    DemuxSourceSpec mSpec;                 // written under both locks, at open
+
+    mutable std::mutex mLock;
+    std::condition_variable mDataReady;  // a filter got packets
+    std::condition_variable mRoomReady;  // a filter was read (overflow=wait)
+    std::array<std::unique_ptr<Filter>, kDemuxMaxHandles> mFilters;  // mLock, by handle
+    std::vector<std::vector<Filter*>> mPidFilters;                   // mLock, by PID
+    size_t mFilterCount = 0;                                         // mLock
+    int mNextHandle = 0;                                             // mLock
+    bool mStopping = false;                                          // mLock
+    bool mEnded = false;                                             // mLock
+
+    std::atomic<uint64_t> mPackets{0};
+    std::atomic<uint64_t> mSyncLosses{0};
+    std::atomic<uint64_t> mBytesSkipped{0};
+    std::atomic<uint64_t> mDiscontinuities{0};
+};
+
+}  // namespace TavoPlayer

@@ -1,0 +1,74 @@
+#include "platform/dtv/DemuxSource.h"
+
+#include <poll.h>
+#include <sys/eventfd.h>
+#include <unistd.h>
+
+#include <cerrno>
+
+#include "platform/dtv/DvbSource.h"
+#include "platform/dtv/FileSource.h"
+#include "platform/dtv/StdinSource.h"
+#include "platform/dtv/UdpSource.h"
+
+namespace TavoPlayer {
+
+std::unique_ptr<DemuxSource> DemuxSource::create(const DemuxSourceSpec& spec) {
+    switch (spec.kind) {
+        case DemuxSourceSpec::Kind::kFile:
+            return std::make_unique<FileSource>(spec.path, spec.loop, spec.paced);
+        case DemuxSourceSpec::Kind::kUdp:
+            return std::make_unique<UdpSource>(spec.host, spec.port, spec.iface);
+        case DemuxSourceSpec::Kind::kStdin:
+            return std::make_unique<StdinSource>(STDIN_FILENO);
+        case DemuxSourceSpec::Kind::kDvb:
+            return std::make_unique<DvbSource>(spec.adapter, spec.demux);
+        case DemuxSourceSpec::Kind::kNone:
+            break;
+    }
+    return nullptr;
+}
+
+DemuxSource::DemuxSource() : mWakeFd(eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)) {}
+
+DemuxSource::~DemuxSource() {
+    if (mWakeFd >= 0)
+        close(mWakeFd);
+}
+
+int DemuxSource::addPid(uint16_t) {
+    return 0;
+}
+
+void DemuxSource::removePid(uint16_t) {}
+
+void DemuxSource::interrupt() {
+    const uint64_t one = 1;
+    if (mWakeFd >= 0) {
+        [[maybe_unused]] ssize_t n = write(mWakeFd, &one, sizeof one);
+    }
+}
+
+void DemuxSource::drainWake() {
+    uint64_t value;
+    if (mWakeFd >= 0) {
+        [[maybe_unused]] ssize_t n = ::read(mWakeFd, &value, sizeof value);
+    }
+}
+
+int DemuxSource::waitReadable(int fd, int timeoutMs) {
+    pollfd fds[2] = {{fd, POLLIN, 0}, {mWakeFd, POLLIN, 0}};
+    const int n = poll(fds, mWakeFd >= 0 ? 2 : 1, timeoutMs);
+    if (n < 0)
+        return errno == EINTR ? 0 : -errno;
+    if (n == 0)
+        return 0;
+    if (fds[1].revents & POLLIN) {
+        drainWake();
+        return 0;
+    }
+    // POLLHUP and POLLERR count as readable: the read() that follows reports them.
+    return (fds[0].revents & (POLLIN | POLLHUP | POLLERR)) ? 1 : 0;
+}
+
+}  // namespace TavoPlayer

@@ -372,6 +372,11 @@ bool TSParser::threadLoop() {
     if (mSynchronization != nullptr && mKind == KIND_PCR && pcrSeen) {
         mSynchronization->setBasePCR(lastPCR, Synchronization::RealPCR);
     }
+    // A continuity error on a unit start leaves the payload of the packet before it
+    // in the record, and that one is appended; it must never be a packet of an
+    // earlier batch, whose bytes the receiver may already be overwriting.
+    ts->mPayload = nullptr;
+    ts->mPayloadLength = 0;
     // The whole readable area goes, even bytes after the last whole packet: the
     // receiver writes whole packets, so a partial one can only be garbage.
     input->consume(available);

@@ -1,0 +1,394 @@
+#include "tsparser/TSPacketParser.h"
+
+#include <gtest/gtest.h>
+
+#include <cstring>
+#include <string>
+#include <vector>
+
+#include "support/TraceCapture.h"
+#include "support/TsPacketBuilder.h"
+
+namespace TavoPlayer {
+namespace {
+
+using test::TraceCapture;
+using test::TsPacket;
+using test::TsPacketBuilder;
+
+constexpr uint32_t kPayload = TSPacketParser::RESULT_PAYLOAD;
+constexpr uint32_t kNewPES = TSPacketParser::RESULT_NEW_PES;
+constexpr uint32_t kError = TSPacketParser::RESULT_ERROR;
+constexpr uint32_t kSkip = TSPacketParser::RESULT_SKIP;
+
+std::vector<uint8_t> bytes(size_t n, uint8_t first) {
+    std::vector<uint8_t> v(n);
+    for (size_t i = 0; i < n; ++i)
+        v[i] = static_cast<uint8_t>(first + i);
+    return v;
+}
+
+// --- one packet into a fresh parser: result bits and header codes ----------------
+
+struct SinglePacketCase {
+    const char* name;
+    TsPacket packet;
+    uint32_t result;
+    int payloadOffset;  // -1: not checked (no payload reported)
+    uint32_t payloadLength;
+    const char* message;  // expected log fragment, or null
+};
+
+class TSPacketParserSinglePacketTest : public ::testing::TestWithParam<SinglePacketCase> {};
+
+TEST_P(TSPacketParserSinglePacketTest, ResultPayloadAndMessage) {
+    const SinglePacketCase& c = GetParam();
+    TraceCapture trace;
+    TSPacketParser parser;
+    TSParsedData data;
+    EXPECT_EQ(parser.parse(c.packet.data(), &data), c.result);
+    if (c.payloadOffset >= 0) {
+        EXPECT_EQ(data.mPayload, c.packet.data() + c.payloadOffset);
+        EXPECT_EQ(data.mPayloadLength, c.payloadLength);
+    }
+    if (c.message != nullptr) {
+        EXPECT_TRUE(trace.contains(c.message)) << trace.all();
+    }
+    if (c.result & kError) {
+        // Header codes come with the parse step's own line; control 0 has none.
+        EXPECT_EQ(trace.contains("parse - header parsing error!"), c.result != kError)
+            << trace.all();
+        EXPECT_FALSE(parser.inPES());
+    }
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Codes, TSPacketParserSinglePacketTest,
+    ::testing::Values(
+        SinglePacketCase{"LostSync",
+                         TsPacketBuilder().syncByte(0x46).unitStart().payload({1}).build(), 65, -1,
+                         0, "parseHeader - sync byte not found!"},
+        SinglePacketCase{"TransportError",
+                         TsPacketBuilder().transportError().unitStart().payload({1}).build(), 129,
+                         -1, 0, "Transport error indicator is true - discarding packet."},
+        SinglePacketCase{
+            "AdaptationLength184",
+            TsPacketBuilder().unitStart().adaptationControl(2).rawAfterHeader({184}).build(), 255,
+            -1, 0, "parseHeader: Invalid adaptation field length: 184"},
+        SinglePacketCase{
+            "AdaptationLength255",
+            TsPacketBuilder().unitStart().adaptationControl(3).rawAfterHeader({255, 0xFF}).build(),
+            255, -1, 0, "Invalid adaptation field length: 255"},
+        SinglePacketCase{
+            "ControlZero",
+            TsPacketBuilder().unitStart().adaptationControl(0).payload(bytes(184, 0)).build(), 1,
+            -1, 0, nullptr},
+        SinglePacketCase{"NoUnitStartYet", TsPacketBuilder().payload(bytes(184, 0)).build(), 8, -1,
+                         0, nullptr},
+        SinglePacketCase{"FirstStartPayloadOnly",
+                         TsPacketBuilder().unitStart().payload(bytes(184, 0)).build(), 2, 4, 184,
+                         nullptr},
+        SinglePacketCase{
+            "FirstStartWithAdaptation",
+            TsPacketBuilder().unitStart().randomAccess().payload(bytes(100, 0)).build(), 2, 88, 100,
+            nullptr},
+        SinglePacketCase{"FirstStartAdaptationOnly",
+                         TsPacketBuilder().unitStart().pcr(1234).build(), 2, 0, 0, nullptr},
+        SinglePacketCase{"OneStuffingByte",
+                         TsPacketBuilder().unitStart().payload(bytes(183, 0)).build(), 2, 5, 183,
+                         nullptr}),
+    [](const auto& info) { return std::string(info.param.name); });
+
+TEST(TSPacketParserNullTest, NullParametersAreErrors) {
+    TraceCapture trace;
+    TSPacketParser parser;
+    TSParsedData data;
+    const TsPacket packet = TsPacketBuilder().unitStart().payload({1}).build();
+    EXPECT_EQ(parser.parse(nullptr, &data), kError);
+    EXPECT_EQ(parser.parse(packet.data(), nullptr), kError);
+    EXPECT_EQ(parser.parseHeader(nullptr, &data), 16);
+    EXPECT_EQ(trace.count("parse - null parameter!"), 2u) << trace.all();
+    EXPECT_EQ(trace.count("parseHeader - null parameter!"), 1u) << trace.all();
+}
+
+TEST(TSPacketParserNullTest, ConstructionState) {
+    TSParsedData data;
+    EXPECT_EQ(data.mPID, 0xFFFF);
+    EXPECT_EQ(data.mPayload, nullptr);
+    EXPECT_EQ(data.mTransportPrivateData, nullptr);
+    TSPacketParser parser;
+    EXPECT_FALSE(parser.inPES());
+    EXPECT_EQ(parser.lastContinuityCounter(), 0u);
+}
+
+// --- sequences: the continuity counter --------------------------------------------
+
+struct Step {
+    uint8_t counter;
+    bool unitStart;
+    uint8_t control;  // 1 payload, 2 adaptation only, 3 both
+    uint32_t result;
+};
+
+struct SequenceCase {
+    const char* name;
+    std::vector<Step> steps;
+    size_t continuityErrors;
+};
+
+class TSPacketParserSequenceTest : public ::testing::TestWithParam<SequenceCase> {};
+
+TEST_P(TSPacketParserSequenceTest, ResultsFollowTheCounter) {
+    const SequenceCase& c = GetParam();
+    TraceCapture trace;
+    TSPacketParser parser;
+    TSParsedData data;
+    std::vector<TsPacket> packets;  // kept alive: the record points into them
+    for (size_t i = 0; i < c.steps.size(); ++i) {
+        const Step& s = c.steps[i];
+        TsPacketBuilder b;
+        b.pid(0x111).continuity(s.counter).unitStart(s.unitStart);
+        if (s.control == 2) {
+            b.randomAccess();
+        } else if (s.control == 3) {
+            b.randomAccess().payload(bytes(50, static_cast<uint8_t>(i)));
+        } else {
+            b.payload(bytes(184, static_cast<uint8_t>(i)));
+        }
+        packets.push_back(b.build());
+        EXPECT_EQ(parser.parse(packets.back().data(), &data), s.result) << "step " << i;
+    }
+    EXPECT_EQ(trace.count("continuity error! Discarding entire PES packet"), c.continuityErrors)
+        << trace.all();
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Counters, TSPacketParserSequenceTest,
+    ::testing::Values(
+        SequenceCase{"WrapFifteenToZero",
+                     {{14, true, 1, kPayload}, {15, false, 1, kPayload}, {0, false, 1, kPayload}},
+                     0},
+        SequenceCase{"RepeatedCounterIsError",
+                     {{14, true, 1, kPayload}, {14, false, 1, kError}, {15, false, 1, kSkip}},
+                     1},
+        SequenceCase{"GapIsErrorThenSkipUntilStart",
+                     {{3, true, 1, kPayload},
+                      {5, false, 1, kError},
+                      {6, false, 1, kSkip},
+                      {7, true, 1, kPayload},
+                      {8, false, 1, kPayload}},
+                     1},
+        SequenceCase{"AdaptationOnlyDoesNotAdvance",
+                     {{3, true, 1, kPayload},
+                      {3, false, 2, kPayload},
+                      {3, false, 2, kPayload},
+                      {4, false, 3, kPayload}},
+                     0},
+        SequenceCase{"AdaptationOnlyWithNextCounterIsError",
+                     {{3, true, 1, kPayload}, {4, false, 2, kError}},
+                     1},
+        SequenceCase{
+            "SecondStartIsNewPES", {{5, true, 1, kPayload}, {6, true, 1, kPayload | kNewPES}}, 0},
+        SequenceCase{"StartAfterGapRestarts",
+                     {{5, true, 1, kPayload},
+                      {9, true, 1, kError | kPayload},
+                      {10, false, 1, kPayload},
+                      {11, true, 1, kPayload | kNewPES}},
+                     1},
+        SequenceCase{"SkipsBeforeFirstStart",
+                     {{0, false, 1, kSkip}, {1, false, 1, kSkip}, {2, true, 1, kPayload}},
+                     0}),
+    [](const auto& info) { return std::string(info.param.name); });
+
+TEST(TSPacketParserContinuityTest, MessageNamesPidExpectedAndReceived) {
+    TraceCapture trace;
+    TSPacketParser parser;
+    TSParsedData data;
+    const TsPacket a = TsPacketBuilder().pid(0x1FF).continuity(14).unitStart().payload({1}).build();
+    const TsPacket b = TsPacketBuilder().pid(0x1FF).continuity(14).payload({2}).build();
+    parser.parse(a.data(), &data);
+    parser.parse(b.data(), &data);
+    EXPECT_TRUE(
+        trace.contains("parse - [PID = 511] continuity error! Discarding entire PES packet "
+                       "(expected 0x0F, received 0x0E)"))
+        << trace.all();
+}
+
+TEST(TSPacketParserContinuityTest, StartAfterGapKeepsPreviousPayload) {
+    TraceCapture trace;
+    TSPacketParser parser;
+    TSParsedData data;
+    const TsPacket a = TsPacketBuilder().continuity(1).unitStart().payload(bytes(184, 1)).build();
+    const TsPacket b = TsPacketBuilder().continuity(7).unitStart().payload(bytes(100, 9)).build();
+    ASSERT_EQ(parser.parse(a.data(), &data), kPayload);
+    ASSERT_EQ(parser.parse(b.data(), &data), kError | kPayload);
+    // The pointer still designates the previous packet's payload, as designed.
+    EXPECT_EQ(data.mPayload, a.data() + 4);
+    EXPECT_EQ(data.mPayloadLength, 184u);
+    EXPECT_EQ(parser.lastContinuityCounter(), 7u);
+}
+
+// --- adaptation field ---------------------------------------------------------------
+
+class TSPacketParserAdaptationTest : public ::testing::Test {
+protected:
+    uint32_t parse(const TsPacket& packet) {
+        mPackets.push_back(packet);
+        return parser.parse(mPackets.back().data(), &data);
+    }
+    TSPacketParser parser;
+    TSParsedData data;
+    std::vector<TsPacket> mPackets;
+};
+
+TEST_F(TSPacketParserAdaptationTest, ClockReferencesAreReadWhole) {
+    struct ClockCase {
+        uint64_t base;
+        uint16_t extension;
+        uint16_t storedExtension;  // (byte11 | byte10 << 7) truncated to 8 bits
+    };
+    const ClockCase cases[] = {
+        {0x1FFFFFFFFull, 0x1FF, 0xFF},  {0x1FFFFFFFFull, 0x000, 0x00}, {0, 0x123, 0xA3},
+        {0x100000000ull, 0x0AB, 0xAB},  // bit 0 of the base clear: byte10 = 0x7E
+        {0x0000000001ull, 0x055, 0x55},
+    };
+    for (const ClockCase& c : cases) {
+        parse(TsPacketBuilder()
+                  .unitStart()
+                  .pcr(c.base, c.extension)
+                  .opcr(c.base ^ 1, c.extension)
+                  .build());
+        EXPECT_EQ(data.mPCRFlag, 1);
+        EXPECT_EQ(data.mPCRBase, c.base);
+        EXPECT_EQ(data.mPCRExtension, c.storedExtension) << std::hex << c.base;
+        EXPECT_EQ(data.mOPCRFlag, 1);
+        EXPECT_EQ(data.mOPCRBase, c.base ^ 1);
+    }
+}
+
+TEST_F(TSPacketParserAdaptationTest, FlagsAndSpliceCountdown) {
+    parse(TsPacketBuilder()
+              .unitStart()
+              .discontinuity()
+              .randomAccess()
+              .priority()
+              .pcr(90000)
+              .spliceCountdown(0xF6)
+              .payload({1, 2, 3})
+              .build());
+    EXPECT_EQ(data.mDiscontinuityIndicator, 1);
+    EXPECT_EQ(data.mRandomAccessIndicator, 1);
+    EXPECT_EQ(data.mTransportPriority, 1);
+    EXPECT_EQ(data.mSplicingPointFlag, 1);
+    EXPECT_EQ(data.mSpliceCountdown, 0xF6);  // -10 as read, unsigned
+    EXPECT_EQ(data.mPCRBase, 90000u);
+    EXPECT_EQ(data.mPayloadLength, 3u);
+}
+
+TEST_F(TSPacketParserAdaptationTest, ValuesOfEarlierPacketsAreKept) {
+    parse(TsPacketBuilder().continuity(0).unitStart().pcr(777).payload(bytes(100, 0)).build());
+    parse(TsPacketBuilder().continuity(1).payload(bytes(184, 0)).build());
+    // No adaptation field: the PCR flag and value stay from the previous packet.
+    EXPECT_EQ(data.mPCRFlag, 1);
+    EXPECT_EQ(data.mPCRBase, 777u);
+    // A field without PCR clears the flag but keeps the old value.
+    parse(TsPacketBuilder().continuity(2).randomAccess().payload(bytes(10, 0)).build());
+    EXPECT_EQ(data.mPCRFlag, 0);
+    EXPECT_EQ(data.mPCRBase, 777u);
+    // Length 0 (one stuffing byte) leaves every flag as it was.
+    parse(TsPacketBuilder().continuity(3).payload(bytes(183, 0)).build());
+    EXPECT_EQ(data.mAdaptationFieldLength, 0);
+    EXPECT_EQ(data.mRandomAccessIndicator, 1);
+}
+
+TEST_F(TSPacketParserAdaptationTest, PrivateDataIsCopied) {
+    const std::vector<uint8_t> priv{0xDE, 0xAD, 0xBE, 0xEF, 0x01};
+    parse(TsPacketBuilder().unitStart().pcr(5).privateData(priv).payload(bytes(20, 0)).build());
+    ASSERT_EQ(data.mTransportPrivateDataFlag, 1);
+    ASSERT_EQ(data.mTransportPrivateDataLength, priv.size());
+    ASSERT_NE(data.mTransportPrivateData, nullptr);
+    const uint8_t* packetStart = mPackets.back().data();
+    EXPECT_TRUE(data.mTransportPrivateData < packetStart ||
+                data.mTransportPrivateData >= packetStart + 188)
+        << "a copy, not a pointer into the packet";
+    EXPECT_EQ(std::vector<uint8_t>(data.mTransportPrivateData, data.mTransportPrivateData + 5),
+              priv);
+    // A later adaptation field without private data drops it.
+    parse(TsPacketBuilder().continuity(1).randomAccess().payload(bytes(20, 0)).build());
+    EXPECT_EQ(data.mTransportPrivateDataLength, 0);
+    EXPECT_EQ(data.mTransportPrivateData, nullptr);
+}
+
+// The extension's parts sit at fixed offsets from its start e, as if every earlier
+// part were present; e is one past the splice/PCR position when there is no
+// private data. Layout here: byte 4 length, 5 flags (extension only), 6 skipped,
+// e = 7: length, e+1 flags, e+2..3 ltw, e+4..5 piecewise, e+7..11 seamless splice.
+TEST_F(TSPacketParserAdaptationTest, ExtensionFieldsAtFixedPositions) {
+    std::vector<uint8_t> raw{30,   0x01, 0x00, 11,   0xE0, 0x85, 0x34, 0x3A,
+                             0xBC, 0x00, 0x5B, 0x12, 0x35, 0x56, 0x79};
+    raw.resize(184, 0xFF);
+    ASSERT_EQ(parse(TsPacketBuilder().unitStart().adaptationControl(3).rawAfterHeader(raw).build()),
+              kPayload);
+    EXPECT_EQ(data.mAdaptationFieldExtensionLength, 11);
+    EXPECT_EQ(data.mLtwFlag, 0x80);
+    EXPECT_EQ(data.mPiecewiseRateFlag, 0x40);
+    EXPECT_EQ(data.mSeamlessSpliceFlag, 0x20);
+    EXPECT_EQ(data.mLtwValidFlag, 1);
+    EXPECT_EQ(data.mLtwOffset, 0x0534);
+    EXPECT_EQ(data.mPiecewiseRate, 0x3ABC3Au);
+    EXPECT_EQ(data.mSpliceType, 5);
+    EXPECT_EQ(data.mDTSNextAU, 0x1448D2B3Cull);
+    EXPECT_EQ(data.mPayload, mPackets.back().data() + 5 + 30);
+}
+
+TEST_F(TSPacketParserAdaptationTest, BadSpliceMarkersAreLoggedAndAccepted) {
+    TraceCapture trace;
+    std::vector<uint8_t> raw{30, 0x01, 0x00, 11, 0x20, 0, 0, 0, 0, 0, 0x5B, 0x12, 0x35, 0x56, 0x78};
+    raw.resize(184, 0xFF);
+    EXPECT_EQ(parse(TsPacketBuilder().unitStart().adaptationControl(3).rawAfterHeader(raw).build()),
+              kPayload);
+    EXPECT_TRUE(trace.contains("parseAdaptationField - bad seamless splice marker bits!"))
+        << trace.all();
+    EXPECT_EQ(data.mSpliceType, 0);
+    EXPECT_EQ(data.mDTSNextAU, 0u);
+}
+
+// Every adaptation_field_length and every flag combination, with lengths in the
+// optional parts at their largest: the parser reads only inside the packet (the
+// sanitizer builds check that) and reports the bad lengths.
+TEST_F(TSPacketParserAdaptationTest, EveryLengthAndFlagStaysInsideThePacket) {
+    TraceCapture trace;
+    for (int length = 0; length < 256; ++length) {
+        for (int flags = 0; flags < 256; flags += 7) {
+            std::vector<uint8_t> raw(184, 0xFF);
+            raw[0] = static_cast<uint8_t>(length);
+            raw[1] = static_cast<uint8_t>(flags);
+            TSPacketParser fresh;
+            TSParsedData out;
+            const TsPacket packet =
+                TsPacketBuilder().unitStart().adaptationControl(3).rawAfterHeader(raw).build();
+            const uint32_t r = fresh.parse(packet.data(), &out);
+            if (length >= 184) {
+                EXPECT_EQ(r, 255u) << length;
+            } else {
+                EXPECT_EQ(r, kPayload) << length;
+                EXPECT_EQ(out.mPayloadLength, 183u - length);
+                EXPECT_LE(out.mPayload + out.mPayloadLength, packet.data() + 188);
+            }
+        }
+    }
+}
+
+TEST_F(TSPacketParserAdaptationTest, PrivateDataPastThePacketIsNotCopied) {
+    TraceCapture trace;
+    // flags: private data only; its length byte (at 6) claims 200 bytes.
+    std::vector<uint8_t> raw{183, 0x02, 200};
+    raw.resize(184, 0xAA);
+    parse(TsPacketBuilder().unitStart().adaptationControl(2).rawAfterHeader(raw).build());
+    EXPECT_EQ(data.mTransportPrivateData, nullptr);
+    EXPECT_TRUE(trace.contains("transport private data (200 bytes) runs past the packet"))
+        << trace.all();
+}
+
+}  // namespace
+}  // namespace TavoPlayer

@@ -1,0 +1,171 @@
+// The video PES packets that the TS parser module emits for a stream muxed by
+// FFmpeg, compared with what ffprobe reads from the same file: one record per video
+// packet (all but the last, which no later unit start finishes), with the same PTS,
+// DTS and payload bytes.
+#include <gtest/gtest.h>
+
+#include <fstream>
+#include <sstream>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "TsParserTestUtil.h"
+#include "support/TraceCapture.h"
+#include "tsparser/TSParser.h"
+
+namespace TavoPlayer {
+namespace {
+
+using test::PesRecord;
+
+struct ProbePacket {
+    uint64_t pts = 0;
+    uint64_t dts = 0;
+    std::vector<uint8_t> data;
+};
+
+// Parses ffprobe's default output of -show_packets -show_data: key=value lines and,
+// after "data=", hexdump lines "OFFSET: xxxx xxxx ...  ascii".
+std::vector<ProbePacket> parseProbe(const std::string& text) {
+    std::vector<ProbePacket> packets;
+    std::istringstream in(text);
+    std::string line;
+    bool inData = false;
+    while (std::getline(in, line)) {
+        if (line == "[PACKET]") {
+            packets.emplace_back();
+            inData = false;
+        } else if (line == "[/PACKET]") {
+            inData = false;
+        } else if (packets.empty()) {
+            continue;
+        } else if (line.rfind("pts=", 0) == 0) {
+            packets.back().pts = std::stoull(line.substr(4));
+        } else if (line.rfind("dts=", 0) == 0) {
+            packets.back().dts = std::stoull(line.substr(4));
+        } else if (line == "data=") {
+            inData = true;
+        } else if (inData && line.size() > 10 && line[8] == ':') {
+            // Eight groups of four hex digits at most, then two spaces and the text.
+            const std::string hex = line.substr(10, 39);
+            std::string digits;
+            for (char c : hex) {
+                if (c != ' ')
+                    digits.push_back(c);
+            }
+            for (size_t i = 0; i + 1 < digits.size(); i += 2) {
+                packets.back().data.push_back(
+                    static_cast<uint8_t>(std::stoul(digits.substr(i, 2), nullptr, 16)));
+            }
+        }
+    }
+    return packets;
+}
+
+// Parameter: the number of B-frames. With B-frames every PES carries a DTS; without
+// them FFmpeg writes the PTS alone and the records repeat the last DTS seen.
+class TSParserFfmpegReferenceTest : public ::testing::TestWithParam<int> {
+protected:
+    void SetUp() override {
+        bool ok = false;
+        test::runCommand("command -v ffmpeg && command -v ffprobe", &ok);
+        if (!ok)
+            GTEST_SKIP() << "ffmpeg/ffprobe not installed: no independent reference";
+        mFile = std::string(TAVO_BINARY_DIR) + "/tsparser_reference_bf" +
+                std::to_string(GetParam()) + ".ts";
+        // H.264 with B-frames (PES with and without DTS), AAC and MPEG-1 Layer II.
+        const std::string make =
+            "ffmpeg -y -v error -f lavfi -i testsrc2=size=320x240:rate=30 "
+            "-f lavfi -i sine=frequency=1000:sample_rate=48000 "
+            "-f lavfi -i sine=frequency=500:sample_rate=48000 -t 3 "
+            "-map 0:v -map 1:a -map 2:a -c:v libx264 -preset ultrafast -g 15 -bf " +
+            std::to_string(GetParam()) +
+            " "
+            "-c:a:0 aac -c:a:1 mp2 -f mpegts " +
+            mFile + " 2>&1";
+        const std::string out = test::runCommand(make, &ok);
+        ASSERT_TRUE(ok) << "ffmpeg could not make the reference stream: " << out;
+    }
+    std::string mFile;
+};
+
+TEST_P(TSParserFfmpegReferenceTest, VideoPesMatchesFfprobe) {
+    bool ok = false;
+    const std::string pidText = test::runCommand(
+        "ffprobe -v error -select_streams v:0 -show_entries stream=id -of csv=p=0 " + mFile, &ok);
+    ASSERT_TRUE(ok);
+    const uint16_t pid = static_cast<uint16_t>(std::stoul(pidText, nullptr, 16));
+    const auto probe = parseProbe(test::runCommand(
+        "ffprobe -v error -select_streams v:0 -show_packets -show_data " + mFile, &ok));
+    ASSERT_TRUE(ok);
+    ASSERT_GT(probe.size(), 60u);
+
+    std::ifstream file(mFile, std::ios::binary);
+    std::vector<uint8_t> ts((std::istreambuf_iterator<char>(file)),
+                            std::istreambuf_iterator<char>());
+    ASSERT_EQ(ts.size() % 188, 0u);
+    std::vector<uint8_t> videoPackets;
+    for (size_t at = 0; at < ts.size(); at += 188) {
+        ASSERT_EQ(ts[at], 0x47);
+        if ((((ts[at + 1] & 0x1F) << 8) | ts[at + 2]) == pid) {
+            videoPackets.insert(videoPackets.end(), ts.begin() + at, ts.begin() + at + 188);
+        }
+    }
+
+    test::TraceCapture trace;  // keeps the clock's lines out of the test output
+    auto input = test::makeRing("VideoTS", 1 << 16);
+    auto output = test::makeRing("VideoPES", 1 << 20);
+    android::sp<TSParser> parser = new TSParser(TSParser::KIND_VIDEO);
+    parser->setInput(input);
+    parser->addOutput(output, nullptr);
+    ASSERT_EQ(parser->start(), 0u);
+
+    // Fed in uneven batches while the records are read, as a decoder would.
+    std::vector<PesRecord> records;
+    size_t at = 0;
+    size_t step = 1;
+    while (at < videoPackets.size()) {
+        const size_t bytes = std::min(videoPackets.size() - at, 188 * step);
+        ASSERT_TRUE(test::writeAll(
+            *input,
+            std::vector<uint8_t>(videoPackets.begin() + at, videoPackets.begin() + at + bytes)));
+        at += bytes;
+        step = step % 37 + 3;
+        for (auto& r : test::drainRecords(*output))
+            records.push_back(std::move(r));
+    }
+    ASSERT_TRUE(test::waitConsumed(*input));
+    for (auto& r : test::drainRecords(*output))
+        records.push_back(std::move(r));
+    EXPECT_EQ(parser->stop(), 0u);
+
+    ASSERT_EQ(records.size(), probe.size() - 1) << "every PES but the last";
+    uint64_t lastDts = 0;
+    size_t withoutDts = 0;
+    for (size_t i = 0; i < records.size(); ++i) {
+        const PesRecord& r = records[i];
+        ASSERT_GE(r.pes.size(), 9u);
+        EXPECT_EQ(r.pts, probe[i].pts) << "PES " << i;
+        // Only PES headers that carry a DTS give one; the others repeat the last.
+        if ((r.pes[7] & 0xC0) == 0xC0) {
+            EXPECT_EQ(r.dts, probe[i].dts) << "PES " << i;
+            lastDts = r.dts;
+        } else {
+            EXPECT_EQ(r.dts, lastDts) << "PES " << i;
+            ++withoutDts;
+        }
+        EXPECT_EQ(r.sizeES, probe[i].data.size()) << "PES " << i;
+        EXPECT_TRUE(r.es() == probe[i].data) << "payload of PES " << i << " differs";
+    }
+    if (GetParam() == 0) {
+        EXPECT_EQ(withoutDts, records.size()) << "no B-frames: PTS only";
+    } else {
+        EXPECT_EQ(withoutDts, 0u) << "B-frames: every PES has its DTS";
+    }
+}
+
+INSTANTIATE_TEST_SUITE_P(BFrames, TSParserFfmpegReferenceTest, ::testing::Values(0, 2));
+
+}  // namespace
+}  // namespace TavoPlayer

@@ -403,9 +403,20 @@ int OptionParser::parse(int argc, char** argv, Options& o) {
     opterr = 0;
     optind = 0;  // full re-initialisation, so that parse can run more than once
     int c = 0;
-    while ((c = getopt_long(argc, argv, ":o:d:vh", kLong, nullptr)) != -1) {
+    int longIndex = -1;
+    while ((c = getopt_long(argc, argv, ":o:d:vh", kLong, &longIndex)) != -1) {
         const std::string arg = optarg ? optarg : "";
-        const std::string name = (optind > 0 && optind <= argc) ? argv[optind - 1] : "";
+        // The option as written: its long name when known, else the word that
+        // getopt stopped at (an unknown option, or one missing its value).
+        std::string name;
+        if (longIndex >= 0 && c != '?' && c != ':') {
+            name = std::string("--") + kLong[longIndex].name;
+        } else if (c != '?' && c != ':') {
+            name = std::string("-") + static_cast<char>(c);
+        } else if (optind > 0 && optind <= argc) {
+            name = argv[optind - 1];
+        }
+        longIndex = -1;
         int64_t v = 0;
         auto intArg = [&](int64_t lo, int64_t hi, auto& field) {
             if (!parseInt(arg, lo, hi, v)) {

@@ -1,6 +1,7 @@
 #include "TsMuxer.h"
 
 #include <algorithm>
+#include <cmath>
 #include <cstring>
 
 namespace TavoPlayer::tsgen {
@@ -210,6 +211,8 @@ int TsMuxer::run(std::FILE* out) {
     const int64_t psiInterval27 = static_cast<int64_t>(mOptions.psiIntervalMs) * 27000;
     const uint16_t pcrPid = mOptions.effectivePcrPid();
     const int64_t faultBase27 = mOptions.startPts * 300;
+    const int64_t end27 =
+        faultBase27 + static_cast<int64_t>(std::llround(mOptions.durationSec * 27e6));
     int64_t nextPsi27 = INT64_MIN;
     int64_t nextPcr27 = INT64_MIN;
     bool pmtPending = false;
@@ -220,7 +223,10 @@ int TsMuxer::run(std::FILE* out) {
         const int64_t now27 = slotTime27(slot);
         const bool anyData =
             std::any_of(mStreams.begin(), mStreams.end(), [](const Stream& s) { return s.loaded; });
-        if (!anyData && !pmtPending) {
+        // Once everything is sent, the multiplex runs on (tables, PCR, null
+        // packets) until the clock reaches the end of the contents, as a
+        // broadcast would; the last PES leave up to the send window early.
+        if (!anyData && !pmtPending && now27 >= end27) {
             break;
         }
         // Streams whose next PES may leave now, the earliest decoding time first.

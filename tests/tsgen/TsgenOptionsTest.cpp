@@ -1,0 +1,73 @@
+// Command-line handling: bad options fail with a message that names them.
+
+#include <gtest/gtest.h>
+
+#include "TsgenTestUtil.h"
+
+namespace TavoPlayer::test {
+namespace {
+
+struct BadOption {
+    const char* args;
+    const char* message;
+};
+
+class TsgenBadOptionTest : public ::testing::TestWithParam<BadOption> {};
+
+TEST_P(TsgenBadOptionTest, FailsWithAClearMessageAndWritesNothing) {
+    TempDir dir;
+    const std::string file = dir.path("never.ts");
+    const std::string cmd = std::string(TAVO_TSGEN_PATH) + " " + GetParam().args;
+    const auto run = runCommand(cmd);
+    EXPECT_EQ(run.exitCode, 2);
+    EXPECT_NE(run.err.find(GetParam().message), std::string::npos) << run.err;
+    EXPECT_TRUE(run.out.empty());
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Table, TsgenBadOptionTest,
+    ::testing::Values(BadOption{"", "no output given"},
+                      BadOption{"-o /dev/null --duration 0", "--duration"},
+                      BadOption{"-o /dev/null --duration ten", "--duration"},
+                      BadOption{"-o /dev/null --size 321x240", "--size"},
+                      BadOption{"-o /dev/null --fps 0", "--fps"},
+                      BadOption{"-o /dev/null --audio aac", "--audio"},
+                      BadOption{"-o /dev/null --video-pid 0x1FFF", "--video-pid"},
+                      BadOption{"-o /dev/null --audio-pid 0x111", "must all differ"},
+                      BadOption{"-o /dev/null --pcr-pid 0x112", "--pcr-pid"},
+                      BadOption{"-o /dev/null --pcr-interval-ms 150", "--pcr-interval-ms"},
+                      BadOption{"-o /dev/null --cc-error 0x111", "PID:INDEX"},
+                      BadOption{"-o /dev/null --tei 0x111:x", "PID:INDEX"},
+                      BadOption{"-o /dev/null --gap 1", "--gap"},
+                      BadOption{"-o /dev/null --start-pts 8589934592", "--start-pts"},
+                      BadOption{"-o /dev/null --latm-as-adts --audio adts", "--latm-as-adts"},
+                      BadOption{"-o /dev/null --caption '1:\\q'", "unknown escape"},
+                      BadOption{"-o /dev/null --caption '1:\xe4\xb8\xad'", "no Latin caption code"},
+                      BadOption{"-o /dev/null --mux-rate 200000", "below the contents"},
+                      BadOption{"-o /dev/null --bogus", "unknown option --bogus"},
+                      BadOption{"-o /dev/null --seed", "needs a value"},
+                      BadOption{"-o /dev/null stray", "unexpected argument 'stray'"}));
+
+TEST(TsgenHelpTest, HelpDocumentsTheFaultsAndSucceeds) {
+    const auto run = runCommand(std::string(TAVO_TSGEN_PATH) + " --help");
+    EXPECT_EQ(run.exitCode, 0);
+    for (const char* option : {"--output",    "--duration",     "--size",
+                               "--fps",       "--progressive",  "--audio ",
+                               "--caption ",  "--mux-rate",     "--pcr-interval-ms",
+                               "--start-pts", "--seed",         "--cc-error",
+                               "--drop",      "--tei",          "--scramble",
+                               "--pcr-jump",  "--gap",          "--no-aud",
+                               "--no-vui",    "--latm-as-adts", "--adts-as-latm"}) {
+        EXPECT_NE(run.out.find(option), std::string::npos) << option;
+    }
+}
+
+TEST(TsgenOutputTest, UnwritableOutputFails) {
+    const auto run = runCommand(std::string(TAVO_TSGEN_PATH) +
+                                " -d 0.1 --size 64x64 -o /nonexistent-dir/out.ts");
+    EXPECT_EQ(run.exitCode, 1);
+    EXPECT_NE(run.err.find("cannot open /nonexistent-dir/out.ts"), std::string::npos) << run.err;
+}
+
+}  // namespace
+}  // namespace TavoPlayer::test

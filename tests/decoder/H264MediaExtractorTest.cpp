@@ -1,0 +1,980 @@
+#include <gtest/gtest.h>
+
+#include <cstdio>
+#include <filesystem>
+#include <map>
+#include <random>
+#include <sstream>
+#include <string>
+#include <vector>
+
+extern "C" {
+#include <libavcodec/avcodec.h>
+}
+
+#include "PesRecordTestUtil.h"
+#include "decoder/H264MediaExtractor.h"
+#include "support/TraceCapture.h"
+
+namespace TavoPlayer {
+namespace {
+
+using test::ExtractedUnit;
+using test::PesChunk;
+using Bytes = std::vector<uint8_t>;
+
+// An independent bit-string builder for RBSPs: u(n), ue(v), se(v) (ITU-T H.264, 7.2, 9.1).
+class Rbsp {
+public:
+    Rbsp& u(unsigned count, uint64_t value) {
+        for (unsigned i = count; i-- > 0;) {
+            mBits.push_back(((value >> i) & 1u) != 0);
+        }
+        return *this;
+    }
+    Rbsp& ue(uint64_t value) {
+        const uint64_t code = value + 1;
+        unsigned width = 0;
+        while ((code >> width) > 1) {
+            ++width;
+        }
+        u(width, 0);
+        return u(width + 1, code);
+    }
+    Rbsp& se(int64_t value) { return ue(value > 0 ? 2 * value - 1 : -2 * value); }
+    // rbsp_trailing_bits.
+    Bytes bytes(bool trailing = true) const {
+        std::vector<bool> bits = mBits;
+        if (trailing) {
+            bits.push_back(true);
+            while (bits.size() % 8 != 0) {
+                bits.push_back(false);
+            }
+        }
+        Bytes out((bits.size() + 7) / 8, 0);
+        for (size_t i = 0; i < bits.size(); ++i) {
+            if (bits[i]) {
+                out[i / 8] |= static_cast<uint8_t>(0x80 >> (i % 8));
+            }
+        }
+        return out;
+    }
+
+private:
+    std::vector<bool> mBits;
+};
+
+// A NAL unit: start code (3 or 4 bytes), header, payload with emulation prevention.
+Bytes nal(uint8_t header, const Bytes& rbsp, bool longStartCode = true) {
+    Bytes out = longStartCode ? Bytes{0, 0, 0, 1} : Bytes{0, 0, 1};
+    out.push_back(header);
+    int zeros = 0;
+    for (uint8_t b : rbsp) {
+        if (zeros >= 2 && b <= 3) {
+            out.push_back(3);
+            zeros = 0;
+        }
+        out.push_back(b);
+        zeros = b == 0 ? zeros + 1 : 0;
+    }
+    return out;
+}
+
+Bytes cat(std::initializer_list<Bytes> parts) {
+    Bytes out;
+    for (const Bytes& p : parts) {
+        out.insert(out.end(), p.begin(), p.end());
+    }
+    return out;
+}
+
+struct SpsParams {
+    unsigned profile = 100;
+    unsigned spsId = 0;
+    unsigned chromaFormat = 1;
+    unsigned bitDepthLumaMinus8 = 0;
+    unsigned bitDepthChromaMinus8 = 0;
+    bool scalingLists = false;
+    unsigned log2MaxFrameNumMinus4 = 0;
+    unsigned pocType = 0;
+    unsigned log2MaxPocLsbMinus4 = 2;
+    unsigned pocCycle = 0;
+    unsigned refFrames = 1;
+    unsigned widthMbs = 120;
+    unsigned heightMapUnits = 68;
+    bool frameMbsOnly = true;
+    unsigned cropBottom = 0;  // in crop units
+    bool vui = true;
+    int aspectIdc = -1;  // -1: no aspect ratio info
+    bool timing = true;
+    uint32_t numUnitsInTick = 1001;
+    uint32_t timeScale = 60000;
+    bool fixedFrameRate = true;
+    bool nalHrd = false;
+    unsigned hrdFields[5] = {23, 23, 5, 7, 24};
+    bool picStructPresent = false;
+    bool bitstreamRestriction = true;
+};
+
+Bytes spsRbsp(const SpsParams& p) {
+    Rbsp r;
+    r.u(8, p.profile).u(8, 0).u(8, 40).ue(p.spsId);
+    if (p.profile == 100) {
+        r.ue(p.chromaFormat);
+        if (p.chromaFormat == 3) {
+            r.u(1, 0);
+        }
+        r.ue(p.bitDepthLumaMinus8).ue(p.bitDepthChromaMinus8).u(1, 0);
+        r.u(1, p.scalingLists);
+        if (p.scalingLists) {
+            for (int list = 0; list < 8; ++list) {
+                r.u(1, list % 2 == 0);
+                if (list % 2 == 0) {
+                    const int entries = list < 6 ? 16 : 64;
+                    for (int j = 0; j < entries; ++j) {
+                        r.se(j == entries - 1 ? -8 - j : 1);  // ends with next = 0
+                    }
+                }
+            }
+        }
+    }
+    r.ue(p.log2MaxFrameNumMinus4).ue(p.pocType);
+    if (p.pocType == 0) {
+        r.ue(p.log2MaxPocLsbMinus4);
+    } else if (p.pocType == 1) {
+        r.u(1, 0).se(-3).se(2).ue(p.pocCycle);
+        for (unsigned i = 0; i < p.pocCycle && i < 300; ++i) {
+            r.se(static_cast<int>(i % 5) - 2);
+        }
+    }
+    r.ue(p.refFrames).u(1, 0).ue(p.widthMbs - 1).ue(p.heightMapUnits - 1);
+    r.u(1, p.frameMbsOnly);
+    if (!p.frameMbsOnly) {
+        r.u(1, 1);
+    }
+    r.u(1, 1);
+    r.u(1, p.cropBottom != 0);
+    if (p.cropBottom != 0) {
+        r.ue(0).ue(0).ue(0).ue(p.cropBottom);
+    }
+    r.u(1, p.vui);
+    if (p.vui) {
+        r.u(1, p.aspectIdc >= 0);
+        if (p.aspectIdc >= 0) {
+            r.u(8, static_cast<unsigned>(p.aspectIdc));
+            if (p.aspectIdc == 255) {
+                r.u(16, 4).u(16, 3);
+            }
+        }
+        r.u(1, 0);                          // overscan
+        r.u(1, 1).u(3, 5).u(1, 0).u(1, 1);  // video signal, colour description
+        r.u(8, 1).u(8, 1).u(8, 1);
+        r.u(1, 1).ue(0).ue(0);  // chroma location
+        r.u(1, p.timing);
+        if (p.timing) {
+            r.u(32, p.numUnitsInTick).u(32, p.timeScale).u(1, p.fixedFrameRate);
+        }
+        r.u(1, p.nalHrd);
+        if (p.nalHrd) {
+            r.ue(0).u(4, 2).u(4, 3).ue(1000).ue(2000).u(1, 1);
+            for (unsigned f : p.hrdFields) {  // five fields, as the extractor reads them
+                r.u(5, f);
+            }
+        }
+        r.u(1, 0);  // VCL HRD
+        if (p.nalHrd) {
+            r.u(1, 0);  // low_delay_hrd_flag
+        }
+        r.u(1, p.picStructPresent);
+        r.u(1, p.bitstreamRestriction);
+        if (p.bitstreamRestriction) {
+            r.u(1, 1).ue(2).ue(1).ue(16).ue(16).ue(1).ue(4);
+        }
+    }
+    return r.bytes();
+}
+
+Bytes aud() {
+    return nal(0x09, Rbsp().u(3, 7).bytes());
+}
+Bytes pps() {
+    return nal(0x68, Rbsp().ue(0).ue(0).u(1, 0).u(1, 0).ue(0).bytes());
+}
+// A slice: first_mb_in_slice, slice_type, pps id, frame_num (4 bits), [field_pic_flag],
+// then filler. `header` 0x65 for IDR, 0x41 otherwise.
+Bytes slice(uint8_t header, unsigned firstMb, bool longStartCode = false, int field = -1,
+            size_t filler = 24) {
+    Rbsp r;
+    r.ue(firstMb).ue(header == 0x65 ? 7 : 5).ue(0).u(4, 0);
+    if (field >= 0) {
+        r.u(1, static_cast<unsigned>(field));
+    }
+    for (size_t i = 0; i < filler; ++i) {
+        r.u(8, 0xA0 + i % 31);
+    }
+    return nal(header, r.bytes(), longStartCode);
+}
+// A picture-timing SEI for an SPS without HRD: pic_struct and no clock timestamps.
+Bytes picTimingSei(unsigned picStruct) {
+    Rbsp payload;
+    payload.u(4, picStruct);
+    static const unsigned clocks[9] = {1, 1, 1, 2, 2, 3, 3, 2, 3};
+    for (unsigned i = 0; i < clocks[picStruct]; ++i) {
+        payload.u(1, 0);
+    }
+    Bytes body = payload.bytes(false);
+    // pad to whole bytes with the bit-equal alignment
+    Rbsp sei;
+    sei.u(8, 1).u(8, body.size());
+    Bytes out = sei.bytes(false);
+    out.insert(out.end(), body.begin(), body.end());
+    out.push_back(0x80);
+    return nal(0x06, out, false);
+}
+
+class H264Fixture : public ::testing::Test {
+protected:
+    void SetUp() override {
+        mRing = test::makeRing(22);
+        ASSERT_NE(mRing, nullptr);
+        mExtractor = new H264MediaExtractor(mRing);
+    }
+    std::vector<ExtractedUnit> run(const std::vector<PesChunk>& chunks, size_t out = 1 << 20) {
+        return test::runExtractor(*mExtractor, *mRing, chunks, out);
+    }
+    android::sp<RingBuffer> mRing;
+    android::sp<H264MediaExtractor> mExtractor;
+};
+
+// --- Exp-Golomb and emulation prevention ------------------------------------------------
+
+class H264GolombTest : public H264Fixture {};
+
+TEST_F(H264GolombTest, UnsignedAndSignedCodesRoundTrip) {
+    const uint64_t unsignedValues[] = {0, 1, 2, 3, 6, 7, 254, 255, 65535, 0x7FFFFFFE, 0xFFFFFFFE};
+    const int64_t signedValues[] = {0, 1, -1, 2, -2, 100, -100, 32767, -32768};
+    Rbsp r;
+    for (uint64_t v : unsignedValues) {
+        r.ue(v);
+    }
+    for (int64_t v : signedValues) {
+        r.se(v);
+    }
+    Bytes bytes = r.bytes();
+    ReadBitInterface reader(bytes.data(), bytes.size());
+    for (uint64_t v : unsignedValues) {
+        EXPECT_EQ(mExtractor->parseUEGolomb(&reader), v);
+    }
+    for (int64_t v : signedValues) {
+        EXPECT_EQ(mExtractor->parseSEGolomb(&reader), v);
+    }
+}
+
+TEST_F(H264GolombTest, CodeRunningOffTheBufferStopsAtItsEnd) {
+    Bytes zeros(3, 0x00);  // 24 leading zeros and no terminating 1
+    ReadBitInterface reader(zeros.data(), zeros.size());
+    mExtractor->parseUEGolomb(&reader);
+    EXPECT_EQ(reader.remainingBytes(), 0u);  // it never moved past the buffer
+}
+
+class H264EmulationPreventionTest : public H264Fixture {};
+
+TEST_F(H264EmulationPreventionTest, RemovalStartsAtByteFour) {
+    struct Case {
+        Bytes in;
+        Bytes out;
+    };
+    const Case cases[] = {
+        {{0x00, 0x00, 0x03, 0x01, 0x00, 0x00, 0x03, 0x00, 0x00, 0x03},
+         {0x00, 0x00, 0x03, 0x01, 0x00, 0x00, 0x00, 0x00}},
+        {{0x11, 0x00, 0x00, 0x03, 0x02}, {0x11, 0x00, 0x00, 0x03, 0x02}},  // 03 at byte 3 kept
+        {{0x11, 0x22, 0x00, 0x00, 0x03, 0x01}, {0x11, 0x22, 0x00, 0x00, 0x01}},
+        {{0x11, 0x22, 0x33, 0x44, 0x00, 0x03, 0x00, 0x03},
+         {0x11, 0x22, 0x33, 0x44, 0x00, 0x03, 0x00, 0x03}},
+        {{0x11, 0x22, 0x33, 0x44, 0x00, 0x00}, {0x11, 0x22, 0x33, 0x44, 0x00, 0x00}},
+    };
+    for (const Case& c : cases) {
+        Bytes in = c.in;
+        unsigned char* out = nullptr;
+        unsigned int outSize = 0;
+        ASSERT_EQ(mExtractor->decodeNALUnit(in.data(), in.size(), &out, &outSize), 0u);
+        EXPECT_EQ(Bytes(out, out + outSize), c.out);
+        delete[] out;
+    }
+}
+
+TEST_F(H264EmulationPreventionTest, FewerThanFourBytesFail) {
+    test::TraceCapture trace;
+    Bytes in = {0x00, 0x00, 0x03};
+    unsigned char* out = nullptr;
+    unsigned int outSize = 0;
+    EXPECT_NE(mExtractor->decodeNALUnit(in.data(), in.size(), &out, &outSize), 0u);
+    EXPECT_EQ(out, nullptr);
+    EXPECT_EQ(trace.count(TRACE_ERROR, "decodeNALUnit: NAL Unit with less than 4 bytes?"), 1u);
+}
+
+// --- SPS ------------------------------------------------------------------------
+
+struct SpsCase {
+    const char* name;
+    SpsParams params;
+    unsigned result;
+    const char* message;  // expected error text, or nullptr
+    uint32_t width;
+    uint32_t height;
+};
+
+SpsParams with(std::function<void(SpsParams&)> change) {
+    SpsParams p;
+    change(p);
+    return p;
+}
+
+class H264SpsTest : public H264Fixture, public ::testing::WithParamInterface<SpsCase> {};
+
+TEST_P(H264SpsTest, DecodesFieldsOrFailsWithItsMessage) {
+    const SpsCase& c = GetParam();
+    test::TraceCapture trace;
+    Bytes rbsp = nal(0x67, spsRbsp(c.params));
+    rbsp.erase(rbsp.begin(), rbsp.begin() + 5);  // the bytes after the header, escaped
+    EXPECT_EQ(mExtractor->decodeSPS(rbsp.data(), rbsp.size(), true), c.result) << trace.all();
+    if (c.message != nullptr) {
+        EXPECT_EQ(trace.count(TRACE_ERROR, c.message), 1u) << trace.all();
+    } else {
+        EXPECT_EQ(trace.lines().size(), 0u) << trace.all();
+    }
+    if (c.width != 0) {
+        EXPECT_EQ(mExtractor->getCroppedWidth(), c.width);
+        EXPECT_EQ(mExtractor->getCroppedHeight(), c.height);
+    }
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Fields, H264SpsTest,
+    ::testing::Values(
+        SpsCase{"Crop1088To1080", with([](SpsParams& p) { p.cropBottom = 4; }), 0, nullptr, 1920,
+                1080},
+        SpsCase{"InterlacedCrop", with([](SpsParams& p) {
+                    p.frameMbsOnly = false;
+                    p.heightMapUnits = 34;
+                    p.cropBottom = 2;
+                }),
+                0, nullptr, 1920, 1080},
+        SpsCase{"Baseline", with([](SpsParams& p) {
+                    p.profile = 66;
+                    p.widthMbs = 40;
+                    p.heightMapUnits = 30;
+                }),
+                0, nullptr, 640, 480},
+        SpsCase{"ScalingLists", with([](SpsParams& p) { p.scalingLists = true; }), 0, nullptr, 1920,
+                1088},
+        SpsCase{"PocType1", with([](SpsParams& p) {
+                    p.pocType = 1;
+                    p.pocCycle = 3;
+                }),
+                0, nullptr, 1920, 1088},
+        SpsCase{"PocType2", with([](SpsParams& p) { p.pocType = 2; }), 0, nullptr, 1920, 1088},
+        SpsCase{"Aspect17Passes", with([](SpsParams& p) { p.aspectIdc = 17; }), 0, nullptr, 0, 0},
+        SpsCase{"Aspect255", with([](SpsParams& p) { p.aspectIdc = 255; }), 0, nullptr, 0, 0},
+        SpsCase{"Aspect18Fails", with([](SpsParams& p) { p.aspectIdc = 18; }), 1,
+                "decodeVUI: Illegal Aspect Ratio: 18", 0, 0},
+        SpsCase{"NoVui", with([](SpsParams& p) { p.vui = false; }), 1,
+                "decodeSPS: VUI is not present", 1920, 1088},
+        SpsCase{"ZeroTimeScale", with([](SpsParams& p) { p.timeScale = 0; }), 1,
+                "decodeVUI: Illegal TimeScale or Number of Ticks (0, 1001)", 0, 0},
+        SpsCase{"SpsId32", with([](SpsParams& p) { p.spsId = 32; }), 1,
+                "decodeSPS: SPS number (32) is out of range", 0, 0},
+        SpsCase{"Chroma4", with([](SpsParams& p) { p.chromaFormat = 4; }), 1,
+                "decodeSPS: Chroma Format IDC 4 is not valid", 0, 0},
+        SpsCase{"BitDepthsDiffer", with([](SpsParams& p) { p.bitDepthChromaMinus8 = 2; }), 1,
+                "decodeSPS: Illegal bit depth values (8, 10)", 0, 0},
+        SpsCase{"BitDepth15", with([](SpsParams& p) {
+                    p.bitDepthLumaMinus8 = 7;
+                    p.bitDepthChromaMinus8 = 7;
+                }),
+                1, "decodeSPS: Illegal bit depth values (15, 15)", 0, 0},
+        SpsCase{"MaxFrameNum17", with([](SpsParams& p) { p.log2MaxFrameNumMinus4 = 13; }), 1,
+                "decodeSPS; Max frame num invalid range out of range (4-16): 17", 0, 0},
+        SpsCase{"PocLsb17", with([](SpsParams& p) { p.log2MaxPocLsbMinus4 = 13; }), 1,
+                "decodeSPS: log2MaxPocLSB (17) is out of range", 0, 0},
+        SpsCase{"PocCycle256", with([](SpsParams& p) {
+                    p.pocType = 1;
+                    p.pocCycle = 256;
+                }),
+                1, "decodeSPS: Poc Cycle Length out of bounds: 256", 0, 0},
+        SpsCase{"PocType3", with([](SpsParams& p) { p.pocType = 3; }), 1,
+                "decodeSPS: illegal POC type 3", 0, 0},
+        SpsCase{"RefFrames17", with([](SpsParams& p) { p.refFrames = 17; }), 1,
+                "decodeSPS: Reference frames invalid: 17", 0, 0}),
+    [](const auto& info) { return std::string(info.param.name); });
+
+class H264SpsRobustnessTest : public H264Fixture {};
+
+TEST_F(H264SpsRobustnessTest, EveryTruncationFailsWithoutReadingPastTheEnd) {
+    SpsParams p;
+    p.nalHrd = true;
+    p.picStructPresent = true;
+    p.scalingLists = true;
+    const Bytes full = spsRbsp(p);
+    ASSERT_EQ(mExtractor->decodeSPS(const_cast<uint8_t*>(full.data()), full.size(), false), 0u);
+    // Cut before the last byte that holds a field (the last byte is only trailing bits).
+    for (size_t size = 0; size + 1 < full.size(); ++size) {
+        // A heap copy of exactly `size` bytes, so that ASan sees any read beyond it.
+        std::unique_ptr<uint8_t[]> cut(new uint8_t[size + 1]);
+        std::copy(full.begin(), full.begin() + static_cast<long>(size), cut.get());
+        EXPECT_EQ(mExtractor->decodeSPS(cut.get(), size, true), 1u) << "size " << size;
+    }
+}
+
+TEST_F(H264SpsRobustnessTest, BitFlipsNeverReadOutsideTheUnit) {
+    SpsParams p;
+    p.nalHrd = true;
+    p.picStructPresent = true;
+    const Bytes full = spsRbsp(p);
+    std::mt19937 random(1234);
+    unsigned failures = 0;
+    for (size_t bit = 0; bit < full.size() * 8; ++bit) {
+        std::unique_ptr<uint8_t[]> copy(new uint8_t[full.size()]);
+        std::copy(full.begin(), full.end(), copy.get());
+        copy[bit / 8] ^= static_cast<uint8_t>(0x80 >> (bit % 8));
+        copy[random() % full.size()] ^= static_cast<uint8_t>(random());
+        failures += mExtractor->decodeSPS(copy.get(), full.size(), true);
+    }
+    // Most single flips break some field; none may take the reader past the copy.
+    EXPECT_GT(failures, 0u);
+}
+
+TEST_F(H264SpsRobustnessTest, FifthHrdFieldShiftsTheLaterFields) {
+    SpsParams p;
+    p.nalHrd = true;
+    p.picStructPresent = true;
+    p.hrdFields[0] = 23;
+    p.hrdFields[1] = 17;
+    p.hrdFields[2] = 5;
+    p.hrdFields[3] = 9;
+    p.hrdFields[4] = 11;
+    const Bytes rbsp = spsRbsp(p);
+    ASSERT_EQ(mExtractor->decodeSPS(const_cast<uint8_t*>(rbsp.data()), rbsp.size(), false), 0u);
+    const auto& hrd = mExtractor->getNalHrd();
+    EXPECT_EQ(hrd.lengthField[0], 23);
+    EXPECT_EQ(hrd.lengthField[1], 17);
+    EXPECT_EQ(hrd.lengthField[2], 9);  // the fourth read wins
+    EXPECT_EQ(hrd.lengthField[3], 11);
+    EXPECT_EQ(hrd.cpbCountMinus1, 0u);
+    EXPECT_EQ(hrd.bitRateValueMinus1[0], 1000u);
+    EXPECT_EQ(hrd.cpbSizeValueMinus1[0], 2000u);
+    EXPECT_TRUE(hrd.cbrFlag[0]);
+    EXPECT_TRUE(mExtractor->getPicStructPresent());
+}
+
+// --- SEI and frame rate --------------------------------------------------------------
+
+class H264SeiTest : public H264Fixture {
+protected:
+    void decodeSps(const SpsParams& p) {
+        Bytes rbsp = spsRbsp(p);
+        ASSERT_EQ(mExtractor->decodeSPS(rbsp.data(), rbsp.size(), false), 0u);
+    }
+    unsigned decodeSei(Bytes seiNal) {
+        seiNal.erase(seiNal.begin(), seiNal.begin() + 4);  // 3-byte start code and header
+        return mExtractor->decodeSEI(seiNal.data(), seiNal.size(), true);
+    }
+};
+
+TEST_F(H264SeiTest, PicTimingWithHrdDelaysAndClockTimestamp) {
+    SpsParams p;
+    p.nalHrd = true;
+    p.picStructPresent = true;
+    p.hrdFields[1] = 9;  // delays of 10 bits
+    p.hrdFields[4] = 0;  // no time offset
+    decodeSps(p);
+    Rbsp payload;
+    payload.u(10, 0x155).u(10, 0x0AA).u(4, 3);  // two delays, pic_struct 3: two clocks
+    payload.u(1, 1).u(2, 1).u(1, 0).u(5, 4).u(1, 1).u(1, 0).u(1, 0).u(8, 12);
+    payload.u(6, 30).u(6, 59).u(5, 23);  // full timestamp
+    payload.u(1, 0);
+    Bytes body = payload.bytes(false);
+    Bytes sei = {1, static_cast<uint8_t>(body.size())};
+    sei.insert(sei.end(), body.begin(), body.end());
+    sei.push_back(0x80);
+    EXPECT_EQ(decodeSei(nal(0x06, sei, false)), 0u);
+    EXPECT_TRUE(mExtractor->isPicTimingSeen());
+    EXPECT_EQ(mExtractor->getPicStruct(), 3);
+}
+
+TEST_F(H264SeiTest, InvalidPicStructIsRefused) {
+    SpsParams p;
+    p.picStructPresent = true;
+    decodeSps(p);
+    test::TraceCapture trace;
+    Bytes sei = {1, 1, 0x9F, 0x80};  // pic_struct 9
+    EXPECT_NE(decodeSei(nal(0x06, sei, false)), 0u);
+    EXPECT_FALSE(mExtractor->isPicTimingSeen());
+    EXPECT_EQ(trace.count("decodePicTimingSEI: Invalid picStruct value: 9"), 1u) << trace.all();
+    EXPECT_EQ(trace.count("decodeSEI: Error decoding SEI"), 1u);
+}
+
+TEST_F(H264SeiTest, LongOtherMessageIsSkippedModulo256Bits) {
+    SpsParams p;
+    p.picStructPresent = true;
+    decodeSps(p);
+    // A 40-byte user-data message whose bytes 8.. look like a picture-timing message
+    // (pic_struct 4): the skip of 320 bits wraps to 64, so that is what is read next.
+    Bytes payload(40, 0x55);
+    payload[8] = 1;
+    payload[9] = 1;
+    payload[10] = 0x40;  // pic_struct 4, clock flags 0 0
+    Bytes sei = {5, 40};
+    sei.insert(sei.end(), payload.begin(), payload.end());
+    sei.push_back(0x80);
+    decodeSei(nal(0x06, sei, false));
+    EXPECT_TRUE(mExtractor->isPicTimingSeen());
+    EXPECT_EQ(mExtractor->getPicStruct(), 4);
+}
+
+TEST_F(H264SeiTest, ShortOtherMessageIsSkippedWhole) {
+    SpsParams p;
+    p.picStructPresent = true;
+    decodeSps(p);
+    Bytes payload(31, 0x55);
+    payload[8] = 1;
+    payload[9] = 1;
+    payload[10] = 0x40;
+    Bytes sei = {5, 31};
+    sei.insert(sei.end(), payload.begin(), payload.end());
+    sei.insert(sei.end(), {1, 1, 0x20, 0x80});  // the real picture timing: pic_struct 2
+    decodeSei(nal(0x06, sei, false));
+    EXPECT_TRUE(mExtractor->isPicTimingSeen());
+    EXPECT_EQ(mExtractor->getPicStruct(), 2);
+}
+
+TEST_F(H264SeiTest, TruncatedSeiStaysInsideItsBytes) {
+    SpsParams p;
+    p.picStructPresent = true;
+    p.nalHrd = true;
+    decodeSps(p);
+    const Bytes sei = {0xFF, 0xFF, 0x02, 0xFF, 0x30, 0x01, 0x02, 0x03, 0x04, 0x05};
+    for (size_t size = 4; size <= sei.size(); ++size) {
+        std::unique_ptr<uint8_t[]> cut(new uint8_t[size]);
+        std::copy(sei.begin(), sei.begin() + static_cast<long>(size), cut.get());
+        mExtractor->decodeSEI(cut.get(), size, true);
+    }
+    EXPECT_FALSE(mExtractor->isPicTimingSeen());
+}
+
+struct RateCase {
+    const char* name;
+    uint32_t units;
+    uint32_t scale;
+    bool fixed;
+    bool picStructPresent;
+    unsigned picStruct;
+    bool field;
+    long long ticks;
+};
+
+class H264FrameRateTest : public H264SeiTest, public ::testing::WithParamInterface<RateCase> {};
+
+TEST_P(H264FrameRateTest, DurationInTicks) {
+    const RateCase& c = GetParam();
+    SpsParams p;
+    p.numUnitsInTick = c.units;
+    p.timeScale = c.scale;
+    p.fixedFrameRate = c.fixed;
+    p.picStructPresent = c.picStructPresent;
+    decodeSps(p);
+    if (c.picStructPresent) {
+        decodeSei(picTimingSei(c.picStruct));
+        ASSERT_TRUE(mExtractor->isPicTimingSeen());
+    }
+    ASSERT_EQ(mExtractor->calculateFrameRate(c.field), 0u);
+    EXPECT_EQ(mExtractor->getFrameDuration(), c.ticks);
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Table, H264FrameRateTest,
+    ::testing::Values(RateCase{"Frame2997PicStruct0", 1001, 60000, true, true, 0, false, 1501},
+                      RateCase{"Frame2997PicStruct3", 1001, 60000, true, true, 3, false, 3003},
+                      RateCase{"Frame2997PicStruct1", 1001, 60000, true, true, 1, true, 3003},
+                      RateCase{"NoPicStructFrame", 1001, 60000, true, false, 0, false, 1501},
+                      RateCase{"NoPicStructField", 1001, 60000, true, false, 0, true, 3003},
+                      RateCase{"NotFixedField", 1001, 60000, false, false, 0, true, 1501},
+                      RateCase{"Pal50", 1, 50, true, false, 0, false, 1800},
+                      RateCase{"Film24", 1001, 48000, true, false, 0, false, 1876}),
+    [](const auto& info) { return std::string(info.param.name); });
+
+TEST_F(H264SeiTest, NoTimingIsInvalid) {
+    test::TraceCapture trace;
+    EXPECT_NE(mExtractor->calculateFrameRate(false), 0u);
+    EXPECT_EQ(trace.count("calculateFrameRate: Invalid timing"), 1u);
+    EXPECT_EQ(mExtractor->getFrameDuration(), 3003);  // the initial value stands
+}
+
+// --- access units -----------------------------------------------------------------
+
+class H264AccessUnitTest : public H264Fixture {};
+
+TEST_F(H264AccessUnitTest, DelimiterSplitsRecordIntoTwoUnits) {
+    SpsParams p;
+    p.picStructPresent = true;
+    const Bytes first =
+        cat({aud(), nal(0x67, spsRbsp(p)), pps(), picTimingSei(0), slice(0x65, 0, true)});
+    const Bytes second = cat({aud(), slice(0x41, 0, true)});
+    const Bytes es = cat({first, second});
+    ASSERT_TRUE(test::writePesRecord(*mRing, es, 90000));
+    std::vector<uint8_t> out(1 << 16);
+    unsigned long length = 0;
+    long long pts = 0;
+    unsigned char flags = 0xFF;
+    ASSERT_EQ(mExtractor->getDecodableUnit(out.data(), out.size(), &length, &pts, &flags), 0u);
+    EXPECT_EQ(Bytes(out.begin(), out.begin() + length), first);  // the leading zero included
+    EXPECT_EQ(flags, H264MediaExtractor::kFlagIdr | H264MediaExtractor::kFlagSps);
+    EXPECT_EQ(pts, 90000);
+    EXPECT_EQ(mRing->tail(), 0u);  // the record is still in use
+    ASSERT_EQ(mExtractor->getDecodableUnit(out.data(), out.size(), &length, &pts, &flags), 0u);
+    EXPECT_EQ(Bytes(out.begin(), out.begin() + length), second);
+    EXPECT_EQ(flags, 0);
+    EXPECT_EQ(pts, 90000 + 1501);
+    EXPECT_EQ(mRing->tail(), RingBuffer::roundUp4(40 + 14 + es.size()));
+}
+
+TEST_F(H264AccessUnitTest, NothingIsOutputBeforeTheFirstSps) {
+    SpsParams p;
+    const Bytes withoutSps = cat({aud(), slice(0x41, 0)});
+    const Bytes withSps = cat({aud(), nal(0x67, spsRbsp(p)), slice(0x65, 0)});
+    const auto units = run({{withoutSps, 100}, {withoutSps, 200}, {withSps, 300}});
+    ASSERT_EQ(units.size(), 1u);
+    EXPECT_EQ(units[0].bytes, withSps);
+    EXPECT_EQ(units[0].pts, 300);
+}
+
+TEST_F(H264AccessUnitTest, SpsWithoutVuiDelimitsOnlyByRecord) {
+    test::TraceCapture trace;
+    SpsParams p;
+    p.vui = false;
+    const Bytes first = cat({aud(), nal(0x67, spsRbsp(p)), slice(0x65, 0), aud(), slice(0x41, 0)});
+    const Bytes next = cat({slice(0x41, 0), aud(), slice(0x41, 0)});
+    const auto units = run({{first, 1000}, {next, 4000}});
+    ASSERT_EQ(units.size(), 2u);
+    EXPECT_EQ(units[0].bytes, first);  // the whole record: slices never delimit
+    EXPECT_EQ(units[0].pts, 1000);
+    EXPECT_EQ(units[0].flags, H264MediaExtractor::kFlagIdr);  // the SPS failed: no flag 16
+    // From the first AUD to the payload end, with the record's own PTS.
+    EXPECT_EQ(units[1].bytes,
+              Bytes(next.begin() + static_cast<long>(slice(0x41, 0).size()), next.end()));
+    EXPECT_EQ(units[1].pts, 4000);
+    EXPECT_EQ(trace.count("decodeSPS: VUI is not present"), 1u);
+    EXPECT_EQ(trace.count("getNextAccessUnit: Error decoding SPS"), 1u);
+    EXPECT_FALSE(mExtractor->isFrameDurationKnown());
+}
+
+TEST_F(H264AccessUnitTest, PicStructStreamWaitsForPictureTiming) {
+    SpsParams p;
+    p.picStructPresent = true;
+    // No picture-timing SEI yet: slices are ignored, so the second AUD does not end the AU.
+    const Bytes first = cat({aud(), nal(0x67, spsRbsp(p)), slice(0x65, 0), aud(), slice(0x41, 0)});
+    const Bytes next = cat({aud(), picTimingSei(0), slice(0x41, 0), aud(), slice(0x41, 0)});
+    const auto units = run({{first, 0}, {next, 9000}});
+    ASSERT_EQ(units.size(), 3u);
+    EXPECT_EQ(units[0].bytes, first);
+    EXPECT_EQ(units[1].pts, 9000);
+    EXPECT_EQ(units[2].pts, 9000 + 1501);
+}
+
+TEST_F(H264AccessUnitTest, InterlacedStreamOfFramePicturesIsStampedEvery1501Ticks) {
+    // 29.97 Hz, num_units_in_tick 1001, time_scale 60000, fixed rate, pic_struct 0:
+    // 1001 x 90000 / 60000 = 1501 ticks per unit (a tick is one field period).
+    SpsParams p;
+    p.frameMbsOnly = false;
+    p.heightMapUnits = 34;
+    p.cropBottom = 2;
+    p.picStructPresent = true;
+    const Bytes unit1 = cat({aud(), nal(0x67, spsRbsp(p)), pps(), picTimingSei(0),
+                             slice(0x65, 0, true, 0), slice(0x65, 30, false, 0)});
+    const Bytes unit2 = cat({aud(), picTimingSei(0), slice(0x41, 0, true, 0)});
+    const Bytes unit3 = cat({aud(), picTimingSei(0), slice(0x41, 0, true, 0)});
+    const auto units = run({{cat({unit1, unit2, unit3}), 5000}});
+    ASSERT_EQ(units.size(), 3u);
+    EXPECT_EQ(units[0].bytes, unit1);
+    EXPECT_EQ(units[1].bytes, unit2);
+    EXPECT_EQ(units[2].bytes, unit3);
+    EXPECT_EQ(units[0].pts, 5000);
+    EXPECT_EQ(units[1].pts, 5000 + 1501);
+    EXPECT_EQ(units[2].pts, 5000 + 2 * 1501);
+    EXPECT_EQ(mExtractor->getCroppedHeight(), 1080u);
+}
+
+TEST_F(H264AccessUnitTest, FieldPairsInOneRecordAreCutAtEveryFirstMbZero) {
+    // Field pictures (field_pic_flag 1) each start with first_mb_in_slice 0, so the
+    // second field ends the unit that the AUD opened; what follows it up to the next
+    // delimiter is cut by the same rule. Field pictures without pic_struct count two
+    // ticks each: 3003.
+    SpsParams p;
+    p.frameMbsOnly = false;
+    p.heightMapUnits = 34;
+    const Bytes head = cat({aud(), nal(0x67, spsRbsp(p)), pps(), slice(0x65, 0, true, 1)});
+    const Bytes field2 = slice(0x41, 0, true, 1);
+    const Bytes aud2 = aud();
+    const Bytes field3 = slice(0x41, 0, true, 1);
+    const Bytes field4 = slice(0x41, 0, true, 1);
+    const auto units = run({{cat({head, field2, aud2, field3, field4}), 0}});
+    ASSERT_EQ(units.size(), 3u);
+    EXPECT_EQ(units[0].bytes, head);
+    EXPECT_EQ(units[1].bytes, aud2);    // field 2 only marks the first slice of its call
+    EXPECT_EQ(units[2].bytes, field4);  // field 3 likewise
+    EXPECT_EQ(units[1].pts, 3003);
+    EXPECT_EQ(mExtractor->getFrameDuration(), 3003);
+}
+
+TEST_F(H264AccessUnitTest, WorkaroundAfterThirtyOneRecordsWithoutStart) {
+    test::TraceCapture trace;
+    SpsParams p;
+    std::vector<PesChunk> chunks;
+    chunks.push_back({cat({nal(0x67, spsRbsp(p)), pps(), slice(0x65, 0)}), 0});
+    for (int i = 1; i <= 40; ++i) {
+        chunks.push_back({slice(0x41, 0, true), static_cast<uint64_t>(i) * 3000});
+    }
+    const auto units = run(chunks);
+    EXPECT_TRUE(mExtractor->isWorkaroundActive());
+    EXPECT_EQ(trace.count("getNextAccessUnit: apply workaround"), 1u) << trace.all();
+    // The first record, then nothing for records 1..31, then one unit per record.
+    ASSERT_EQ(units.size(), 1u + 9u);
+    EXPECT_EQ(units[0].pts, 0);
+    for (size_t i = 1; i < units.size(); ++i) {
+        EXPECT_EQ(units[i].pts, static_cast<long long>((31 + i) * 3000));
+        EXPECT_EQ(units[i].bytes, slice(0x41, 0, true));
+    }
+}
+
+TEST_F(H264AccessUnitTest, WorkaroundDelimitsEverySliceStartingAPicture) {
+    SpsParams p;
+    std::vector<PesChunk> chunks;
+    chunks.push_back({cat({nal(0x67, spsRbsp(p)), pps(), slice(0x65, 0)}), 0});
+    for (int i = 1; i <= 31; ++i) {
+        chunks.push_back({slice(0x41, 0, true), 0});
+    }
+    // Two pictures in one record, the second in two slices.
+    chunks.push_back({cat({slice(0x41, 0, true), slice(0x41, 0, true), slice(0x41, 60)}), 70000});
+    const auto units = run(chunks);
+    ASSERT_EQ(units.size(), 3u);
+    EXPECT_EQ(units[1].bytes, slice(0x41, 0, true));
+    EXPECT_EQ(units[1].pts, 70000);
+    EXPECT_EQ(units[2].bytes, cat({slice(0x41, 0, true), slice(0x41, 60)}));
+    EXPECT_EQ(units[2].pts, 70000 + 1501);
+}
+
+TEST_F(H264AccessUnitTest, UnitLargerThanOutputIsDroppedSilently) {
+    SpsParams p;
+    const Bytes big = cat({aud(), nal(0x67, spsRbsp(p)), slice(0x65, 0, true, -1, 400)});
+    const Bytes small = cat({aud(), slice(0x41, 0, true)});
+    test::TraceCapture trace;
+    const auto units = run({{cat({big, small}), 100}}, 300);
+    ASSERT_EQ(units.size(), 1u);
+    EXPECT_EQ(units[0].bytes, small);
+    EXPECT_EQ(units[0].pts, 100);  // a dropped unit does not advance the time
+    EXPECT_EQ(trace.lines().size(), 0u) << trace.all();
+}
+
+TEST_F(H264AccessUnitTest, ResetGivesTheRecordBackAndDecodesTheSpsAgain) {
+    SpsParams p;
+    const Bytes first = cat({aud(), nal(0x67, spsRbsp(p)), slice(0x65, 0)});
+    const Bytes es = cat({first, aud(), slice(0x41, 0)});
+    ASSERT_TRUE(test::writePesRecord(*mRing, es, 700));
+    std::vector<uint8_t> out(1 << 16);
+    unsigned long length = 0;
+    long long pts = 0;
+    unsigned char flags = 0;
+    ASSERT_EQ(mExtractor->getDecodableUnit(out.data(), out.size(), &length, &pts, &flags), 0u);
+    EXPECT_EQ(flags, H264MediaExtractor::kFlagIdr | H264MediaExtractor::kFlagSps);
+    mExtractor->reset();
+    EXPECT_FALSE(mExtractor->isFrameDurationKnown());
+    ASSERT_EQ(mExtractor->getDecodableUnit(out.data(), out.size(), &length, &pts, &flags), 0u);
+    EXPECT_EQ(Bytes(out.begin(), out.begin() + length), first);  // from the record's start
+    EXPECT_EQ(flags, H264MediaExtractor::kFlagIdr | H264MediaExtractor::kFlagSps);
+    EXPECT_EQ(pts, 700);
+}
+
+TEST_F(H264AccessUnitTest, ScanStepsOverLeadingOneAndFindsEveryUnit) {
+    Bytes payload = cat({Bytes{0x01, 0x01}, aud(), nal(0x06, {0x05, 0x00}, false), slice(0x41, 3)});
+    mExtractor->setPayloadForTest(payload.data(), payload.size());
+    std::vector<std::pair<int, unsigned>> found;
+    H264MediaExtractor::NALUnitType type;
+    unsigned int length = 0;
+    while (mExtractor->getNextNalUnit(&type, &length) == 0) {
+        found.emplace_back(type, length);
+        EXPECT_LE(mExtractor->getPosition() + length, payload.size());
+        mExtractor->setPayloadForTest(payload.data(), payload.size());
+        unsigned start = 0;
+        // jump past the unit just found
+        ASSERT_EQ(mExtractor->findNextNalHeader(0, &start), 0u);
+        break;
+    }
+    ASSERT_EQ(found.size(), 1u);
+    EXPECT_EQ(found[0].first, 9);
+    EXPECT_EQ(found[0].second, 5u);  // 00 00 01 09 F0; the next 4-byte code's zero stays here
+    EXPECT_EQ(mExtractor->getNextNALUWithType(H264MediaExtractor::NAL_SLICE, &length), 0u);
+    EXPECT_EQ(length, slice(0x41, 3).size());
+}
+
+TEST_F(H264AccessUnitTest, StatedEsSizeBeyondTheRecordIsBoundedByTheRecord) {
+    SpsParams p;
+    const Bytes first = cat({aud(), nal(0x67, spsRbsp(p)), slice(0x65, 0)});
+    ASSERT_TRUE(test::writeRawRecord(*mRing, 40 + first.size(), 40, 1 << 20, 1234, first));
+    const Bytes second = cat({aud(), slice(0x41, 0)});
+    const auto units = run({{second, 5678}});
+    ASSERT_EQ(units.size(), 2u);
+    EXPECT_EQ(units[0].bytes, first);
+    EXPECT_EQ(units[1].bytes, second);
+    EXPECT_EQ(units[1].pts, 5678);
+}
+
+// --- real encoder output against libavcodec's H.264 parser --------------------------
+
+struct ReferenceUnit {
+    Bytes bytes;
+    bool key = false;
+};
+
+std::vector<ReferenceUnit> ffmpegAccessUnits(const Bytes& es) {
+    std::vector<ReferenceUnit> units;
+    AVCodecParserContext* parser = av_parser_init(AV_CODEC_ID_H264);
+    AVCodecContext* context = avcodec_alloc_context3(nullptr);
+    const uint8_t* data = es.data();
+    int left = static_cast<int>(es.size());
+    while (true) {
+        uint8_t* out = nullptr;
+        int outSize = 0;
+        const int used = av_parser_parse2(parser, context, &out, &outSize, data, left,
+                                          AV_NOPTS_VALUE, AV_NOPTS_VALUE, 0);
+        if (outSize > 0) {
+            units.push_back({Bytes(out, out + outSize), parser->key_frame == 1});
+        }
+        if (left == 0 && outSize == 0) {
+            break;
+        }
+        data += used;
+        left -= used;
+    }
+    avcodec_free_context(&context);
+    av_parser_close(parser);
+    return units;
+}
+
+Bytes encode(const std::string& x264Params, const std::string& extra, int frames) {
+    const std::string path = std::string(TAVO_BINARY_DIR) + "/h264test_" +
+                             std::to_string(std::hash<std::string>()(x264Params + extra)) + ".h264";
+    const std::string command =
+        "ffmpeg -v error -y -f lavfi -i testsrc=size=352x288:rate=30000/1001 -frames:v " +
+        std::to_string(frames) + " -c:v libx264 -preset ultrafast -x264-params " + x264Params +
+        " " + extra + " -f h264 '" + path + "'";
+    if (!test::runCommand(command)) {
+        return {};
+    }
+    Bytes es = test::readFile(path);
+    std::filesystem::remove(path);
+    return es;
+}
+
+struct StreamCase {
+    const char* name;
+    const char* x264Params;
+    const char* extra;
+    long long ticks;  // the frame duration the extractor is expected to find
+};
+
+class H264RealStreamTest : public H264Fixture, public ::testing::WithParamInterface<StreamCase> {};
+
+TEST_P(H264RealStreamTest, SameAccessUnitsAsFfmpegParser) {
+    const StreamCase& c = GetParam();
+    const Bytes es = encode(c.x264Params, c.extra, 45);
+    if (es.empty()) {
+        GTEST_SKIP() << "ffmpeg with libx264 not available";
+    }
+    const auto reference = ffmpegAccessUnits(es);
+    ASSERT_EQ(reference.size(), 45u);
+
+    // One access unit per PES.
+    std::vector<PesChunk> perUnit;
+    for (size_t i = 0; i < reference.size(); ++i) {
+        perUnit.push_back({reference[i].bytes, 10000 + i * 3003});
+    }
+    auto units = run(perUnit);
+    ASSERT_EQ(units.size(), reference.size());
+    for (size_t i = 0; i < units.size(); ++i) {
+        ASSERT_EQ(units[i].bytes, reference[i].bytes) << "unit " << i;
+        EXPECT_EQ(units[i].pts, static_cast<long long>(10000 + i * 3003));
+        EXPECT_EQ((units[i].flags & H264MediaExtractor::kFlagIdr) != 0, reference[i].key)
+            << "unit " << i;
+        EXPECT_EQ((units[i].flags & H264MediaExtractor::kFlagSps) != 0, i == 0) << "unit " << i;
+    }
+    EXPECT_EQ(mExtractor->getCroppedWidth(), 352u);
+    EXPECT_EQ(mExtractor->getCroppedHeight(), 288u);
+    EXPECT_EQ(mExtractor->getFrameDuration(), c.ticks);
+
+    // Several access units per PES: the same units, stamped from each PES's PTS on.
+    for (size_t group : {size_t{3}, size_t{7}}) {
+        SetUp();
+        std::vector<PesChunk> grouped;
+        for (size_t i = 0; i < reference.size(); ++i) {
+            if (i % group == 0) {
+                grouped.push_back({{}, 500 + i * 3003});
+            }
+            grouped.back().es.insert(grouped.back().es.end(), reference[i].bytes.begin(),
+                                     reference[i].bytes.end());
+        }
+        units = run(grouped);
+        ASSERT_EQ(units.size(), reference.size()) << "group " << group;
+        for (size_t i = 0; i < units.size(); ++i) {
+            ASSERT_EQ(units[i].bytes, reference[i].bytes) << "group " << group << " unit " << i;
+            // The first unit of a PES carries its PTS, the others the duration after it.
+            const long long expected =
+                static_cast<long long>(500 + (i - i % group) * 3003 + (i % group) * c.ticks);
+            EXPECT_EQ(units[i].pts, expected) << "group " << group << " unit " << i;
+        }
+    }
+
+    // Odd cuts: a unit cannot run past its record, so every unit delivered is the
+    // start of one of FFmpeg's units, cut at most at the record's end.
+    SetUp();
+    const size_t cut = 2113;
+    units = run(test::fixedCuts(es, cut, 0, 3003));
+    std::map<size_t, size_t> unitAt;  // ES offset -> reference index
+    size_t offset = 0;
+    for (size_t i = 0; i < reference.size(); ++i) {
+        unitAt[offset] = i;
+        offset += reference[i].bytes.size();
+    }
+    ASSERT_FALSE(units.empty());
+    size_t searchFrom = 0;
+    for (const auto& unit : units) {
+        // Find where this unit lies in the ES, after the previous one.
+        auto it = std::search(es.begin() + static_cast<long>(searchFrom), es.end(),
+                              unit.bytes.begin(), unit.bytes.end());
+        ASSERT_NE(it, es.end());
+        const size_t at = static_cast<size_t>(it - es.begin());
+        const size_t recordEnd = (at / cut + 1) * cut;
+        ASSERT_LE(at + unit.bytes.size(), std::min(recordEnd, es.size()));
+        // It starts at a reference unit's start, or one byte into its 4-byte start code.
+        const bool aligned = unitAt.count(at) != 0 || unitAt.count(at - 1) != 0;
+        EXPECT_TRUE(aligned) << "unit at " << at;
+        searchFrom = at + unit.bytes.size();
+    }
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    X264, H264RealStreamTest,
+    ::testing::Values(
+        // Interlaced, fixed rate, picture timing with pic_struct 3/4 (two fields): two
+        // ticks of 1001/60000 s.
+        StreamCase{"InterlacedPicStructFixed",
+                   "interlaced=1:pic-struct=1:aud=1:keyint=15:force-cfr=1", "-flags +ildct+ilme",
+                   3003},
+        // Without fixed_frame_rate_flag every unit counts one tick: 1501.
+        StreamCase{"InterlacedPicStructVariable", "interlaced=1:pic-struct=1:aud=1:keyint=15",
+                   "-flags +ildct+ilme", 1501},
+        StreamCase{"ProgressiveFixed", "aud=1:keyint=20:force-cfr=1", "", 1501},
+        StreamCase{"ProgressiveBFrames", "aud=1:keyint=12:bframes=2:force-cfr=1", "", 1501}),
+    [](const auto& info) { return std::string(info.param.name); });
+
+}  // namespace
+}  // namespace TavoPlayer

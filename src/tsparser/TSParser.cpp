@@ -331,7 +331,13 @@ bool TSParser::threadLoop() {
             return leaveForExit(true);
         const uint8_t* packet = base + static_cast<size_t>(kPacketSize) * i;
         ts->mTransportScramblingControl = 0;
-        const uint32_t r = mTSPacketParser->parse(packet, ts);
+        uint32_t r = mTSPacketParser->parse(packet, ts);
+        // A header code is OR-ed into the result, and 255 (adaptation field too long)
+        // would read as every result bit at once, skip included: the PES in assembly
+        // would survive and the next unit's bytes be appended to it. Any header code
+        // means only "error".
+        if (r > 0x0F)
+            r = TSPacketParser::RESULT_ERROR;
 
         if (mKind == KIND_VIDEO && ts->mTransportScramblingControl != 0) {
             if (mScrambledCount >= kScrambledPacketLimit) {

@@ -176,6 +176,28 @@ TEST_F(TSParserModuleTest, ContinuityErrorDropsThePes) {
         << trace.all();
 }
 
+TEST_F(TSParserModuleTest, OverlongAdaptationFieldDropsThePes) {
+    startParser(TSParser::KIND_VIDEO);
+    auto broken = pes(PesBuilder(0xE0).pts(1000).payload(ramp(900)).build());
+    ASSERT_EQ(broken.size(), 5u);
+    broken[2] = TsPacketBuilder()
+                    .pid(kPid)
+                    .continuity(2)
+                    .adaptationControl(3)
+                    .rawAfterHeader({200})
+                    .build();
+    const auto kept = PesBuilder(0xE0).pts(2000).payload(ramp(500)).build();
+    feed(broken);
+    feed(pes(kept));
+    feed(pes(PesBuilder(0xE0).pts(3000).payload(ramp(10)).build()));
+    const auto records = drainRecords(*output);
+    ASSERT_EQ(records.size(), 1u);
+    EXPECT_EQ(records[0].pes, kept) << "no bytes of the broken PES may precede it";
+    EXPECT_TRUE(trace.contains("parseHeader: Invalid adaptation field length: 200")) << trace.all();
+    EXPECT_EQ(trace.count("threadLoop - TS parser error; discarding entire PES packet."), 1u)
+        << trace.all();
+}
+
 TEST_F(TSParserModuleTest, PesWithoutStartCodeIsDropped) {
     startParser(TSParser::KIND_AUDIO);
     std::vector<uint8_t> garbage = ramp(400, 1);  // no 00 00 01

@@ -1,0 +1,56 @@
+// Runs a libFuzzer target without libFuzzer: every file named on the command line,
+// or found directly inside a directory named there, is passed once to
+// LLVMFuzzerTestOneInput. Lets any compiler's build replay the seed corpus (and
+// crash reproducers) as a plain test. Fails when it found nothing to run.
+#include <algorithm>
+#include <cstdint>
+#include <cstdio>
+#include <filesystem>
+#include <fstream>
+#include <iterator>
+#include <vector>
+
+extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size);
+extern "C" __attribute__((weak)) int LLVMFuzzerInitialize(int* argc, char*** argv);
+
+namespace {
+
+void runFile(const std::filesystem::path& path) {
+    std::ifstream in(path, std::ios::binary);
+    const std::vector<char> bytes((std::istreambuf_iterator<char>(in)),
+                                  std::istreambuf_iterator<char>());
+    // An exact-size heap copy, so that a sanitizer build sees any read past the end.
+    std::vector<uint8_t> input(bytes.begin(), bytes.end());
+    LLVMFuzzerTestOneInput(input.empty() ? nullptr : input.data(), input.size());
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+    if (LLVMFuzzerInitialize != nullptr)
+        LLVMFuzzerInitialize(&argc, &argv);
+    size_t runs = 0;
+    for (int i = 1; i < argc; ++i) {
+        const std::filesystem::path path(argv[i]);
+        if (std::filesystem::is_directory(path)) {
+            std::vector<std::filesystem::path> files;
+            for (const auto& entry : std::filesystem::directory_iterator(path)) {
+                if (entry.is_regular_file())
+                    files.push_back(entry.path());
+            }
+            std::sort(files.begin(), files.end());
+            for (const auto& file : files) {
+                runFile(file);
+                ++runs;
+            }
+        } else if (std::filesystem::is_regular_file(path)) {
+            runFile(path);
+            ++runs;
+        } else {
+            fprintf(stderr, "replay: no such file or directory: %s\n", argv[i]);
+            return 1;
+        }
+    }
+    printf("replay: %zu inputs\n", runs);
+    return runs == 0 ? 1 : 0;
+}

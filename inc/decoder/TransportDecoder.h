@@ -16,9 +16,15 @@
 //    raw data blocks of a frame form one access unit (with CRC and several blocks
 //    the frame is unsupported).
 //
-// A frame is only returned once all its bytes are buffered; a frame that starts after
-// a loss of sync must be followed by another sync word when the following bytes are
-// already buffered (a cheap guard against sync words inside audio data).
+// A frame is only returned once all its bytes and the first two bytes after it (where
+// the next sync word starts) are buffered; until then the result is "not enough bits".
+// Holding the last frame of a fill back until the next header shows has two reasons:
+// a frame found after a loss of sync is only trusted when another sync word follows
+// it (sync words also occur inside audio data), and "not enough bits" then always
+// means that an access unit is pending into the next fill, which is what the AAC
+// extractor's PTS carry relies on (a PES packet's PTS belongs to the first access unit
+// that starts in it, ISO/IEC 13818-1, 2.4.3.7). The cost is one frame of latency, and
+// the very last frame of a stream stays buffered.
 //
 // Threads: one decoder is used by one thread. Not copyable.
 #pragma once

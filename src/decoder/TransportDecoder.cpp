@@ -15,6 +15,8 @@ constexpr uint32_t kAdtsHeaderBytes = 7;
 constexpr uint32_t kAdtsCrcBytes = 2;
 constexpr uint8_t kLoasFirstByte = 0x56;  // 0x2B7 << 5, top byte
 constexpr uint8_t kAdtsFirstByte = 0xFF;
+// Both sync words fit in the first two bytes of a header.
+constexpr uint32_t kNextSyncBytes = 2;
 
 }  // namespace
 
@@ -275,10 +277,10 @@ TRANSPORTDEC_ERROR TransportDecoder::readLoasFrame() {
     // ISO/IEC 14496-3, 1.7.2, Table 1.40 (AudioSyncStream).
     const uint32_t muxLength = ((mBuffer[mReadPos + 1] & 0x1Fu) << 8) | mBuffer[mReadPos + 2];
     const uint32_t frameBytes = kLoasHeaderBytes + muxLength;
-    if (available < frameBytes) {
+    if (available < frameBytes + kNextSyncBytes) {
         return TRANSPORTDEC_NOT_ENOUGH_BITS;
     }
-    if (!mSynced && available >= frameBytes + 2 && !syncAt(mReadPos + frameBytes)) {
+    if (!mSynced && !syncAt(mReadPos + frameBytes)) {
         return loseSync(mReadPos + 1);
     }
     const uint32_t frameStart = mReadPos;
@@ -351,10 +353,10 @@ TRANSPORTDEC_ERROR TransportDecoder::readAdtsFrame() {
         frameLength < headerBytes) {
         return loseSync(mReadPos + 1);  // reserved values: not a header after all
     }
-    if (available < frameLength) {
+    if (available < frameLength + kNextSyncBytes) {
         return TRANSPORTDEC_NOT_ENOUGH_BITS;
     }
-    if (!mSynced && available >= frameLength + 2 && !syncAt(mReadPos + frameLength)) {
+    if (!mSynced && !syncAt(mReadPos + frameLength)) {
         return loseSync(mReadPos + 1);
     }
     const uint32_t frameEnd = mReadPos + frameLength;

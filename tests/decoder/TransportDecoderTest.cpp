@@ -29,12 +29,17 @@ struct Outcome {
 // nothing is left, recording every result and unit.
 class Harness {
 public:
-    explicit Harness(TRANSPORT_TYPE type) : mHandle(transportDec_Open(type, 0, 1)) {
+    explicit Harness(TRANSPORT_TYPE type) : mType(type), mHandle(transportDec_Open(type, 0, 1)) {
         transportDec_RegisterAscCallback(mHandle, &Harness::onConfig, this);
     }
     ~Harness() { transportDec_Close(&mHandle); }
 
-    std::vector<Outcome> run(const std::vector<uint8_t>& stream, size_t chunk = 0) {
+    // The decoder holds a frame back until the next sync word shows, so `frames` is
+    // followed by the first two bytes of another header.
+    std::vector<Outcome> run(const std::vector<uint8_t>& frames, size_t chunk = 0) {
+        std::vector<uint8_t> stream = frames;
+        stream.push_back(mType == TT_MP4_LOAS ? 0x56 : 0xFF);
+        stream.push_back(mType == TT_MP4_LOAS ? 0xE0 : 0xF1);
         std::vector<Outcome> out;
         size_t offset = 0;
         if (chunk == 0) {
@@ -88,6 +93,7 @@ private:
         static_cast<Harness*>(self)->configs.push_back(*config);
         return 0;
     }
+    TRANSPORT_TYPE mType;
     HANDLE_TRANSPORTDEC mHandle;
 };
 
@@ -283,7 +289,7 @@ TEST_P(TransportDecoderHeaderTest, TruncationAtEveryByteThenRestGivesSameUnits) 
             expectedUnits.push_back(o.unit);
         }
     }
-    for (size_t cut = 1; cut < stream.size(); ++cut) {
+    for (size_t cut = 1; cut < stream.size() + 2; ++cut) {
         Harness harness(c.type);
         std::vector<std::vector<uint8_t>> units;
         for (const auto& o : harness.run(stream, cut)) {
@@ -377,6 +383,54 @@ TEST_F(TransportDecoderConfigTest, ReportedAgainOnlyWhenItChanges) {
     ASSERT_EQ(2u, harness.configs.size());
     EXPECT_EQ(2u, harness.configs[0].m_channelConfiguration);
     EXPECT_EQ(1u, harness.configs[1].m_channelConfiguration);
+}
+
+class TransportDecoderHoldBackTest : public ::testing::Test {};
+
+TEST_F(TransportDecoderHoldBackTest, FrameWaitsUntilTheNextSyncWordShows) {
+    for (TRANSPORT_TYPE type : {TT_MP4_LOAS, TT_MP4_ADTS}) {
+        const auto frame = type == TT_MP4_LOAS ? loasFrame({}, {kA}) : adtsFrame({}, kA);
+        HANDLE_TRANSPORTDEC h = transportDec_Open(type, 0, 1);
+        uint32_t valid = static_cast<uint32_t>(frame.size());
+        transportDec_FillData(h, frame.data(), valid, &valid, 0);
+        EXPECT_EQ(TRANSPORTDEC_NOT_ENOUGH_BITS, transportDec_ReadAccessUnit(h, 0));
+        // One byte of the next header is not enough to tell a sync word.
+        valid = 1;
+        transportDec_FillData(h, frame.data(), 1, &valid, 0);
+        EXPECT_EQ(TRANSPORTDEC_NOT_ENOUGH_BITS, transportDec_ReadAccessUnit(h, 0));
+        valid = static_cast<uint32_t>(frame.size()) - 1;
+        transportDec_FillData(h, frame.data(), static_cast<uint32_t>(frame.size()), &valid, 0);
+        EXPECT_EQ(TRANSPORTDEC_OK, transportDec_ReadAccessUnit(h, 0));
+        EXPECT_EQ(kA.size() * 8, transportDec_GetAuBitsTotal(h, 0));
+        transportDec_Close(&h);
+    }
+}
+
+// A frame found after a loss of sync must be followed by a sync word; once in sync,
+// a frame followed by junk is still delivered and the junk skipped afterwards.
+TEST_F(TransportDecoderHoldBackTest, NextSyncWordConfirmsOnlyAfterALossOfSync) {
+    const auto a = adtsFrame({}, kA);
+    const auto c = adtsFrame({}, kC);
+    Harness harness(TT_MP4_ADTS);
+    const auto got = harness.run(concat({a, {0x00, 0x00}, c, c}));
+    std::vector<uint32_t> errors;
+    for (const auto& o : got) {
+        errors.push_back(o.error);
+    }
+    // First frame: followed by junk while not yet in sync, so it is not trusted and
+    // everything up to the next sync word is skipped.
+    EXPECT_EQ((std::vector<uint32_t>{TRANSPORTDEC_SYNC_ERROR, TRANSPORTDEC_OK, TRANSPORTDEC_OK}),
+              errors);
+    EXPECT_EQ(kC, got.back().unit);
+    Harness synced(TT_MP4_ADTS);
+    const auto got2 = synced.run(concat({a, a, {0x00, 0x00}, c}));
+    errors.clear();
+    for (const auto& o : got2) {
+        errors.push_back(o.error);
+    }
+    EXPECT_EQ((std::vector<uint32_t>{TRANSPORTDEC_OK, TRANSPORTDEC_OK, TRANSPORTDEC_SYNC_ERROR,
+                                     TRANSPORTDEC_OK}),
+              errors);
 }
 
 class TransportDecoderApiTest : public ::testing::Test {};

@@ -1,0 +1,474 @@
+// The AAC extractor over PES records in a ring: configuration first and again after
+// reset, the switch between LOAS and ADTS, PTS of units that straddle records,
+// re-segmentation, golden dumps and records that lie about their sizes.
+#include "decoder/AACMediaExtractor.h"
+
+#include <gtest/gtest.h>
+
+#include <fstream>
+#include <sstream>
+#include <string>
+#include <vector>
+
+#include "AACTestUtil.h"
+#include "PesRecordTestUtil.h"
+#include "support/TraceCapture.h"
+
+namespace TavoPlayer {
+namespace {
+
+using test::adtsFrame;
+using test::AdtsOptions;
+using test::drain;
+using test::loasFrame;
+using test::LoasOptions;
+using test::patternPayload;
+using test::Unit;
+
+constexpr uint64_t kTicksPerFrame48k = 1920;  // 1024 samples at 48 kHz in 90 kHz ticks
+const std::vector<uint8_t> kLcStereo48kAsc = {0x11, 0x90, 0, 0, 0, 0, 0, 0, 0, 0};
+
+enum class Framing { Loas, Adts };
+
+// Frames of a synthetic stream and the access units they carry.
+struct Stream {
+    std::vector<std::vector<uint8_t>> frames;
+    std::vector<std::vector<uint8_t>> units;
+};
+
+// LOAS frames carry a StreamMuxConfig every `configEvery` frames, as broadcasters
+// repeat it.
+Stream makeStream(Framing framing, size_t count, uint32_t seed = 7, size_t configEvery = 4) {
+    Stream s;
+    for (size_t i = 0; i < count; ++i) {
+        auto unit = patternPayload(60 + (i * 37) % 250, seed + static_cast<uint32_t>(i));
+        LoasOptions loas;
+        loas.useSameStreamMux = (i % configEvery) != 0;
+        s.frames.push_back(framing == Framing::Loas ? loasFrame(loas, {unit})
+                                                    : adtsFrame(AdtsOptions{}, unit));
+        s.units.push_back(std::move(unit));
+    }
+    return s;
+}
+
+AACMediaExtractor::transportLayer_t layerOf(Framing f) {
+    return f == Framing::Loas ? AACMediaExtractor::TRANSPORT_LAYER_LOAS
+                              : AACMediaExtractor::TRANSPORT_LAYER_ADTS;
+}
+
+class AACExtractorTest : public ::testing::Test {
+protected:
+    void SetUp() override { mRing = test::makeRing(20); }
+
+    void writeRecords(const std::vector<std::vector<uint8_t>>& records, uint64_t firstPts,
+                      uint64_t step) {
+        for (size_t i = 0; i < records.size(); ++i) {
+            ASSERT_TRUE(test::writePesRecord(*mRing, records[i], firstPts + i * step, 0xC0));
+        }
+    }
+
+    android::sp<RingBuffer> mRing;
+    test::TraceCapture mTrace;
+};
+
+// ---- configuration first ----------------------------------------------------------
+
+class AACConfigFirstTest : public AACExtractorTest,
+                           public ::testing::WithParamInterface<Framing> {};
+
+TEST_P(AACConfigFirstTest, ConfigurationReplacesTheFirstUnitThenAudioFollows) {
+    const Stream s = makeStream(GetParam(), 8);
+    writeRecords(s.frames, 9000, kTicksPerFrame48k);
+    android::sp<AACMediaExtractor> extractor = new AACMediaExtractor(mRing, layerOf(GetParam()));
+    const auto units = drain(*extractor);
+
+    // The last frame waits for the header of a next one.
+    ASSERT_EQ(s.units.size() - 1, units.size());
+    EXPECT_EQ(AACMediaExtractor::FLAG_CODEC_CONFIG, units[0].flags);
+    EXPECT_EQ(kLcStereo48kAsc, units[0].bytes);
+    for (size_t i = 1; i < units.size(); ++i) {
+        EXPECT_EQ(0, units[i].flags) << i;
+        EXPECT_EQ(s.units[i], units[i].bytes) << i;
+    }
+    // The unit after the configuration is the second of the first record's stream.
+    EXPECT_EQ(9000 + static_cast<long long>(kTicksPerFrame48k), units[1].pts);
+    EXPECT_EQ(1u, mTrace.count("getDecodableUnit: found aac codec config"));
+    EXPECT_EQ(0u, mRing->usedSpace()) << "every record consumed";
+}
+
+TEST_P(AACConfigFirstTest, ResetSendsTheConfigurationAgainBeforeAudio) {
+    const Stream s = makeStream(GetParam(), 10);
+    writeRecords(s.frames, 0, kTicksPerFrame48k);
+    android::sp<AACMediaExtractor> extractor = new AACMediaExtractor(mRing, layerOf(GetParam()));
+    std::vector<uint8_t> out(4096);
+    std::vector<Unit> before;
+    while (before.size() < 4) {
+        unsigned long length = 0;
+        long long pts = 0;
+        unsigned char flags = 0;
+        ASSERT_NE(1u, extractor->getDecodableUnit(out.data(), out.size(), &length, &pts, &flags));
+        if (length > 0) {
+            before.push_back({std::vector<uint8_t>(out.begin(), out.begin() + length), pts, flags});
+        }
+    }
+    extractor->reset();
+    EXPECT_FALSE(extractor->configSent());
+    const auto after = drain(*extractor);
+    ASSERT_FALSE(after.empty());
+    EXPECT_EQ(AACMediaExtractor::FLAG_CODEC_CONFIG, after[0].flags);
+    EXPECT_EQ(kLcStereo48kAsc, after[0].bytes);
+    // The unit read with the new configuration request is replaced again; then audio.
+    ASSERT_EQ(s.units.size() - before.size() - 1, after.size());
+    for (size_t i = 1; i < after.size(); ++i) {
+        EXPECT_EQ(s.units[before.size() + i], after[i].bytes) << i;
+        EXPECT_EQ(0, after[i].flags);
+    }
+    EXPECT_EQ(0u, mRing->usedSpace());
+}
+
+INSTANTIATE_TEST_SUITE_P(Framings, AACConfigFirstTest,
+                         ::testing::Values(Framing::Loas, Framing::Adts), [](const auto& info) {
+                             return info.param == Framing::Loas ? "Loas" : "Adts";
+                         });
+
+// ---- the switch between LOAS and ADTS --------------------------------------------
+
+struct SwitchCase {
+    std::string name;
+    Framing stream;
+    Framing openedAs;
+    // Before the switch, every `lookAlikeEvery`-th record starts with the stream's
+    // own sync word; the others start with one stray byte (0 = none does).
+    size_t lookAlikeEvery;
+    size_t recordsBeforeSwitch;  // records consumed when the switch happens
+    const char* suspectMessage;
+};
+
+class AACSwitchTest : public AACExtractorTest, public ::testing::WithParamInterface<SwitchCase> {};
+
+TEST_P(AACSwitchTest, SwitchesAfterTheCountedErrorsAndThenDeliversConfigAndAudio) {
+    const SwitchCase& c = GetParam();
+    const size_t total = c.recordsBeforeSwitch + 6;
+    const Stream s = makeStream(c.stream, total, 11, 1);
+    std::vector<std::vector<uint8_t>> records;
+    for (size_t i = 0; i < total; ++i) {
+        std::vector<uint8_t> record;
+        const bool lookAlike =
+            i >= c.recordsBeforeSwitch || (c.lookAlikeEvery != 0 && (i % c.lookAlikeEvery) == 0);
+        if (!lookAlike) {
+            record.push_back(0x00);
+        }
+        record.insert(record.end(), s.frames[i].begin(), s.frames[i].end());
+        records.push_back(record);
+    }
+    writeRecords(records, 0, kTicksPerFrame48k);
+    android::sp<AACMediaExtractor> extractor = new AACMediaExtractor(mRing, layerOf(c.openedAs));
+    const auto units = drain(*extractor);
+
+    EXPECT_EQ(layerOf(c.stream), extractor->transportLayer());
+    ASSERT_FALSE(units.empty()) << mTrace.all();
+    EXPECT_EQ(AACMediaExtractor::FLAG_CODEC_CONFIG, units[0].flags);
+    EXPECT_EQ(kLcStereo48kAsc, units[0].bytes);
+    // The first record after the switch gives the configuration, all later ones audio.
+    std::vector<std::vector<uint8_t>> audio;
+    for (size_t i = 1; i < units.size(); ++i) {
+        audio.push_back(units[i].bytes);
+    }
+    const size_t firstAudio = c.recordsBeforeSwitch + 1;
+    ASSERT_EQ(total - firstAudio - 1, audio.size()) << mTrace.all();
+    for (size_t i = 0; i < audio.size(); ++i) {
+        EXPECT_EQ(s.units[firstAudio + i], audio[i]);
+    }
+    const size_t lookAlikes =
+        c.lookAlikeEvery == 0 ? 0
+                              : (c.recordsBeforeSwitch + c.lookAlikeEvery - 1) / c.lookAlikeEvery;
+    EXPECT_EQ(lookAlikes, mTrace.count(c.suspectMessage));
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Framings, AACSwitchTest,
+    ::testing::Values(
+        // One ADTS-looking record is enough once 26 errors are counted.
+        SwitchCase{"AdtsOpenedAsLoas", Framing::Adts, Framing::Loas, 1, 26, "ADTS supect count"},
+        SwitchCase{"AdtsOpenedAsLoasOneLookAlike", Framing::Adts, Framing::Loas, 30, 26,
+                   "ADTS supect count"},
+        SwitchCase{"AdtsOpenedAsLoasNoLookAlike", Framing::Adts, Framing::Loas, 0, 50,
+                   "ADTS supect count"},
+        // Ten LOAS-looking records are needed when decoding ADTS.
+        SwitchCase{"LoasOpenedAsAdts", Framing::Loas, Framing::Adts, 1, 26, "LOAS supect count"},
+        SwitchCase{"LoasOpenedAsAdtsEveryThird", Framing::Loas, Framing::Adts, 3, 28,
+                   "LOAS supect count"},
+        SwitchCase{"LoasOpenedAsAdtsNoLookAlike", Framing::Loas, Framing::Adts, 0, 50,
+                   "LOAS supect count"}),
+    [](const auto& info) { return info.param.name; });
+
+// After the first configuration nothing switches any more, whatever comes.
+TEST_F(AACExtractorTest, NoSwitchAfterTheFirstConfiguration) {
+    const Stream loas = makeStream(Framing::Loas, 3);
+    const Stream adts = makeStream(Framing::Adts, 60);
+    writeRecords(loas.frames, 0, kTicksPerFrame48k);
+    writeRecords(adts.frames, 0, kTicksPerFrame48k);
+    android::sp<AACMediaExtractor> extractor =
+        new AACMediaExtractor(mRing, AACMediaExtractor::TRANSPORT_LAYER_LOAS);
+    const auto units = drain(*extractor);
+    EXPECT_EQ(AACMediaExtractor::TRANSPORT_LAYER_LOAS, extractor->transportLayer());
+    EXPECT_EQ(3u, units.size());
+    EXPECT_EQ(0u, mTrace.count("supect count"));
+}
+
+// ---- PTS ------------------------------------------------------------------------------
+
+TEST_F(AACExtractorTest, UnitEndingInTheNextRecordKeepsTheEarlierPts) {
+    const Stream s = makeStream(Framing::Loas, 5);
+    std::vector<uint8_t> a;
+    for (int i = 0; i < 2; ++i) {
+        a.insert(a.end(), s.frames[i].begin(), s.frames[i].end());
+    }
+    const size_t half = s.frames[2].size() / 2;
+    a.insert(a.end(), s.frames[2].begin(), s.frames[2].begin() + static_cast<long>(half));
+    std::vector<uint8_t> b(s.frames[2].begin() + static_cast<long>(half), s.frames[2].end());
+    b.insert(b.end(), s.frames[3].begin(), s.frames[3].end());
+    b.insert(b.end(), s.frames[4].begin(), s.frames[4].end());
+    constexpr uint64_t kPtsA = 100000;
+    constexpr uint64_t kPtsB = 777777;  // deliberately unrelated to kPtsA
+    ASSERT_TRUE(test::writePesRecord(*mRing, a, kPtsA, 0xC0));
+    ASSERT_TRUE(test::writePesRecord(*mRing, b, kPtsB, 0xC0));
+    android::sp<AACMediaExtractor> extractor =
+        new AACMediaExtractor(mRing, AACMediaExtractor::TRANSPORT_LAYER_LOAS);
+    const auto units = drain(*extractor);
+    ASSERT_EQ(4u, units.size());
+    EXPECT_EQ(s.units[1], units[1].bytes);
+    EXPECT_EQ(static_cast<long long>(kPtsA + kTicksPerFrame48k), units[1].pts);
+    EXPECT_EQ(s.units[2], units[2].bytes);
+    EXPECT_EQ(static_cast<long long>(kPtsA + 2 * kTicksPerFrame48k), units[2].pts);
+    EXPECT_EQ(s.units[3], units[3].bytes);
+    EXPECT_EQ(static_cast<long long>(kPtsB), units[3].pts);
+}
+
+// One frame per PES: each unit carries its own record's PTS although every frame is
+// handed out only when the next record shows the next header.
+TEST_F(AACExtractorTest, OneFramePerPesGivesEachUnitItsRecordsPts) {
+    const Stream s = makeStream(Framing::Adts, 6);
+    writeRecords(s.frames, 4000, kTicksPerFrame48k + 7);  // a step unlike the duration
+    android::sp<AACMediaExtractor> extractor =
+        new AACMediaExtractor(mRing, AACMediaExtractor::TRANSPORT_LAYER_ADTS);
+    const auto units = drain(*extractor);
+    ASSERT_EQ(5u, units.size());
+    for (size_t i = 1; i < units.size(); ++i) {
+        EXPECT_EQ(s.units[i], units[i].bytes);
+        EXPECT_EQ(static_cast<long long>(4000 + i * (kTicksPerFrame48k + 7)), units[i].pts) << i;
+    }
+}
+
+TEST_F(AACExtractorTest, FrameDurationFollowsTheReportedConfiguration) {
+    // HE-AAC, core 24 kHz: 1024 core samples last 3840 ticks.
+    LoasOptions o;
+    o.asc.hierarchicalExtension = 5;
+    o.asc.samplingFrequencyIndex = 6;
+    o.asc.extensionSamplingFrequencyIndex = 3;
+    std::vector<uint8_t> record;
+    for (uint32_t i = 0; i < 4; ++i) {
+        const auto f = loasFrame(o, {patternPayload(50, i)});
+        record.insert(record.end(), f.begin(), f.end());
+    }
+    ASSERT_TRUE(test::writePesRecord(*mRing, record, 5000, 0xC0));
+    android::sp<AACMediaExtractor> extractor =
+        new AACMediaExtractor(mRing, AACMediaExtractor::TRANSPORT_LAYER_LOAS);
+    const auto units = drain(*extractor);
+    ASSERT_EQ(3u, units.size());
+    EXPECT_EQ((std::vector<uint8_t>{0x2B, 0x11, 0x88, 0, 0, 0, 0, 0, 0, 0}), units[0].bytes);
+    EXPECT_EQ(5000 + 3840, units[1].pts);
+    EXPECT_EQ(5000 + 2 * 3840, units[2].pts);
+}
+
+// ---- re-segmentation and golden dumps ----------------------------------------------
+
+std::vector<std::vector<uint8_t>> cutEvery(const std::vector<uint8_t>& es, size_t size) {
+    std::vector<std::vector<uint8_t>> out;
+    for (size_t at = 0; at < es.size(); at += size) {
+        out.emplace_back(es.begin() + static_cast<long>(at),
+                         es.begin() + static_cast<long>(std::min(es.size(), at + size)));
+    }
+    return out;
+}
+
+std::vector<std::vector<uint8_t>> groupFrames(const Stream& s, size_t perRecord) {
+    std::vector<std::vector<uint8_t>> out;
+    for (size_t i = 0; i < s.frames.size(); ++i) {
+        if (i % perRecord == 0) {
+            out.emplace_back();
+        }
+        out.back().insert(out.back().end(), s.frames[i].begin(), s.frames[i].end());
+    }
+    return out;
+}
+
+class AACResegmentTest : public AACExtractorTest, public ::testing::WithParamInterface<Framing> {
+protected:
+    // Records get PTS 90000 + i * ptsStep.
+    std::vector<std::vector<uint8_t>> unitsOf(const std::vector<std::vector<uint8_t>>& records,
+                                              std::vector<Unit>* all = nullptr,
+                                              uint64_t ptsStep = kTicksPerFrame48k) {
+        mRing->reset();
+        writeRecords(records, 90000, ptsStep);
+        android::sp<AACMediaExtractor> extractor =
+            new AACMediaExtractor(mRing, layerOf(GetParam()));
+        const auto units = drain(*extractor);
+        if (all != nullptr) {
+            *all = units;
+        }
+        std::vector<std::vector<uint8_t>> bytes;
+        for (const auto& u : units) {
+            bytes.push_back(u.bytes);
+        }
+        return bytes;
+    }
+};
+
+TEST_P(AACResegmentTest, SameUnitsHoweverThePesAreCut) {
+    const Stream s = makeStream(GetParam(), 40);
+    std::vector<uint8_t> es;
+    for (const auto& f : s.frames) {
+        es.insert(es.end(), f.begin(), f.end());
+    }
+    const auto onePerPes = unitsOf(s.frames);
+    ASSERT_EQ(s.units.size() - 1, onePerPes.size());
+    EXPECT_EQ(kLcStereo48kAsc, onePerPes[0]);
+    for (size_t i = 1; i < onePerPes.size(); ++i) {
+        EXPECT_EQ(s.units[i], onePerPes[i]);
+    }
+    EXPECT_EQ(onePerPes, unitsOf(cutEvery(es, 97)));
+    EXPECT_EQ(onePerPes, unitsOf(cutEvery(es, 13)));
+    EXPECT_EQ(onePerPes, unitsOf(groupFrames(s, 3)));
+}
+
+// One line per unit (PTS, flags, size, hash) against a checked-in dump. Run with
+// TAVO_UPDATE_GOLDEN=1 to rewrite the dumps after an intended change.
+TEST_P(AACResegmentTest, MatchesGoldenDump) {
+    const Stream s = makeStream(GetParam(), 24);
+    std::vector<Unit> units;
+    unitsOf(groupFrames(s, 2), &units, 2 * kTicksPerFrame48k);
+    const std::string dump = test::dumpUnits(units);
+    const std::string path = std::string(TAVO_SOURCE_DIR) + "/tests/decoder/golden/aac_" +
+                             (GetParam() == Framing::Loas ? "loas" : "adts") + "_two_per_pes.txt";
+    if (std::getenv("TAVO_UPDATE_GOLDEN") != nullptr) {
+        std::ofstream(path) << dump;
+    }
+    std::ifstream in(path);
+    ASSERT_TRUE(in.good()) << path;
+    std::stringstream golden;
+    golden << in.rdbuf();
+    EXPECT_EQ(golden.str(), dump);
+}
+
+INSTANTIATE_TEST_SUITE_P(Framings, AACResegmentTest,
+                         ::testing::Values(Framing::Loas, Framing::Adts), [](const auto& info) {
+                             return info.param == Framing::Loas ? "Loas" : "Adts";
+                         });
+
+// ---- bad input ------------------------------------------------------------------------
+
+TEST_F(AACExtractorTest, RecordsClaimingMoreEsThanTheyHoldAreReadOnlyToTheirEnd) {
+    const Stream s = makeStream(Framing::Adts, 6);
+    // A record whose mSizeES runs 5000 bytes past its end, one whose ES offset lies
+    // beyond it, then a good stream.
+    const auto& f = s.frames[0];
+    ASSERT_TRUE(test::writeRawRecord(*mRing, PESData::kHeaderSize + static_cast<uint32_t>(f.size()),
+                                     PESData::kHeaderSize, 5000, 0, f));
+    ASSERT_TRUE(test::writeRawRecord(*mRing, PESData::kHeaderSize + 8, 4000, 100, 0,
+                                     std::vector<uint8_t>(8, 0xFF)));
+    writeRecords(s.frames, 0, kTicksPerFrame48k);
+    android::sp<AACMediaExtractor> extractor =
+        new AACMediaExtractor(mRing, AACMediaExtractor::TRANSPORT_LAYER_ADTS);
+    const auto units = drain(*extractor);
+    // The first (bounded) record's frame is complete: it becomes the configuration;
+    // the last frame waits for a next header.
+    ASSERT_EQ(s.units.size(), units.size());
+    EXPECT_EQ(AACMediaExtractor::FLAG_CODEC_CONFIG, units[0].flags);
+    for (size_t i = 0; i + 1 < s.units.size(); ++i) {
+        EXPECT_EQ(s.units[i], units[i + 1].bytes);
+    }
+    EXPECT_EQ(0u, mRing->usedSpace());
+}
+
+TEST_F(AACExtractorTest, CorruptFramesAreDroppedAndTheStreamGoesOn) {
+    const Stream s = makeStream(Framing::Loas, 12);
+    std::vector<std::vector<uint8_t>> records = s.frames;
+    records[4][0] ^= 0x01;                     // sync word broken
+    records[7].resize(records[7].size() / 2);  // truncated frame
+    records[9][3] = 0xFF;                      // mux element garbage
+    writeRecords(records, 0, kTicksPerFrame48k);
+    android::sp<AACMediaExtractor> extractor =
+        new AACMediaExtractor(mRing, AACMediaExtractor::TRANSPORT_LAYER_LOAS);
+    const auto units = drain(*extractor);
+    std::vector<std::vector<uint8_t>> audio;
+    for (size_t i = 1; i < units.size(); ++i) {
+        audio.push_back(units[i].bytes);
+    }
+    // Every intact frame after the configuration comes out, in order.
+    std::vector<std::vector<uint8_t>> intact;
+    for (size_t i = 1; i + 1 < s.units.size(); ++i) {
+        if (i != 4 && i != 7 && i != 8 && i != 9) {
+            intact.push_back(s.units[i]);
+        }
+    }
+    // Frame 8 follows the truncated frame 7 in the buffer and is lost with it or
+    // found by resynchronisation; frame 9 may or may not parse: accept both.
+    for (const auto& unit : intact) {
+        EXPECT_NE(audio.end(), std::find(audio.begin(), audio.end(), unit));
+    }
+    EXPECT_EQ(s.units[s.units.size() - 2], audio.back());
+    EXPECT_EQ(0u, mRing->usedSpace());
+}
+
+TEST_F(AACExtractorTest, RecordLargerThanTheReadableBytesIsARingFault) {
+    ASSERT_TRUE(test::writeRawRecord(*mRing, 4096, PESData::kHeaderSize, 10, 0,
+                                     std::vector<uint8_t>(16, 0)));
+    android::sp<AACMediaExtractor> extractor =
+        new AACMediaExtractor(mRing, AACMediaExtractor::TRANSPORT_LAYER_LOAS);
+    std::vector<uint8_t> out(1024);
+    unsigned long length = 0;
+    long long pts = 0;
+    unsigned char flags = 0;
+    EXPECT_EQ(1u, extractor->getDecodableUnit(out.data(), out.size(), &length, &pts, &flags));
+    EXPECT_EQ(0u, length);
+    EXPECT_EQ(1u, mTrace.count("getDecodableUnit: RingBuffer fatal errror: 56 4136"));
+    EXPECT_NE(0u, mRing->usedSpace()) << "nothing consumed";
+}
+
+TEST_F(AACExtractorTest, NoInputWithinTheWaitReturnsTwo) {
+    android::sp<AACMediaExtractor> extractor =
+        new AACMediaExtractor(mRing, AACMediaExtractor::TRANSPORT_LAYER_LOAS);
+    std::vector<uint8_t> out(64);
+    unsigned long length = 5;
+    long long pts = 0;
+    unsigned char flags = 0;
+    EXPECT_EQ(2u, extractor->getDecodableUnit(out.data(), out.size(), &length, &pts, &flags));
+    EXPECT_EQ(0u, length);
+}
+
+TEST_F(AACExtractorTest, UnitLargerThanTheOutputIsDroppedAndTheNextDelivered) {
+    Stream s = makeStream(Framing::Adts, 5);
+    s.units[2] = patternPayload(600, 99);
+    s.frames[2] = adtsFrame({}, s.units[2]);
+    writeRecords(s.frames, 0, kTicksPerFrame48k);
+    android::sp<AACMediaExtractor> extractor =
+        new AACMediaExtractor(mRing, AACMediaExtractor::TRANSPORT_LAYER_ADTS);
+    const auto units = drain(*extractor, 512);
+    ASSERT_EQ(3u, units.size());
+    EXPECT_EQ(s.units[1], units[1].bytes);
+    EXPECT_EQ(s.units[3], units[2].bytes);
+}
+
+TEST_F(AACExtractorTest, OutputTooSmallForTheConfigurationIsLogged) {
+    writeRecords(makeStream(Framing::Adts, 3).frames, 0, kTicksPerFrame48k);
+    android::sp<AACMediaExtractor> extractor =
+        new AACMediaExtractor(mRing, AACMediaExtractor::TRANSPORT_LAYER_ADTS);
+    const auto units = drain(*extractor, 9);
+    EXPECT_TRUE(units.empty());
+    EXPECT_EQ(2u, mTrace.count("getASC: Not enough space on output buffer. (10 > 9)"));
+    EXPECT_EQ(2u, mTrace.count("getNextFragment: Error creating ASC"));
+}
+
+}  // namespace
+}  // namespace TavoPlayer

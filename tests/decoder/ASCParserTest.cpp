@@ -1,0 +1,125 @@
+// The AudioSpecificConfig writer: exact bytes for the configurations broadcasts use,
+// the escape of object types above 31, the explicit frequency, and agreement with the
+// transport decoder's reading of the same bytes.
+#include "decoder/ASCParser.h"
+
+#include <gtest/gtest.h>
+
+#include <string>
+#include <vector>
+
+#include "decoder/TransportDecoderAsc.h"
+
+namespace TavoPlayer {
+namespace {
+
+struct AscCase {
+    std::string name;
+    int32_t aot;
+    uint32_t sfi;
+    uint32_t sf;
+    uint32_t channels;
+    int32_t extAot;
+    uint32_t extSfi;
+    uint32_t extSf;
+    std::vector<uint8_t> expected;  // all 10 bytes
+};
+
+std::vector<AscCase> ascCases() {
+    return {
+        // 00010 0011 0010 -> 11 90
+        {"LcAt48kStereo", 2, 3, 48000, 2, -1, 0, 0, {0x11, 0x90, 0, 0, 0, 0, 0, 0, 0, 0}},
+        // 00101 0110 0010 0011 00010 -> 2B 11 88
+        {"HeAacCore24kExtension48k",
+         2,
+         6,
+         24000,
+         2,
+         5,
+         3,
+         48000,
+         {0x2B, 0x11, 0x88, 0, 0, 0, 0, 0, 0, 0}},
+        // 00010 0100 0001 -> 12 08 (the ExoPlayer ADTS sample: 44.1 kHz mono)
+        {"LcAt44kMono", 2, 4, 44100, 1, -1, 0, 0, {0x12, 0x08, 0, 0, 0, 0, 0, 0, 0, 0}},
+        // 5.1 at 48 kHz: 00010 0011 0110 -> 11 B0
+        {"LcAt48kFivePointOne", 2, 3, 48000, 6, -1, 0, 0, {0x11, 0xB0, 0, 0, 0, 0, 0, 0, 0, 0}},
+        // An extension type other than SBR is not written.
+        {"PsExtensionIsNotSbr", 2, 3, 48000, 2, 29, 3, 48000, {0x11, 0x90, 0, 0, 0, 0, 0, 0, 0, 0}},
+        // Object type 42 escapes: 11111 001010, then 0011 0010 -> F9 46 40
+        {"EscapedObjectType", 42, 3, 48000, 2, -1, 0, 0, {0xF9, 0x46, 0x40, 0, 0, 0, 0, 0, 0, 0}},
+        // Index 15 carries the frequency in 24 bits: 00010 1111 0x00BB80 0010
+        // -> 00010111 10000000 01011101 11000000 00010... = 17 80 5D C0 10
+        {"ExplicitFrequency",
+         2,
+         15,
+         48000,
+         2,
+         -1,
+         0,
+         0,
+         {0x17, 0x80, 0x5D, 0xC0, 0x10, 0, 0, 0, 0, 0}},
+    };
+}
+
+class ASCParserBytesTest : public ::testing::TestWithParam<AscCase> {};
+
+TEST_P(ASCParserBytesTest, WritesTheConfigurationInTenBytes) {
+    const AscCase& c = GetParam();
+    ASCParser parser;
+    parser.mAudioObjectType = c.aot;
+    parser.mSamplingFrequencyIndex = c.sfi;
+    parser.mSamplingFrequency = c.sf;
+    parser.mChannelConfiguration = c.channels;
+    parser.mExtensionAudioObjectType = c.extAot;
+    parser.mExtensionSamplingFrequencyIndex = c.extSfi;
+    parser.mExtensionSamplingFrequency = c.extSf;
+    unsigned char* asc = nullptr;
+    unsigned int size = 0;
+    ASSERT_EQ(0u, parser.createASC(&asc, &size));
+    ASSERT_NE(nullptr, asc);
+    EXPECT_EQ(10u, size);
+    EXPECT_EQ(c.expected, std::vector<uint8_t>(asc, asc + size));
+
+    // The transport decoder's reader finds the same fields in what was written.
+    TransportBitReader reader(asc, size);
+    CSAudioSpecificConfig parsed;
+    if (c.aot < 32) {
+        ASSERT_EQ(TRANSPORTDEC_OK, TransportDecoderAsc::parse(reader, -1, &parsed));
+        EXPECT_EQ(c.aot, parsed.m_aot);
+        EXPECT_EQ(c.sf, parsed.m_samplingFrequency);
+        EXPECT_EQ(c.channels, parsed.m_channelConfiguration);
+        EXPECT_EQ(c.extAot == 5 ? 5 : AOT_NONE, parsed.m_extensionAudioObjectType);
+    }
+    delete[] asc;
+}
+
+INSTANTIATE_TEST_SUITE_P(Configurations, ASCParserBytesTest, ::testing::ValuesIn(ascCases()),
+                         [](const auto& info) { return info.param.name; });
+
+class ASCParserContractTest : public ::testing::Test {};
+
+TEST_F(ASCParserContractTest, NullOutputIsRefused) {
+    ASCParser parser;
+    unsigned int size = 99;
+    EXPECT_EQ(1u, parser.createASC(nullptr, &size));
+    EXPECT_EQ(99u, size);
+}
+
+TEST_F(ASCParserContractTest, WriteAotUsesEscapeFrom32) {
+    struct Row {
+        unsigned char aot;
+        std::vector<uint8_t> bytes;
+    };
+    for (const Row& row : {Row{2, {0x10}}, Row{31, {0xF8}}, Row{32, {0xF8, 0x00}},
+                           Row{33, {0xF8, 0x20}}, Row{95, {0xFF, 0xE0}}}) {
+        uint8_t buffer[2] = {0xAA, 0xAA};
+        WriteBitInterface writer(buffer, sizeof(buffer));
+        ASCParser().writeAOT(&writer, row.aot);
+        writer.byteAlign(nullptr);
+        EXPECT_EQ(row.bytes, std::vector<uint8_t>(buffer, buffer + row.bytes.size()))
+            << "type " << static_cast<int>(row.aot);
+    }
+}
+
+}  // namespace
+}  // namespace TavoPlayer

@@ -75,6 +75,8 @@ int AudioEncoder::open() {
     mContext->bit_rate = mOptions.effectiveAudioBitrate();
     mContext->time_base = AVRational{1, mOptions.audioRate};
     mContext->thread_count = 1;
+    // No encoder version string in the stream: output does not change with it.
+    mContext->flags |= AV_CODEC_FLAG_BITEXACT;
     if (mOptions.audioCodec == AudioCodec::kAacLatm ||
         mOptions.audioCodec == AudioCodec::kAacAdts) {
         mContext->profile = FF_PROFILE_AAC_LOW;

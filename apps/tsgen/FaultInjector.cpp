@@ -25,6 +25,16 @@ int64_t FaultInjector::pcrOffset27(int64_t streamTime27) const {
     return offset;
 }
 
+int64_t FaultInjector::timebaseShift90(int64_t streamTime27) const {
+    int64_t shift = 0;
+    for (const auto& jump : mOptions.timebaseJumps) {
+        if (streamTime27 >= static_cast<int64_t>(std::llround(jump.startSec * 27e6))) {
+            shift += jump.amountMs * 90;
+        }
+    }
+    return shift;
+}
+
 bool FaultInjector::apply(uint8_t* packet, int64_t streamTime27) {
     const uint16_t pid = static_cast<uint16_t>(((packet[1] & 0x1F) << 8) | packet[2]);
     const uint64_t index = mIndex[pid]++;

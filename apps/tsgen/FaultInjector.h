@@ -19,6 +19,8 @@ public:
     bool apply(uint8_t* packet, int64_t streamTime27);
     // Offset to add to a PCR sampled at that time.
     int64_t pcrOffset27(int64_t streamTime27) const;
+    // Announced change of time base in force at that time (PCR, PTS and DTS move).
+    int64_t timebaseShift90(int64_t streamTime27) const;
     uint64_t droppedPackets() const { return mDropped; }
 
 private:

@@ -55,6 +55,10 @@ enum OptionId {
     kOptScramblingValue,
     kOptPcrJump,
     kOptGap,
+    kOptTimebaseJump,
+    kOptPacketSize,
+    kOptVideoPesBytes,
+    kOptAudioPesBytes,
 };
 
 bool parseInt(const std::string& text, int64_t minValue, int64_t maxValue, int64_t& value) {
@@ -331,8 +335,15 @@ Multiplex:
       --psi-interval-ms MS   PAT/PMT period (default 100)
       --start-pts TICKS      PTS of the first picture, 90 kHz (default 126000); values near
                              8589934592 (2^33) make the time stamps wrap
+      --packet-size N        188 (default) or 204: each packet followed by 16 bytes of zeros,
+                             in place of the ISDB-T / Reed-Solomon trailer
+      --video-pes-bytes N    cut the video into PES of N bytes regardless of access units
+                             (default: one access unit per PES); a PES in which no access
+                             unit starts has no PTS
+      --audio-pes-bytes N    the same for audio (default: --audio-frames-per-pes frames)
 
-Faults (PACKET = PID:INDEX[:COUNT], INDEX counts the PID's packets from 0):
+Faults (PACKET = PID:INDEX[:COUNT], INDEX counts the PID's packets from 0; SEC here and
+in --caption counts from the first picture's PTS):
       --cc-error PID:INDEX   continuity counter jumps by one extra at that packet (repeatable)
       --drop PACKET          leave those packets out (repeatable)
       --tei PACKET           set transport_error_indicator (repeatable)
@@ -340,6 +351,8 @@ Faults (PACKET = PID:INDEX[:COUNT], INDEX counts the PID's packets from 0):
       --scrambling-value V   the scrambling control written, 1..3 (default 2)
       --pcr-jump SEC:MS      from time SEC on, PCR values are MS milliseconds off (repeatable)
       --gap SEC:MS           write no packets for MS milliseconds from SEC; the PCR runs on
+      --timebase-jump SEC:MS from SEC on, PCR, PTS and DTS move by MS milliseconds, announced
+                             by discontinuity_indicator on the first PCR after it (repeatable)
       --latm-as-adts         label LATM audio with stream_type 0x0F
       --adts-as-latm         label ADTS audio with stream_type 0x11
 
@@ -393,6 +406,10 @@ int OptionParser::parse(int argc, char** argv, Options& o) {
         {"scrambling-value", required_argument, nullptr, kOptScramblingValue},
         {"pcr-jump", required_argument, nullptr, kOptPcrJump},
         {"gap", required_argument, nullptr, kOptGap},
+        {"timebase-jump", required_argument, nullptr, kOptTimebaseJump},
+        {"packet-size", required_argument, nullptr, kOptPacketSize},
+        {"video-pes-bytes", required_argument, nullptr, kOptVideoPesBytes},
+        {"audio-pes-bytes", required_argument, nullptr, kOptAudioPesBytes},
         {"verbose", no_argument, nullptr, 'v'},
         {"help", no_argument, nullptr, 'h'},
         {nullptr, 0, nullptr, 0},
@@ -677,6 +694,30 @@ int OptionParser::parse(int argc, char** argv, Options& o) {
                 o.gaps.push_back(fault);
                 break;
             }
+            case kOptTimebaseJump: {
+                TimedFault fault;
+                if (!parseTimedFault(arg, -3600 * 1000, fault)) {
+                    return bad("--timebase-jump (SEC:MS)");
+                }
+                o.timebaseJumps.push_back(fault);
+                break;
+            }
+            case kOptPacketSize:
+                if (arg != "188" && arg != "204") {
+                    return bad("--packet-size (188 or 204)");
+                }
+                o.packetSize = arg == "188" ? 188 : 204;
+                break;
+            case kOptVideoPesBytes:
+                if (!intArg(1, 1 << 20, o.videoPesBytes)) {
+                    return bad("--video-pes-bytes (1..1048576)");
+                }
+                break;
+            case kOptAudioPesBytes:
+                if (!intArg(1, 65000, o.audioPesBytes)) {
+                    return bad("--audio-pes-bytes (1..65000)");
+                }
+                break;
             case 'v':
                 o.verbose = true;
                 break;

@@ -79,6 +79,10 @@ struct Options {
     int scramblingValue = 2;
     std::vector<TimedFault> pcrJumps;
     std::vector<TimedFault> gaps;
+    std::vector<TimedFault> timebaseJumps;
+    int packetSize = 188;   // 204: each packet followed by 16 bytes (ISDB-T trailer)
+    int videoPesBytes = 0;  // 0: one access unit per PES
+    int audioPesBytes = 0;  // 0: audioFramesPerPes frames per PES
 
     uint16_t effectivePcrPid() const {
         return pcrPid < 0 ? videoPid : static_cast<uint16_t>(pcrPid);

@@ -54,11 +54,15 @@ void TsMuxer::addStream(uint16_t pid, uint8_t streamId, Source source) {
 
 std::vector<uint8_t> TsMuxer::pesHeader(uint8_t streamId, const PesUnit& unit) {
     std::vector<uint8_t> h = {0x00, 0x00, 0x01, streamId, 0, 0};
-    h.push_back(0x84);  // '10', not scrambled, data_alignment_indicator
-    h.push_back(unit.hasDts ? 0xC0 : 0x80);
-    h.push_back(unit.hasDts ? 10 : 5);
-    putTimestamp(h, unit.hasDts ? 0x3 : 0x2, unit.pts);
-    if (unit.hasDts) {
+    const bool dts = unit.hasPts && unit.hasDts;
+    // '10', not scrambled, data_alignment_indicator when an access unit starts here.
+    h.push_back(unit.aligned ? 0x84 : 0x80);
+    h.push_back(!unit.hasPts ? 0x00 : dts ? 0xC0 : 0x80);
+    h.push_back(!unit.hasPts ? 0 : dts ? 10 : 5);
+    if (unit.hasPts) {
+        putTimestamp(h, dts ? 0x3 : 0x2, unit.pts);
+    }
+    if (dts) {
         putTimestamp(h, 0x1, unit.dts);
     }
     const size_t length = h.size() - 6 + unit.payload.size();
@@ -85,6 +89,8 @@ int TsMuxer::load(Stream& s) {
     s.offset = 0;
     s.dts90 = unit.hasDts ? unit.dts : unit.pts;
     s.randomAccess = unit.randomAccess;
+    unit.payload.clear();
+    s.unit = std::move(unit);
     s.loaded = true;
     return 0;
 }
@@ -156,13 +162,23 @@ void TsMuxer::writePcrOnly(uint8_t* packet, uint16_t pid, int64_t pcr27) {
     // Adaptation field only: the counter does not advance (2.4.3.3).
     packet[3] = static_cast<uint8_t>(0x20 | currentCc(pid));
     packet[4] = 183;
-    packet[5] = 0x10;  // PCR_flag
+    packet[5] = mDiscontinuityPending ? 0x90 : 0x10;  // discontinuity_indicator, PCR_flag
     putPcr(packet + 6, pcr27);
     std::memset(packet + 12, 0xFF, kPacketSize - 12);
 }
 
 void TsMuxer::writePayloadPacket(uint8_t* packet, Stream& s, bool withPcr, int64_t pcr27) {
     const bool start = s.offset == 0;
+    if (start && mShift90 != 0) {
+        // After a time-base change every PES that starts is stamped on the new
+        // time base (ISO/IEC 13818-1, 2.4.3.5, discontinuity_indicator); the
+        // header keeps its size, so it is rewritten in place.
+        PesUnit shifted = s.unit;
+        shifted.pts += mShift90;
+        shifted.dts += mShift90;
+        const auto header = pesHeader(s.streamId, shifted);
+        std::copy(header.begin() + 6, header.end(), s.pes.begin() + 6);
+    }
     const bool randomAccess = start && s.randomAccess;
     const size_t remaining = s.pes.size() - s.offset;
     // Adaptation field: flags byte when a PCR or the random access indicator is
@@ -186,7 +202,9 @@ void TsMuxer::writePayloadPacket(uint8_t* packet, Stream& s, bool withPcr, int64
         p[0] = static_cast<uint8_t>(afBytes - 1);
         if (afBytes > 1) {
             // 2.4.3.4: adaptation_field_length 0 is a single stuffing byte with no flags.
-            p[1] = static_cast<uint8_t>((randomAccess ? 0x40 : 0) | (withPcr ? 0x10 : 0));
+            const bool discontinuity = withPcr && mDiscontinuityPending;
+            p[1] = static_cast<uint8_t>((discontinuity ? 0x80 : 0) | (randomAccess ? 0x40 : 0) |
+                                        (withPcr ? 0x10 : 0));
             size_t used = 2;
             if (withPcr) {
                 putPcr(p + 2, pcr27);
@@ -237,7 +255,13 @@ int TsMuxer::run(std::FILE* out) {
                 due = &s;
             }
         }
-        const int64_t pcr27 = now27 + mFaults.pcrOffset27(now27 - faultBase27);
+        // A new time base takes effect with the next PCR, sent at once: from
+        // that packet on, the PCR and every PES that starts use it.
+        const int64_t shift90 = mFaults.timebaseShift90(now27 - faultBase27);
+        if (shift90 != mShift90 && !mDiscontinuityPending) {
+            mDiscontinuityPending = true;
+            nextPcr27 = now27;
+        }
 
         if (pmtPending) {
             writeSection(packet, mOptions.pmtPid, mPsi.pmtSection());
@@ -247,6 +271,10 @@ int TsMuxer::run(std::FILE* out) {
             pmtPending = true;
             nextPsi27 = (nextPsi27 == INT64_MIN ? now27 : nextPsi27) + psiInterval27;
         } else if (now27 >= nextPcr27) {
+            if (mDiscontinuityPending) {
+                mShift90 = shift90;
+            }
+            const int64_t pcr27 = now27 + mFaults.pcrOffset27(now27 - faultBase27) + mShift90 * 300;
             Stream* carrier = (due != nullptr && due->pid == pcrPid) ? due : nullptr;
             if (carrier == nullptr) {
                 for (auto& s : mStreams) {
@@ -262,6 +290,7 @@ int TsMuxer::run(std::FILE* out) {
                 writePcrOnly(packet, pcrPid, pcr27);
                 due = nullptr;
             }
+            mDiscontinuityPending = false;
             nextPcr27 = (nextPcr27 == INT64_MIN ? now27 : nextPcr27) + pcrInterval27;
         } else if (due != nullptr) {
             writePayloadPacket(packet, *due, false, 0);
@@ -284,7 +313,12 @@ int TsMuxer::run(std::FILE* out) {
 
         ++mStats.packets;
         if (mFaults.apply(packet, now27 - faultBase27)) {
-            if (std::fwrite(packet, 1, kPacketSize, out) != kPacketSize) {
+            // A 204-byte packet carries 16 more bytes (Reed-Solomon parity, or the
+            // ISDB-T information of ABNT NBR 15601); receivers discard them.
+            static const uint8_t kTrailer[16] = {};
+            const size_t trailer = mOptions.packetSize > 188 ? sizeof kTrailer : 0;
+            if (std::fwrite(packet, 1, kPacketSize, out) != kPacketSize ||
+                std::fwrite(kTrailer, 1, trailer, out) != trailer) {
                 mError = "cannot write the output";
                 return 1;
             }

@@ -53,6 +53,7 @@ private:
         std::vector<uint8_t> pes;  // header and payload of the PES being sent
         size_t offset = 0;
         int64_t dts90 = 0;
+        PesUnit unit;  // times and flags of the PES being sent (payload emptied)
         bool randomAccess = false;
         bool loaded = false;
         bool ended = false;
@@ -75,6 +76,8 @@ private:
     std::vector<std::pair<uint16_t, uint8_t>> mCc;  // last counter per PID
     int64_t mRate = 0;
     int64_t mStart27 = 0;
+    int64_t mShift90 = 0;                // time-base change in force since the last PCR
+    bool mDiscontinuityPending = false;  // the next PCR announces a new time base
     Stats mStats;
     std::string mError;
 };

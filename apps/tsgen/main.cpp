@@ -11,6 +11,7 @@ extern "C" {
 #include "CaptionWriter.h"
 #include "FaultInjector.h"
 #include "Options.h"
+#include "PesResegmenter.h"
 #include "PsiWriter.h"
 #include "TsMuxer.h"
 #include "VideoEncoder.h"
@@ -76,9 +77,21 @@ int main(int argc, char** argv) {
     TsMuxer muxer(options, psi, faults);
     // ISO/IEC 13818-1, Table 2-22: stream_id 0xE0 video, 0xC0 audio, 0xBD
     // private_stream_1 for the caption PES (ARIB STD-B24).
-    muxer.addStream(options.videoPid, 0xE0, [&](PesUnit& u) { return video.next(u); });
+    TsMuxer::Source videoSource = [&](PesUnit& u) { return video.next(u); };
+    std::unique_ptr<PesResegmenter> videoCutter;
+    if (options.videoPesBytes > 0) {
+        videoCutter = std::make_unique<PesResegmenter>(videoSource, options.videoPesBytes);
+        videoSource = [&](PesUnit& u) { return videoCutter->next(u); };
+    }
+    muxer.addStream(options.videoPid, 0xE0, videoSource);
+    std::unique_ptr<PesResegmenter> audioCutter;
     if (audio) {
-        muxer.addStream(options.audioPid, 0xC0, [&](PesUnit& u) { return audio->next(u); });
+        TsMuxer::Source audioSource = [&](PesUnit& u) { return audio->next(u); };
+        if (options.audioPesBytes > 0) {
+            audioCutter = std::make_unique<PesResegmenter>(audioSource, options.audioPesBytes);
+            audioSource = [&](PesUnit& u) { return audioCutter->next(u); };
+        }
+        muxer.addStream(options.audioPid, 0xC0, audioSource);
     }
     if (options.captionStream) {
         muxer.addStream(options.captionPid, 0xBD, [&](PesUnit& u) { return captions.next(u); });

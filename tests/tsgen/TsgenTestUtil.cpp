@@ -61,19 +61,19 @@ std::vector<uint8_t> readFile(const std::string& file) {
                                 std::istreambuf_iterator<char>());
 }
 
-TsFile::TsFile(const std::vector<uint8_t>& bytes) {
-    if (bytes.empty() || bytes.size() % 188 != 0) {
+TsFile::TsFile(const std::vector<uint8_t>& bytes, size_t packetSize) {
+    if (bytes.empty() || bytes.size() % packetSize != 0 || packetSize < 188) {
         mValid = false;
         return;
     }
-    for (size_t off = 0; off < bytes.size(); off += 188) {
+    for (size_t off = 0; off < bytes.size(); off += packetSize) {
         const uint8_t* p = bytes.data() + off;
         if (p[0] != 0x47) {
             mValid = false;
             return;
         }
         TsPacket t;
-        t.position = off / 188;
+        t.position = off / packetSize;
         t.tei = (p[1] & 0x80) != 0;
         t.pusi = (p[1] & 0x40) != 0;
         t.pid = static_cast<uint16_t>(((p[1] & 0x1F) << 8) | p[2]);
@@ -88,6 +88,7 @@ TsFile::TsFile(const std::vector<uint8_t>& bytes) {
                 return;
             }
             if (length > 0) {
+                t.discontinuity = (p[5] & 0x80) != 0;
                 t.randomAccess = (p[5] & 0x40) != 0;
                 t.hasPcr = (p[5] & 0x10) != 0;
                 if (t.hasPcr) {

@@ -45,6 +45,7 @@ struct TsPacket {
     uint8_t cc = 0;
     bool hasPcr = false;
     bool randomAccess = false;
+    bool discontinuity = false;
     int64_t pcr27 = 0;  // base * 300 + extension
     std::vector<uint8_t> payload;
 };
@@ -72,10 +73,11 @@ struct Pmt {
     std::vector<PmtStream> streams;
 };
 
-// Reads 188-byte packets; every packet must start with 0x47.
+// Reads 188-byte packets (or 204-byte ones, ignoring their last 16 bytes);
+// every packet must start with 0x47.
 class TsFile {
 public:
-    explicit TsFile(const std::vector<uint8_t>& bytes);
+    explicit TsFile(const std::vector<uint8_t>& bytes, size_t packetSize = 188);
     bool valid() const { return mValid; }
     const std::vector<TsPacket>& packets() const { return mPackets; }
     std::vector<const TsPacket*> packetsOf(uint16_t pid) const;

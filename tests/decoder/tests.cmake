@@ -1,2 +1,3 @@
 # The extractor tests compare with libavcodec's own parsers on the same bytes.
 target_link_libraries(${TEST_TARGET} PRIVATE PkgConfig::FFMPEG)
+include(${CMAKE_CURRENT_LIST_DIR}/aac.cmake)

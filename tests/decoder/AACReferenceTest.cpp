@@ -1,0 +1,395 @@
+// The AAC extractor against FFmpeg as an independent reference: AAC made by FFmpeg's
+// encoder in ADTS and in LATM/LOAS, and the real sample streams, cut into PES records
+// three ways. The access units must be byte for byte those that FFmpeg's demuxer and
+// aac_adtstoasc filter find, the configuration the one FFmpeg reports, and FFmpeg's
+// own decoder must decode the units with that configuration.
+#include <gtest/gtest.h>
+
+#include <cstdio>
+#include <filesystem>
+#include <fstream>
+#include <sstream>
+#include <string>
+#include <vector>
+
+extern "C" {
+#include <libavcodec/avcodec.h>
+#include <libavcodec/bsf.h>
+#include <libavformat/avformat.h>
+#include <libavutil/channel_layout.h>
+}
+
+#include "AACTestUtil.h"
+#include "PesRecordTestUtil.h"
+#include "decoder/AACMediaExtractor.h"
+
+namespace TavoPlayer {
+namespace {
+
+using test::Unit;
+
+struct Packet {
+    std::vector<uint8_t> bytes;
+    int64_t pts = 0;
+};
+
+struct Demuxed {
+    std::vector<Packet> packets;
+    std::vector<uint8_t> extradata;
+    int sampleRate = 0;
+    int channels = 0;
+    int profile = 0;
+    bool ok = false;
+};
+
+// The audio packets of a file as FFmpeg's demuxer (and parser) splits them.
+Demuxed demux(const std::string& path, const char* format = nullptr) {
+    Demuxed out;
+    AVFormatContext* ctx = nullptr;
+    const AVInputFormat* input = format ? av_find_input_format(format) : nullptr;
+    if (avformat_open_input(&ctx, path.c_str(), input, nullptr) < 0) {
+        return out;
+    }
+    if (avformat_find_stream_info(ctx, nullptr) >= 0) {
+        const int index = av_find_best_stream(ctx, AVMEDIA_TYPE_AUDIO, -1, -1, nullptr, 0);
+        if (index >= 0) {
+            const AVCodecParameters* par = ctx->streams[index]->codecpar;
+            out.extradata.assign(par->extradata, par->extradata + par->extradata_size);
+            out.sampleRate = par->sample_rate;
+            out.channels = par->ch_layout.nb_channels;
+            out.profile = par->profile;
+            AVPacket* pkt = av_packet_alloc();
+            while (av_read_frame(ctx, pkt) >= 0) {
+                if (pkt->stream_index == index) {
+                    out.packets.push_back(
+                        {std::vector<uint8_t>(pkt->data, pkt->data + pkt->size), pkt->pts});
+                }
+                av_packet_unref(pkt);
+            }
+            av_packet_free(&pkt);
+            out.ok = true;
+        }
+    }
+    avformat_close_input(&ctx);
+    return out;
+}
+
+// ADTS packets through FFmpeg's aac_adtstoasc: raw access units and the
+// AudioSpecificConfig it derives.
+bool adtsToRaw(const std::string& path, std::vector<std::vector<uint8_t>>* units,
+               std::vector<uint8_t>* asc) {
+    AVFormatContext* ctx = nullptr;
+    if (avformat_open_input(&ctx, path.c_str(), av_find_input_format("aac"), nullptr) < 0) {
+        return false;
+    }
+    bool ok = false;
+    AVBSFContext* bsf = nullptr;
+    const int index = avformat_find_stream_info(ctx, nullptr) >= 0
+                          ? av_find_best_stream(ctx, AVMEDIA_TYPE_AUDIO, -1, -1, nullptr, 0)
+                          : -1;
+    if (index >= 0 && av_bsf_alloc(av_bsf_get_by_name("aac_adtstoasc"), &bsf) >= 0) {
+        avcodec_parameters_copy(bsf->par_in, ctx->streams[index]->codecpar);
+        bsf->time_base_in = ctx->streams[index]->time_base;
+        if (av_bsf_init(bsf) >= 0) {
+            AVPacket* pkt = av_packet_alloc();
+            while (av_read_frame(ctx, pkt) >= 0) {
+                if (pkt->stream_index != index) {
+                    av_packet_unref(pkt);
+                    continue;
+                }
+                if (av_bsf_send_packet(bsf, pkt) < 0) {
+                    av_packet_unref(pkt);
+                    break;
+                }
+                while (av_bsf_receive_packet(bsf, pkt) >= 0) {
+                    size_t sideSize = 0;
+                    const uint8_t* side =
+                        av_packet_get_side_data(pkt, AV_PKT_DATA_NEW_EXTRADATA, &sideSize);
+                    if (side != nullptr && asc->empty()) {
+                        asc->assign(side, side + sideSize);
+                    }
+                    units->emplace_back(pkt->data, pkt->data + pkt->size);
+                    av_packet_unref(pkt);
+                }
+            }
+            av_packet_free(&pkt);
+            if (asc->empty() && bsf->par_out->extradata_size > 0) {
+                asc->assign(bsf->par_out->extradata,
+                            bsf->par_out->extradata + bsf->par_out->extradata_size);
+            }
+            ok = true;
+        }
+    }
+    av_bsf_free(&bsf);
+    avformat_close_input(&ctx);
+    return ok;
+}
+
+struct Decoded {
+    int frames = 0;
+    int errors = 0;
+    int sampleRate = 0;
+    int channels = 0;
+};
+
+// Decodes raw access units with FFmpeg's AAC decoder given `asc` as configuration.
+Decoded decodeRaw(const std::vector<uint8_t>& asc, const std::vector<Unit>& units) {
+    Decoded out;
+    const AVCodec* codec = avcodec_find_decoder(AV_CODEC_ID_AAC);
+    AVCodecContext* ctx = avcodec_alloc_context3(codec);
+    ctx->extradata = static_cast<uint8_t*>(av_mallocz(asc.size() + AV_INPUT_BUFFER_PADDING_SIZE));
+    std::copy(asc.begin(), asc.end(), ctx->extradata);
+    ctx->extradata_size = static_cast<int>(asc.size());
+    if (avcodec_open2(ctx, codec, nullptr) < 0) {
+        avcodec_free_context(&ctx);
+        out.errors = 1;
+        return out;
+    }
+    AVPacket* pkt = av_packet_alloc();
+    AVFrame* frame = av_frame_alloc();
+    for (const auto& unit : units) {
+        if (unit.flags & AACMediaExtractor::FLAG_CODEC_CONFIG) {
+            continue;
+        }
+        av_new_packet(pkt, static_cast<int>(unit.bytes.size()));
+        std::copy(unit.bytes.begin(), unit.bytes.end(), pkt->data);
+        if (avcodec_send_packet(ctx, pkt) < 0) {
+            ++out.errors;
+        }
+        av_packet_unref(pkt);
+        while (avcodec_receive_frame(ctx, frame) >= 0) {
+            ++out.frames;
+            out.sampleRate = frame->sample_rate;
+            out.channels = frame->ch_layout.nb_channels;
+        }
+    }
+    av_frame_free(&frame);
+    av_packet_free(&pkt);
+    avcodec_free_context(&ctx);
+    return out;
+}
+
+class AACReferenceTest : public ::testing::Test {
+protected:
+    void SetUp() override {
+        mDir = std::filesystem::path(TAVO_BINARY_DIR) / "aac_reference";
+        std::filesystem::create_directories(mDir);
+    }
+
+    // Runs the extractor over `records` (PTS given per record).
+    std::vector<Unit> extract(const std::vector<test::PesChunk>& records,
+                              AACMediaExtractor::transportLayer_t layer) {
+        android::sp<RingBuffer> ring = test::makeRing(22);
+        for (const auto& r : records) {
+            EXPECT_TRUE(test::writePesRecord(*ring, r.es, r.pts, 0xC0));
+        }
+        android::sp<AACMediaExtractor> extractor = new AACMediaExtractor(ring, layer);
+        return test::drain(*extractor);
+    }
+
+    // The same bytes cut three ways: one FFmpeg packet per PES, fixed odd cuts, and
+    // several packets per PES. Each must give the same units.
+    void expectSameUnitsThreeWays(const std::vector<Packet>& packets,
+                                  AACMediaExtractor::transportLayer_t layer,
+                                  std::vector<Unit>* onePerPes) {
+        std::vector<test::PesChunk> perPacket;
+        std::vector<uint8_t> es;
+        std::vector<test::PesChunk> grouped;
+        for (size_t i = 0; i < packets.size(); ++i) {
+            perPacket.push_back({packets[i].bytes, static_cast<uint64_t>(i) * 1920});
+            if (i % 4 == 0) {
+                grouped.push_back({{}, static_cast<uint64_t>(i) * 1920});
+            }
+            grouped.back().es.insert(grouped.back().es.end(), packets[i].bytes.begin(),
+                                     packets[i].bytes.end());
+            es.insert(es.end(), packets[i].bytes.begin(), packets[i].bytes.end());
+        }
+        std::vector<test::PesChunk> odd;
+        for (size_t at = 0; at < es.size(); at += 181) {
+            odd.push_back({std::vector<uint8_t>(
+                               es.begin() + static_cast<long>(at),
+                               es.begin() + static_cast<long>(std::min(es.size(), at + 181))),
+                           at});
+        }
+        *onePerPes = extract(perPacket, layer);
+        const auto bytesOf = [](const std::vector<Unit>& units) {
+            std::vector<std::vector<uint8_t>> out;
+            for (const auto& u : units) {
+                out.push_back(u.bytes);
+            }
+            return out;
+        };
+        EXPECT_EQ(bytesOf(*onePerPes), bytesOf(extract(odd, layer))) << "odd cuts";
+        EXPECT_EQ(bytesOf(*onePerPes), bytesOf(extract(grouped, layer))) << "grouped";
+    }
+
+    // Units: the configuration first, then every reference unit but the first (whose
+    // place the configuration takes) and the last (held until a next header shows).
+    void expectUnits(const std::vector<Unit>& units,
+                     const std::vector<std::vector<uint8_t>>& reference,
+                     const std::vector<uint8_t>& referenceAsc) {
+        ASSERT_GE(reference.size(), 3u);
+        ASSERT_EQ(reference.size() - 1, units.size());
+        ASSERT_EQ(10u, units[0].bytes.size());
+        EXPECT_EQ(AACMediaExtractor::FLAG_CODEC_CONFIG, units[0].flags);
+        // FFmpeg's configuration carries its GASpecificConfig bits, which are zero for
+        // these streams, as the written configuration leaves them.
+        ASSERT_FALSE(referenceAsc.empty());
+        for (size_t i = 0; i < units[0].bytes.size(); ++i) {
+            EXPECT_EQ(i < referenceAsc.size() ? referenceAsc[i] : 0, units[0].bytes[i])
+                << "configuration byte " << i;
+        }
+        for (size_t i = 1; i < units.size(); ++i) {
+            EXPECT_EQ(0, units[i].flags);
+            ASSERT_EQ(reference[i], units[i].bytes) << "unit " << i;
+        }
+    }
+
+    // One line per unit against a checked-in dump; TAVO_UPDATE_GOLDEN=1 rewrites it.
+    void expectGolden(const std::string& name, const std::vector<Unit>& units) {
+        const std::string dump = test::dumpUnits(units);
+        const std::string path = std::string(TAVO_SOURCE_DIR) + "/tests/decoder/golden/" + name;
+        if (std::getenv("TAVO_UPDATE_GOLDEN") != nullptr) {
+            std::ofstream(path) << dump;
+        }
+        std::ifstream in(path);
+        ASSERT_TRUE(in.good()) << path;
+        std::stringstream golden;
+        golden << in.rdbuf();
+        EXPECT_EQ(golden.str(), dump);
+    }
+
+    bool ffmpeg(const std::string& args) {
+        return test::runCommand("ffmpeg -hide_banner -loglevel error -y " + args);
+    }
+
+    std::filesystem::path mDir;
+};
+
+TEST_F(AACReferenceTest, FfmpegAdtsAndLatmGiveFfmpegsUnits) {
+    const std::string adts = (mDir / "sine.adts").string();
+    const std::string latm = (mDir / "sine.latm").string();
+    ASSERT_TRUE(
+        ffmpeg("-f lavfi -i sine=frequency=440:sample_rate=48000:duration=3 -ac 2 "
+               "-c:a aac -b:a 128k -f adts " +
+               adts));
+    ASSERT_TRUE(ffmpeg("-i " + adts + " -c:a copy -f latm " + latm));
+
+    std::vector<std::vector<uint8_t>> reference;
+    std::vector<uint8_t> asc;
+    ASSERT_TRUE(adtsToRaw(adts, &reference, &asc));
+    ASSERT_GT(reference.size(), 100u);
+    EXPECT_EQ(0x11, asc[0]);  // AAC LC, 48 kHz, stereo
+
+    const Demuxed adtsPackets = demux(adts, "aac");
+    ASSERT_TRUE(adtsPackets.ok);
+    std::vector<Unit> units;
+    expectSameUnitsThreeWays(adtsPackets.packets, AACMediaExtractor::TRANSPORT_LAYER_ADTS, &units);
+    expectUnits(units, reference, asc);
+
+    const Demuxed latmPackets = demux(latm, "loas");
+    ASSERT_TRUE(latmPackets.ok);
+    ASSERT_EQ(reference.size(), latmPackets.packets.size());
+    expectSameUnitsThreeWays(latmPackets.packets, AACMediaExtractor::TRANSPORT_LAYER_LOAS, &units);
+    expectUnits(units, reference, asc);
+
+    const Decoded decoded = decodeRaw(units[0].bytes, units);
+    EXPECT_EQ(0, decoded.errors);
+    EXPECT_EQ(static_cast<int>(units.size()) - 1, decoded.frames);
+    EXPECT_EQ(48000, decoded.sampleRate);
+    EXPECT_EQ(2, decoded.channels);
+}
+
+TEST_F(AACReferenceTest, ExoPlayerAdtsSamples) {
+    const std::string plain = test::sharedStream("exoplayer_sample.adts");
+    const std::string withId3 = test::sharedStream("exoplayer_sample_with_id3.adts");
+    if (plain.empty() || withId3.empty()) {
+        GTEST_SKIP() << "sample streams not found in " << TAVO_SHARED_STREAMS_DIR;
+    }
+    std::vector<std::vector<uint8_t>> reference;
+    std::vector<uint8_t> asc;
+    ASSERT_TRUE(adtsToRaw(plain, &reference, &asc));
+    const Demuxed packets = demux(plain, "aac");
+    ASSERT_TRUE(packets.ok);
+    std::vector<Unit> units;
+    expectSameUnitsThreeWays(packets.packets, AACMediaExtractor::TRANSPORT_LAYER_ADTS, &units);
+    expectUnits(units, reference, asc);
+    EXPECT_EQ((std::vector<uint8_t>{0x12, 0x08}),
+              std::vector<uint8_t>(units[0].bytes.begin(), units[0].bytes.begin() + 2));
+    expectGolden("aac_exoplayer_sample_adts.txt", units);
+
+    // The same audio with ID3v2 tags: one before the first frame and one between the
+    // first and the second. The tags are skipped as junk; the first frame, followed
+    // by a tag instead of a sync word before sync is established, is not trusted, so
+    // the configuration takes the second frame's place and audio starts with the
+    // third. FFmpeg's demuxer knows ID3 and keeps the first frame.
+    std::vector<std::vector<uint8_t>> taggedReference;
+    std::vector<uint8_t> taggedAsc;
+    ASSERT_TRUE(adtsToRaw(withId3, &taggedReference, &taggedAsc));
+    EXPECT_EQ(asc, taggedAsc);
+    const std::vector<uint8_t> file = test::readFile(withId3);
+    ASSERT_FALSE(file.empty());
+    std::vector<test::PesChunk> records;
+    for (size_t at = 0; at < file.size(); at += 500) {
+        records.push_back({std::vector<uint8_t>(
+                               file.begin() + static_cast<long>(at),
+                               file.begin() + static_cast<long>(std::min(file.size(), at + 500))),
+                           at});
+    }
+    const auto tagged = extract(records, AACMediaExtractor::TRANSPORT_LAYER_ADTS);
+    ASSERT_EQ(taggedReference.size() - 2, tagged.size());
+    EXPECT_EQ(units[0].bytes, tagged[0].bytes);
+    for (size_t i = 1; i < tagged.size(); ++i) {
+        ASSERT_EQ(taggedReference[i + 1], tagged[i].bytes) << i;
+    }
+}
+
+TEST_F(AACReferenceTest, ExoPlayerLatmInTransportStream) {
+    const std::string path = test::sharedStream("exoplayer_sample_latm.ts");
+    if (path.empty()) {
+        GTEST_SKIP() << "sample stream not found in " << TAVO_SHARED_STREAMS_DIR;
+    }
+    const Demuxed ref = demux(path);
+    ASSERT_TRUE(ref.ok);
+    const auto pes = test::pesPayloadsOfPid(test::readFile(path), 0x100);
+    ASSERT_FALSE(pes.empty());
+    std::vector<test::PesChunk> records;
+    for (const auto& p : pes) {
+        records.push_back({p.es, p.pts});
+    }
+    const auto units = extract(records, AACMediaExtractor::TRANSPORT_LAYER_LOAS);
+
+    // FFmpeg's packets: one LOAS frame each. All but the first (the configuration's
+    // place) and the last (held) come out, with the PTS FFmpeg gives them.
+    ASSERT_GE(ref.packets.size(), 3u);
+    ASSERT_EQ(ref.packets.size() - 1, units.size());
+    // The stream has one PES for all its frames: later PTS are extrapolated with a
+    // whole number of ticks per frame (4179 for 1024 samples at 22.05 kHz) where
+    // FFmpeg rounds 4179.59, so they may fall behind by up to a tick per frame.
+    for (size_t i = 1; i < units.size(); ++i) {
+        EXPECT_NEAR(static_cast<double>(ref.packets[i].pts), static_cast<double>(units[i].pts),
+                    static_cast<double>(i))
+            << i;
+        EXPECT_LT(units[i].bytes.size(), ref.packets[i].bytes.size()) << i;
+    }
+    // FFmpeg's configuration: HE-AAC signalled hierarchically; the written one has
+    // the same leading 26 bits (object type 5, core index, channels, extension index,
+    // core object type).
+    ASSERT_GE(ref.extradata.size(), 4u);
+    EXPECT_EQ(ref.extradata[0], units[0].bytes[0]);
+    EXPECT_EQ(ref.extradata[1], units[0].bytes[1]);
+    EXPECT_EQ(ref.extradata[2], units[0].bytes[2]);
+    EXPECT_EQ(ref.extradata[3] & 0xC0, units[0].bytes[3] & 0xC0);
+
+    // FFmpeg's decoder takes the units with the written configuration and finds what
+    // its own demuxer reports for the stream.
+    const Decoded decoded = decodeRaw(units[0].bytes, units);
+    EXPECT_EQ(0, decoded.errors);
+    EXPECT_EQ(static_cast<int>(units.size()) - 1, decoded.frames);
+    EXPECT_EQ(ref.sampleRate, decoded.sampleRate);
+    expectGolden("aac_exoplayer_sample_latm_ts.txt", units);
+    EXPECT_EQ(ref.channels, decoded.channels);
+}
+
+}  // namespace
+}  // namespace TavoPlayer

@@ -10,6 +10,9 @@
 //
 // The source is opened by the first startFiltering() and closed, its thread joined,
 // when the last filter stops; the next startFiltering() reads the property again.
+// Packets start to flow at the first select() or readData() after the source
+// opened, so that the filters a reader starts together (the TS receiver starts all
+// of its PIDs before its thread selects) all see the stream from the same packet.
 //
 // Locks: mControlLock serialises startFiltering/stopFiltering (and with them the
 // source's lifetime); mLock guards the filters and their queues, and is what
@@ -93,6 +96,9 @@ private:
     // Source thread: hands `count` aligned packets to the filters.
     void deliver(const uint8_t* packets, size_t count);
     void noteEnded();
+    // Source thread: waits (at most `timeoutMs`) until a reader has asked for data.
+    // Returns true when packets may flow.
+    bool waitUntilFlowing(int timeoutMs);
 
     std::mutex mControlLock;
     std::unique_ptr<DemuxSource> mSource;  // mControlLock
@@ -102,12 +108,14 @@ private:
     mutable std::mutex mLock;
     std::condition_variable mDataReady;  // a filter got packets
     std::condition_variable mRoomReady;  // a filter was read (overflow=wait)
+    std::condition_variable mFlowing;    // the first reader arrived, or stop
     std::array<std::unique_ptr<Filter>, kDemuxMaxHandles> mFilters;  // mLock, by handle
     std::vector<std::vector<Filter*>> mPidFilters;                   // mLock, by PID
     size_t mFilterCount = 0;                                         // mLock
     int mNextHandle = 0;                                             // mLock
     bool mStopping = false;                                          // mLock
     bool mEnded = false;                                             // mLock
+    bool mReaderArrived = false;                                     // mLock
 
     std::atomic<uint64_t> mPackets{0};
     std::atomic<uint64_t> mSyncLosses{0};

@@ -76,6 +76,8 @@ private:
             finish();
             return false;
         }
+        if (!mDemux.waitUntilFlowing(kReadTimeoutMs))
+            return true;
         const ssize_t n = mSource.read(mBuffer.data(), mBuffer.size(), kReadTimeoutMs);
         mPackets.clear();
         if (n > 0) {
@@ -209,6 +211,7 @@ int Demux::openSource_c() {
         mSpec = spec;
         mStopping = false;
         mEnded = false;
+        mReaderArrived = false;
     }
     mPackets = 0;
     mSyncLosses = 0;
@@ -231,6 +234,7 @@ void Demux::closeSource_c() {
         std::lock_guard<std::mutex> lock(mLock);
         mStopping = true;
         mRoomReady.notify_all();
+        mFlowing.notify_all();
     }
     mThread->requestExit();
     mThread->wake();
@@ -332,6 +336,10 @@ int Demux::select(DemuxHandleSet* set, int timeoutMs) {
     const auto deadline =
         std::chrono::steady_clock::now() + std::chrono::milliseconds(std::max(timeoutMs, 0));
     std::unique_lock<std::mutex> lock(mLock);
+    if (!mReaderArrived) {
+        mReaderArrived = true;
+        mFlowing.notify_all();
+    }
     for (;;) {
         DemuxHandleSet ready{};
         int count = 0;
@@ -426,6 +434,12 @@ void Demux::deliver(const uint8_t* packets, size_t count) {
     }
     if (delivered)
         mDataReady.notify_all();
+}
+
+bool Demux::waitUntilFlowing(int timeoutMs) {
+    std::unique_lock<std::mutex> lock(mLock);
+    return mFlowing.wait_for(lock, std::chrono::milliseconds(timeoutMs),
+                             [this] { return mReaderArrived && !mStopping; });
 }
 
 void Demux::noteEnded() {

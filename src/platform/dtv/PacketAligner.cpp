@@ -99,17 +99,25 @@ size_t PacketAligner::process(bool finishing, std::vector<uint8_t>& out) {
             break;
         }
         const size_t next = mPos + mPacketSize;
-        const bool nextKnown = next < size;
-        if (mPending[mPos] != kSyncByte || (nextKnown && mPending[next] != kSyncByte)) {
-            // Either this packet does not start where it should or the next one does
-            // not follow it: the packet here is broken. Search again from the next byte.
+        const size_t afterNext = next + mPacketSize;
+        bool whole = mPending[mPos] == kSyncByte;
+        if (whole && next < size && mPending[next] != kSyncByte) {
+            // The next packet does not start where it should: either its own sync
+            // byte is damaged (the one after it is in place) or this packet was cut
+            // short and the bytes after it belong to another packet.
+            if (afterNext >= size && !finishing)
+                break;  // decide when it arrives
+            whole = afterNext < size && mPending[afterNext] == kSyncByte;
+        }
+        if (!whole) {
+            // Search again from the next byte.
             ++mSyncLosses;
             mPacketSize = 0;
             ++mPos;
             ++mBytesSkipped;
             continue;
         }
-        if (!nextKnown && !finishing)
+        if (next >= size && !finishing)
             break;  // wait for the next sync byte
         out.insert(out.end(), mPending.begin() + static_cast<std::ptrdiff_t>(mPos),
                    mPending.begin() + static_cast<std::ptrdiff_t>(mPos + kPacketSize));

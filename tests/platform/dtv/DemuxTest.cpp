@@ -1,0 +1,519 @@
+#include <arpa/inet.h>
+#include <netinet/in.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <gtest/gtest.h>
+
+#include <chrono>
+#include <cstdlib>
+#include <cstring>
+#include <filesystem>
+#include <fstream>
+#include <random>
+#include <set>
+#include <thread>
+
+#include "platform/dtv/Demux.h"
+#include "platform/dtv/DemuxBinder.h"
+#include "platform/dtv/DemuxTestUtil.h"
+#include "support/TraceCapture.h"
+
+namespace TavoPlayer {
+namespace {
+
+using namespace std::chrono_literals;
+using test::buildStream;
+using test::ScopedDemuxSource;
+using test::StreamPlan;
+using test::summary;
+using test::TempFile;
+using test::TraceCapture;
+using test::TsPacket;
+
+constexpr auto kDeadline = 20s;
+
+// Reads a filter until `packets` have arrived or the deadline passes.
+std::vector<TsPacket> readPackets(int handle, size_t packets,
+                                  std::chrono::milliseconds deadline = kDeadline) {
+    std::vector<TsPacket> got;
+    std::vector<uint8_t> buffer(188 * 50);
+    const auto end = std::chrono::steady_clock::now() + deadline;
+    while (got.size() < packets && std::chrono::steady_clock::now() < end) {
+        DemuxHandleSet set;
+        DemuxBinder_HandleZERO(&set);
+        DemuxBinder_HandleSET(handle, &set);
+        if (DemuxBinder_Select(&set, 30) <= 0)
+            continue;
+        const int n = DemuxBinder_ReadData(handle, buffer.data(), static_cast<int>(buffer.size()));
+        EXPECT_EQ(n % 188, 0);
+        for (int at = 0; at < n; at += 188) {
+            TsPacket p;
+            std::copy_n(buffer.begin() + at, 188, p.begin());
+            got.push_back(p);
+        }
+    }
+    return got;
+}
+
+// Every test leaves the demux with no filter, so the next one opens its own source.
+class DemuxTest : public ::testing::Test {
+protected:
+    void TearDown() override {
+        for (int handle : handles)
+            DemuxBinder_StopFiltering(handle);
+        EXPECT_FALSE(Demux::instance().sourceStats().open);
+    }
+    int start(uint16_t pid, int kind = kDemuxFilterPes) {
+        const int handle = DemuxBinder_StartFiltering(pid, kind);
+        if (handle >= 0)
+            handles.push_back(handle);
+        return handle;
+    }
+    void stop(int handle) {
+        std::erase(handles, handle);
+        EXPECT_EQ(DemuxBinder_StopFiltering(handle), 0);
+    }
+    std::vector<int> handles;
+};
+
+TEST(DemuxHandleSetTest, IsAValueOf132BytesWithOneBitPerHandle) {
+    static_assert(sizeof(DemuxHandleSet) == 132);
+    DemuxHandleSet set;
+    std::memset(&set, 0xAB, sizeof set);
+    DemuxBinder_HandleZERO(&set);
+    for (int h : {0, 31, 32, 1055}) {
+        EXPECT_FALSE(DemuxBinder_HandleISSET(h, &set)) << h;
+        DemuxBinder_HandleSET(h, &set);
+        EXPECT_TRUE(DemuxBinder_HandleISSET(h, &set)) << h;
+    }
+    const DemuxHandleSet copy = set;  // copied by value
+    DemuxBinder_HandleSET(-1, &set);  // a failed filter's handle changes nothing
+    DemuxBinder_HandleSET(1056, &set);
+    EXPECT_EQ(std::memcmp(&copy, &set, sizeof set), 0);
+    EXPECT_FALSE(DemuxBinder_HandleISSET(-1, &set));
+    EXPECT_FALSE(DemuxBinder_HandleISSET(1, &set));
+    EXPECT_FALSE(DemuxBinder_HandleISSET(1056, &set));
+}
+
+TEST_F(DemuxTest, FiltersGetEveryPacketOfTheirPidInOrderAndNoOther) {
+    StreamPlan plan;
+    plan.pids = {0x0, 0x100, 0x101, 0x130, 0x1FFF};
+    plan.rounds = 500;
+    plan.pcrPid = 0x100;
+    const std::vector<uint8_t> stream = buildStream(plan);
+    TempFile file(stream);
+    ScopedDemuxSource source("file:" + file.path() + "?pace=none");
+    auto expected = test::packetsByPid(stream);
+
+    const int video = start(0x100, kDemuxFilterVideo);
+    const int audio = start(0x101);
+    const int captions = start(0x130);
+    const int videoAgain = start(0x100, kDemuxFilterPcr);  // two filters on one PID
+    ASSERT_GE(video, 0);
+    ASSERT_GE(audio, 0);
+    ASSERT_GE(captions, 0);
+    ASSERT_GE(videoAgain, 0);
+    EXPECT_EQ(std::set<int>({video, audio, captions, videoAgain}).size(), 4u);
+
+    EXPECT_EQ(summary(readPackets(video, 500)), summary(expected[0x100]));
+    EXPECT_EQ(summary(readPackets(audio, 500)), summary(expected[0x101]));
+    EXPECT_EQ(summary(readPackets(captions, 500)), summary(expected[0x130]));
+    EXPECT_EQ(summary(readPackets(videoAgain, 500)), summary(expected[0x100]));
+    // Nothing more, and nothing of PIDs that no filter asked for.
+    EXPECT_TRUE(readPackets(video, 1, 200ms).empty());
+}
+
+TEST_F(DemuxTest, SelectReportsOnlyReadyHandlesAndTimesOutWithZero) {
+    StreamPlan plan;
+    plan.pids = {0x100};
+    plan.rounds = 3;
+    TempFile file(buildStream(plan));
+    ScopedDemuxSource source("file:" + file.path() + "?pace=none");
+    const int busy = start(0x100);
+    const int idle = start(0x200);
+    ASSERT_GE(busy, 0);
+    ASSERT_GE(idle, 0);
+
+    DemuxHandleSet set;
+    DemuxBinder_HandleZERO(&set);
+    DemuxBinder_HandleSET(busy, &set);
+    DemuxBinder_HandleSET(idle, &set);
+    DemuxBinder_HandleSET(1000, &set);  // not open: never ready
+    // Packets flow from the first select on; wait until the whole file is in.
+    ASSERT_TRUE(test::waitUntil(
+        [&] {
+            DemuxHandleSet probe = set;
+            return DemuxBinder_Select(&probe, 30) > 0 &&
+                   Demux::instance().sourceStats().packets == 3;
+        },
+        kDeadline));
+    EXPECT_EQ(DemuxBinder_Select(&set, 30), 1);
+    EXPECT_TRUE(DemuxBinder_HandleISSET(busy, &set));
+    EXPECT_FALSE(DemuxBinder_HandleISSET(idle, &set));
+    EXPECT_FALSE(DemuxBinder_HandleISSET(1000, &set));
+
+    std::vector<uint8_t> buffer(188 * 10);
+    EXPECT_EQ(DemuxBinder_ReadData(busy, buffer.data(), 188 * 2 + 100), 188 * 2);  // whole only
+    EXPECT_EQ(DemuxBinder_ReadData(busy, buffer.data(), 187), -EINVAL);
+    EXPECT_EQ(DemuxBinder_ReadData(busy, buffer.data(), 188), 188);
+    EXPECT_EQ(DemuxBinder_ReadData(busy, buffer.data(), 188), 0);
+    EXPECT_LT(DemuxBinder_ReadData(1000, buffer.data(), 188), 0);
+    EXPECT_LT(DemuxBinder_Select(nullptr, 30), 0);
+
+    DemuxBinder_HandleZERO(&set);
+    DemuxBinder_HandleSET(busy, &set);
+    DemuxBinder_HandleSET(idle, &set);
+    EXPECT_EQ(DemuxBinder_Select(&set, 30), 0);
+    EXPECT_FALSE(DemuxBinder_HandleISSET(busy, &set));
+}
+
+TEST_F(DemuxTest, SelectWakesWhenDataArrives) {
+    test::StdinPipe pipe;
+    ScopedDemuxSource source("stdin");
+    const int handle = start(0x100);
+    ASSERT_GE(handle, 0);
+    StreamPlan plan;
+    plan.pids = {0x100};
+    plan.rounds = 10;
+    std::thread writer([&] {
+        std::this_thread::sleep_for(100ms);
+        pipe.write(buildStream(plan));
+    });
+    DemuxHandleSet set;
+    DemuxBinder_HandleZERO(&set);
+    DemuxBinder_HandleSET(handle, &set);
+    // The time-out is far longer than the test; only the data can end this wait.
+    const auto before = std::chrono::steady_clock::now();
+    EXPECT_EQ(DemuxBinder_Select(&set, 60'000), 1);
+    EXPECT_LT(std::chrono::steady_clock::now() - before, 30s);
+    writer.join();
+    // The last packet waits for the sync byte of the next one (or the end of the
+    // stream), so that a packet cut short is never delivered.
+    EXPECT_EQ(readPackets(handle, 9).size(), 9u);
+}
+
+TEST_F(DemuxTest, StdinSourceEndsAtEndOfFile) {
+    test::StdinPipe pipe;
+    ScopedDemuxSource source("stdin");
+    const int handle = start(0x100);
+    ASSERT_GE(handle, 0);
+    StreamPlan plan;
+    plan.pids = {0x100, 0x101};
+    plan.rounds = 40;
+    const std::vector<uint8_t> stream = buildStream(plan);
+    pipe.write(stream);
+    pipe.closeWriter();
+    EXPECT_EQ(readPackets(handle, 40), test::packetsByPid(stream)[0x100]);
+    EXPECT_TRUE(test::waitUntil([] { return Demux::instance().sourceStats().ended; }, kDeadline));
+}
+
+TEST_F(DemuxTest, SlowFilterDropsItsOldestPacketsWithoutHoldingBackTheOthers) {
+    // One second at its PCR pace (a PCR every 10 ms): a reader keeps up easily.
+    StreamPlan plan;
+    plan.pids = {0x100, 0x101};
+    plan.rounds = 100;
+    plan.pcrPid = 0x101;
+    plan.pcrIntervalMs = 10;
+    const std::vector<uint8_t> stream = buildStream(plan);
+    TempFile file(stream);
+    ScopedDemuxSource source("file:" + file.path() + "?queue=16");
+    TraceCapture trace;
+    const int slow = start(0x100);
+    const int fast = start(0x101);
+    ASSERT_GE(slow, 0);
+    ASSERT_GE(fast, 0);
+    auto expected = test::packetsByPid(stream);
+    // The fast one reads as it goes; it gets everything in order.
+    EXPECT_EQ(summary(readPackets(fast, 100)), summary(expected[0x101]));
+    ASSERT_TRUE(test::waitUntil([] { return Demux::instance().sourceStats().ended; }, kDeadline));
+    Demux::FilterStats stats;
+    ASSERT_TRUE(Demux::instance().filterStats(slow, &stats));
+    EXPECT_EQ(stats.received, 100u);
+    EXPECT_EQ(stats.dropped, 84u);
+    EXPECT_EQ(stats.queued, 16u);
+    // What is left is the newest sixteen, in order.
+    const std::vector<TsPacket> left = readPackets(slow, 16);
+    EXPECT_EQ(summary(left),
+              summary(std::vector<TsPacket>(expected[0x100].end() - 16, expected[0x100].end())));
+    EXPECT_TRUE(trace.contains("PID 256 is not read fast enough"));
+    stop(slow);
+    EXPECT_TRUE(trace.contains("PID 256 (handle"));
+    EXPECT_TRUE(trace.contains("lost 84 packets"));
+}
+
+TEST_F(DemuxTest, UnpacedFileWaitsForASlowReaderInsteadOfDropping) {
+    StreamPlan plan;
+    plan.pids = {0x100};
+    plan.rounds = 200;
+    const std::vector<uint8_t> stream = buildStream(plan);
+    TempFile file(stream);
+    ScopedDemuxSource source("file:" + file.path() + "?pace=none&queue=16");
+    const int handle = start(0x100);
+    ASSERT_GE(handle, 0);
+    std::vector<TsPacket> got;
+    std::vector<uint8_t> buffer(188 * 3);
+    while (got.size() < 200) {
+        std::this_thread::sleep_for(1ms);  // a reader much slower than the file
+        const auto more = readPackets(handle, 1);
+        ASSERT_FALSE(more.empty());
+        got.insert(got.end(), more.begin(), more.end());
+    }
+    EXPECT_EQ(summary(got), summary(test::toPackets(stream)));
+    Demux::FilterStats stats;
+    ASSERT_TRUE(Demux::instance().filterStats(handle, &stats));
+    EXPECT_EQ(stats.dropped, 0u);
+}
+
+TEST_F(DemuxTest, LoopingFileStartsAgainAtTheEnd) {
+    StreamPlan plan;
+    plan.pids = {0x100};
+    plan.rounds = 10;
+    const std::vector<uint8_t> stream = buildStream(plan);
+    TempFile file(stream);
+    ScopedDemuxSource source("file:" + file.path() + "?pace=none&loop=1");
+    const int handle = start(0x100);
+    ASSERT_GE(handle, 0);
+    const std::vector<TsPacket> got = readPackets(handle, 35);
+    ASSERT_GE(got.size(), 35u);
+    const std::vector<TsPacket> once = test::toPackets(stream);
+    for (size_t i = 0; i < got.size(); ++i) {
+        EXPECT_EQ(summary({got[i]}), summary({once[i % 10]})) << i;
+    }
+}
+
+TEST_F(DemuxTest, ANewSourceIsReadAfterTheLastFilterStops) {
+    StreamPlan first;
+    first.pids = {0x100};
+    first.rounds = 5;
+    StreamPlan second = first;
+    second.firstSequence = 1000;
+    const std::vector<uint8_t> a = buildStream(first);
+    const std::vector<uint8_t> b = buildStream(second);
+    TempFile fileA(a);
+    TempFile fileB(b);
+    ScopedDemuxSource source("file:" + fileA.path() + "?pace=none");
+    int handle = start(0x100);
+    ASSERT_GE(handle, 0);
+    EXPECT_EQ(summary(readPackets(handle, 5)), summary(test::toPackets(a)));
+    stop(handle);
+    EXPECT_FALSE(Demux::instance().sourceStats().open);
+    source.set("file:" + fileB.path() + "?pace=none");
+    handle = start(0x100);
+    ASSERT_GE(handle, 0);
+    EXPECT_EQ(summary(readPackets(handle, 5)), summary(test::toPackets(b)));
+}
+
+// --- pacing ---------------------------------------------------------------------
+
+double secondsToRead(const std::string& source, const std::vector<uint8_t>& stream,
+                     size_t packets) {
+    ScopedDemuxSource scoped(source);
+    const int handle = DemuxBinder_StartFiltering(0x101, kDemuxFilterPes);
+    EXPECT_GE(handle, 0);
+    const auto before = std::chrono::steady_clock::now();
+    const size_t got = readPackets(handle, packets, 30s).size();
+    const double seconds =
+        std::chrono::duration<double>(std::chrono::steady_clock::now() - before).count();
+    EXPECT_EQ(got, packets);
+    DemuxBinder_StopFiltering(handle);
+    (void)stream;
+    return seconds;
+}
+
+TEST_F(DemuxTest, FileIsReleasedAtThePaceOfItsPcr) {
+    // Three seconds of stream: a PCR every 40 ms on 0x100, 20 packets of 0x101
+    // between two PCRs (about 0.75 Mbit/s).
+    StreamPlan plan;
+    plan.pids = {0x100};
+    for (int i = 0; i < 20; ++i)
+        plan.pids.push_back(0x101);
+    plan.pcrPid = 0x100;
+    plan.pcrIntervalMs = 40;
+    plan.rounds = 76;  // 75 intervals: 3.0 s from the first PCR to the last
+    const std::vector<uint8_t> stream = buildStream(plan);
+    TempFile file(stream);
+    const size_t packets = 76 * 20;
+    const double paced = secondsToRead("file:" + file.path(), stream, packets);
+    const double unpaced = secondsToRead("file:" + file.path() + "?pace=none", stream, packets);
+    EXPECT_GT(paced, 2.0);
+    EXPECT_LT(paced, 6.0);
+    EXPECT_LT(unpaced, paced / 4);
+}
+
+TEST_F(DemuxTest, PacedLoopCarriesOnAcrossTheRestart) {
+    // One second of stream played twice must take about two seconds: the PCR going
+    // back at the restart neither stalls the second pass nor sends it in a burst.
+    StreamPlan plan;
+    plan.pids = {0x100, 0x101, 0x101, 0x101};
+    plan.pcrPid = 0x100;
+    plan.pcrIntervalMs = 40;
+    plan.rounds = 26;
+    const std::vector<uint8_t> stream = buildStream(plan);
+    TempFile file(stream);
+    const double seconds = secondsToRead("file:" + file.path() + "?loop=1", stream, 26 * 3 * 2);
+    EXPECT_GT(seconds, 1.4);
+    EXPECT_LT(seconds, 5.0);
+}
+
+// --- bad input ------------------------------------------------------------------
+
+TEST_F(DemuxTest, SourceThatCannotBeOpenedGivesANegativeHandleAndSaysWhy) {
+    const struct {
+        const char* source;
+        const char* message;
+    } cases[] = {
+        {"file:/nonexistent/tavo.ts", "cannot open TS file /nonexistent/tavo.ts"},
+        {"dvb:99", "cannot open DVB demux /nonexistent/dvb/adapter99/demux0"},
+        {"dvb:0.7?queue=64", "demux7"},
+        {"udp://300.1.1.1:1234", "cannot resolve UDP address 300.1.1.1"},
+        {"tcp://host:1", "unknown source"},
+        {"", "no demux source"},
+    };
+    setenv("TAVOPLAYER_DVB_ROOT", "/nonexistent/dvb", 1);
+    for (const auto& c : cases) {
+        TraceCapture trace;
+        ScopedDemuxSource source(c.source);
+        EXPECT_LT(DemuxBinder_StartFiltering(0x100, kDemuxFilterPes), 0) << c.source;
+        EXPECT_TRUE(trace.contains(c.message)) << c.source << "\n" << trace.all();
+        EXPECT_FALSE(Demux::instance().sourceStats().open) << c.source;
+    }
+    unsetenv("TAVOPLAYER_DVB_ROOT");
+    EXPECT_LT(DemuxBinder_StartFiltering(0x2000, kDemuxFilterPes), 0);
+    EXPECT_LT(DemuxBinder_StopFiltering(17), 0);
+}
+
+TEST_F(DemuxTest, DvbDeviceThatIsNoDemuxRefusesTheFilter) {
+    // A regular file where the demux device should be: it opens, but it does not
+    // take the filter ioctl, and the demux says so and hands out no handle.
+    const std::filesystem::path root =
+        std::filesystem::temp_directory_path() / ("tavo_dvb_" + std::to_string(getpid()));
+    std::filesystem::create_directories(root / "adapter3");
+    std::ofstream(root / "adapter3" / "demux1") << "not a device";
+    setenv("TAVOPLAYER_DVB_ROOT", root.c_str(), 1);
+    TraceCapture trace;
+    {
+        ScopedDemuxSource source("dvb:3.1");
+        EXPECT_LT(DemuxBinder_StartFiltering(0x111, kDemuxFilterVideo), 0);
+    }
+    unsetenv("TAVOPLAYER_DVB_ROOT");
+    std::filesystem::remove_all(root);
+    EXPECT_TRUE(trace.contains("DMX_SET_PES_FILTER for PID 273")) << trace.all();
+    EXPECT_FALSE(Demux::instance().sourceStats().open);
+}
+
+TEST_F(DemuxTest, GarbageBetweenPacketsIsSkippedAndTheRestDelivered) {
+    StreamPlan plan;
+    plan.pids = {0x100, 0x101};
+    plan.rounds = 50;
+    const std::vector<uint8_t> clean = buildStream(plan);
+    std::vector<uint8_t> dirty;
+    std::mt19937 random(3);
+    for (size_t i = 0; i < clean.size(); i += 188) {
+        dirty.insert(dirty.end(), clean.begin() + i, clean.begin() + i + 188);
+        if (i / 188 % 10 == 9) {
+            for (int k = 0; k < 77; ++k)
+                dirty.push_back(static_cast<uint8_t>(random()));
+        }
+    }
+    dirty.resize(dirty.size() - 100);  // and a truncated last packet
+    TempFile file(dirty);
+    TraceCapture trace;
+    ScopedDemuxSource source("file:" + file.path() + "?pace=none");
+    const int handle = start(0x100);
+    ASSERT_GE(handle, 0);
+    auto expected = test::packetsByPid(clean)[0x100];
+    const std::vector<TsPacket> got = readPackets(handle, 50, 3s);
+    // Only the truncated last packet (of 0x101, cut to 165 bytes with the garbage
+    // after it) is lost; 0x100 comes through whole.
+    EXPECT_EQ(summary(got), summary(expected));
+    ASSERT_TRUE(test::waitUntil([] { return Demux::instance().sourceStats().ended; }, kDeadline));
+    EXPECT_GT(Demux::instance().sourceStats().bytesSkipped, 0u);
+    EXPECT_TRUE(trace.contains("TS sync lost on file")) << trace.all();
+    EXPECT_TRUE(trace.contains("ends with 165 bytes that are no whole TS packet")) << trace.all();
+}
+
+TEST_F(DemuxTest, FileThatIsNoTransportStreamIsReportedAndDeliversNothing) {
+    std::vector<uint8_t> text;
+    const std::string line = "this is a text file, not a transport stream\n";
+    for (int i = 0; i < 500; ++i)
+        text.insert(text.end(), line.begin(), line.end());
+    TempFile file(text, ".txt");
+    TraceCapture trace;
+    ScopedDemuxSource source("file:" + file.path());
+    const int handle = start(0x100);
+    ASSERT_GE(handle, 0);  // the file opens; it just holds no packets
+    EXPECT_TRUE(readPackets(handle, 1, 100ms).empty());
+    ASSERT_TRUE(test::waitUntil([] { return Demux::instance().sourceStats().ended; }, kDeadline));
+    EXPECT_TRUE(readPackets(handle, 1, 100ms).empty());
+    EXPECT_TRUE(trace.contains("held no TS packets")) << trace.all();
+}
+
+// --- UDP ------------------------------------------------------------------------
+
+class UdpSender {
+public:
+    explicit UdpSender(int port) : mFd(socket(AF_INET, SOCK_DGRAM, 0)) {
+        mTo.sin_family = AF_INET;
+        mTo.sin_port = htons(static_cast<uint16_t>(port));
+        mTo.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+    }
+    ~UdpSender() { close(mFd); }
+    void send(const uint8_t* data, size_t size) {
+        ASSERT_EQ(sendto(mFd, data, size, 0, reinterpret_cast<sockaddr*>(&mTo), sizeof mTo),
+                  static_cast<ssize_t>(size));
+    }
+
+private:
+    int mFd;
+    sockaddr_in mTo{};
+};
+
+TEST_F(DemuxTest, UdpDatagramsOfOneToSevenPacketsArriveIntact) {
+    const int port = test::freeUdpPort();
+    ScopedDemuxSource source("udp://127.0.0.1:" + std::to_string(port));
+    TraceCapture trace;
+    const int handle = start(0x100);
+    const int other = start(0x101);
+    ASSERT_GE(handle, 0);
+    ASSERT_GE(other, 0);
+    StreamPlan plan;
+    plan.pids = {0x100, 0x101};
+    plan.rounds = 140;
+    const std::vector<uint8_t> stream = buildStream(plan);
+    UdpSender sender(port);
+    size_t at = 0;
+    for (size_t n = 1; at < stream.size(); n = n % 7 + 1) {
+        const size_t bytes = std::min(n * 188, stream.size() - at);
+        sender.send(stream.data() + at, bytes);
+        at += bytes;
+        // Loopback drops nothing while the receive buffer has room; give the
+        // source thread a moment now and then all the same.
+        if (n == 7)
+            std::this_thread::sleep_for(1ms);
+    }
+    // Then a datagram that is not whole packets: its whole packets are kept, the
+    // rest dropped and reported, and the next datagram is aligned as ever.
+    StreamPlan more = plan;
+    more.firstSequence = 140;
+    more.rounds = 4;
+    const std::vector<uint8_t> next = buildStream(more);  // 8 packets
+    std::vector<uint8_t> bad(next.begin(), next.begin() + 4 * 188);
+    bad.resize(bad.size() + 60, 0x47);
+    sender.send(bad.data(), bad.size());
+    sender.send(next.data() + 4 * 188, 4 * 188);
+
+    std::vector<uint8_t> all = stream;
+    all.insert(all.end(), next.begin(), next.end());
+    auto expected = test::packetsByPid(all);
+    EXPECT_EQ(summary(readPackets(handle, 144)), summary(expected[0x100]));
+    // The very last packet waits for a sync byte after it that never comes.
+    expected[0x101].pop_back();
+    EXPECT_EQ(summary(readPackets(other, 143)), summary(expected[0x101]));
+    EXPECT_TRUE(trace.contains("UDP datagram of 812 bytes is not a whole number of TS packets"))
+        << trace.all();
+}
+
+}  // namespace
+}  // namespace TavoPlayer

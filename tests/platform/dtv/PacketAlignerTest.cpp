@@ -1,0 +1,174 @@
+#include "platform/dtv/PacketAligner.h"
+
+#include <gtest/gtest.h>
+
+#include <random>
+
+#include "platform/dtv/DemuxTestUtil.h"
+
+namespace TavoPlayer {
+namespace {
+
+using test::buildStream;
+using test::StreamPlan;
+
+std::vector<uint8_t> cleanStream(size_t rounds = 20) {
+    StreamPlan plan;
+    plan.pids = {0x100, 0x101, 0x47};  // a PID whose low byte is the sync byte
+    plan.rounds = rounds;
+    return buildStream(plan);
+}
+
+// Feeds `bytes` in pieces of `piece` bytes (0: all at once) and finishes.
+std::vector<uint8_t> align(PacketAligner& aligner, const std::vector<uint8_t>& bytes, size_t piece,
+                           size_t* dropped = nullptr) {
+    std::vector<uint8_t> out;
+    if (piece == 0)
+        piece = bytes.size();
+    for (size_t at = 0; at < bytes.size(); at += piece) {
+        aligner.push(bytes.data() + at, std::min(piece, bytes.size() - at), out);
+    }
+    const size_t d = aligner.finish(out);
+    if (dropped != nullptr)
+        *dropped = d;
+    return out;
+}
+
+class PacketAlignerPieces : public ::testing::TestWithParam<size_t> {};
+
+TEST_P(PacketAlignerPieces, CleanStreamComesOutUnchangedWhateverThePieceSize) {
+    const std::vector<uint8_t> stream = cleanStream();
+    PacketAligner aligner;
+    size_t dropped = 99;
+    EXPECT_EQ(align(aligner, stream, GetParam(), &dropped), stream);
+    EXPECT_EQ(dropped, 0u);
+    EXPECT_EQ(aligner.syncLosses(), 0u);
+    EXPECT_EQ(aligner.bytesSkipped(), 0u);
+}
+
+INSTANTIATE_TEST_SUITE_P(Pieces, PacketAlignerPieces,
+                         ::testing::Values(1, 7, 187, 188, 189, 376, 1000, 0));
+
+// One fault each: the packets that are whole come out, the broken ones do not.
+struct Fault {
+    const char* name;
+    std::function<std::vector<uint8_t>(const std::vector<uint8_t>&)> apply;
+    size_t expectedPackets;  // of the 60 in the clean stream
+    bool expectLoss;
+};
+
+class PacketAlignerFaults : public ::testing::TestWithParam<Fault> {};
+
+TEST_P(PacketAlignerFaults, RecoversAndDeliversOnlyWholePackets) {
+    const std::vector<uint8_t> clean = cleanStream();
+    const std::vector<uint8_t> damaged = GetParam().apply(clean);
+    for (size_t piece : {size_t{1}, size_t{100}, size_t{0}}) {
+        PacketAligner aligner;
+        const std::vector<uint8_t> out = align(aligner, damaged, piece);
+        ASSERT_EQ(out.size() % 188, 0u);
+        EXPECT_EQ(out.size() / 188, GetParam().expectedPackets) << "piece " << piece;
+        // Every packet out is one of the clean packets, in the original order.
+        size_t from = 0;
+        for (size_t i = 0; i < out.size(); i += 188) {
+            bool found = false;
+            for (; from < clean.size(); from += 188) {
+                if (std::equal(out.begin() + i, out.begin() + i + 188, clean.begin() + from)) {
+                    found = true;
+                    from += 188;
+                    break;
+                }
+            }
+            ASSERT_TRUE(found) << "packet " << i / 188 << " is not a clean packet in order";
+        }
+        if (GetParam().expectLoss)
+            EXPECT_GT(aligner.bytesSkipped(), 0u);
+    }
+}
+
+std::vector<uint8_t> insertAt(std::vector<uint8_t> bytes, size_t at, std::vector<uint8_t> junk) {
+    bytes.insert(bytes.begin() + static_cast<std::ptrdiff_t>(at), junk.begin(), junk.end());
+    return bytes;
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Faults, PacketAlignerFaults,
+    ::testing::Values(Fault{"GarbageBeforeTheFirstPacket",
+                            [](const std::vector<uint8_t>& s) {
+                                return insertAt(s, 0, {1, 2, 0x47, 4, 5, 0x47, 0, 0, 9});
+                            },
+                            60, true},
+                      Fault{"GarbageBetweenPackets",
+                            [](const std::vector<uint8_t>& s) {
+                                return insertAt(s, 188 * 10, std::vector<uint8_t>(33, 0x47));
+                            },
+                            60, true},
+                      Fault{"PacketCutShortInTheMiddle",
+                            [](const std::vector<uint8_t>& s) {
+                                std::vector<uint8_t> d = s;
+                                d.erase(d.begin() + 188 * 5 + 100, d.begin() + 188 * 6);
+                                return d;
+                            },
+                            59, true},
+                      Fault{"TruncatedLastPacket",
+                            [](const std::vector<uint8_t>& s) {
+                                return std::vector<uint8_t>(s.begin(), s.end() - 50);
+                            },
+                            59, true},
+                      Fault{"LostSyncByte",
+                            [](const std::vector<uint8_t>& s) {
+                                std::vector<uint8_t> d = s;
+                                d[188 * 30] = 0x00;
+                                return d;
+                            },
+                            59, true}),
+    [](const ::testing::TestParamInfo<Fault>& info) { return std::string(info.param.name); });
+
+TEST(PacketAlignerTest, TruncatedLastPacketIsReportedByFinish) {
+    const std::vector<uint8_t> clean = cleanStream(2);
+    std::vector<uint8_t> cut(clean.begin(), clean.end() - 60);
+    PacketAligner aligner;
+    size_t dropped = 0;
+    const std::vector<uint8_t> out = align(aligner, cut, 500, &dropped);
+    EXPECT_EQ(out.size(), clean.size() - 188);
+    EXPECT_EQ(dropped, 128u);
+}
+
+TEST(PacketAlignerTest, PacketsOf204BytesLoseTheirTrailer) {
+    const std::vector<uint8_t> clean = cleanStream();
+    std::vector<uint8_t> rs;
+    for (size_t i = 0; i < clean.size(); i += 188) {
+        rs.insert(rs.end(), clean.begin() + i, clean.begin() + i + 188);
+        // An ISDB-T information trailer may well hold 0x47 bytes.
+        for (int k = 0; k < 16; ++k)
+            rs.push_back(k == 3 ? 0x47 : static_cast<uint8_t>(k));
+    }
+    for (size_t piece : {size_t{1}, size_t{204}, size_t{0}}) {
+        PacketAligner aligner;
+        EXPECT_EQ(align(aligner, rs, piece), clean) << "piece " << piece;
+        EXPECT_EQ(aligner.bytesSkipped(), 0u);
+    }
+}
+
+TEST(PacketAlignerTest, BytesThatAreNoTransportStreamGiveNoPackets) {
+    std::mt19937 random(7);
+    std::vector<uint8_t> noise(64 * 1024);
+    for (auto& b : noise)
+        b = static_cast<uint8_t>(random() % 0x47);  // no sync byte at all
+    PacketAligner aligner;
+    EXPECT_TRUE(align(aligner, noise, 4096).empty());
+    EXPECT_EQ(aligner.bytesSkipped(), noise.size());
+    EXPECT_EQ(aligner.packetsOut(), 0u);
+}
+
+TEST(PacketAlignerTest, HoldsTheLastPacketUntilTheNextSyncByteIsSeen) {
+    const std::vector<uint8_t> clean = cleanStream(1);  // 3 packets
+    PacketAligner aligner;
+    std::vector<uint8_t> out;
+    aligner.push(clean.data(), clean.size(), out);
+    EXPECT_EQ(out.size(), 2u * 188);  // the third waits for the byte after it
+    aligner.push(clean.data(), 1, out);
+    EXPECT_EQ(out.size(), 3u * 188);
+}
+
+}  // namespace
+}  // namespace TavoPlayer

@@ -339,7 +339,7 @@ TEST_F(TSParserModuleTest, CopiesReachEveryOutput) {
 TEST_F(TSParserModuleTest, CopyToOtherOutputsReportsAFullOne) {
     auto roomy = makeRing("roomy", 1 << 16);
     auto full = makeRing("full", 4096);
-    std::vector<uint8_t> record(1000, 0x5A);
+    std::vector<uint8_t> record(1001, 0x5A);
     struct CopyCase {
         const char* name;
         std::vector<android::sp<RingBuffer>> extra;

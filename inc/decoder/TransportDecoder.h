@@ -47,6 +47,9 @@ public:
     TransportDecoder& operator=(const TransportDecoder&) = delete;
 
     TRANSPORT_TYPE type() const { return mType; }
+    // The flags given at open (1 for ADTS as MPEG-4); kept for the caller, they change
+    // nothing in how frames are read.
+    uint32_t flags() const { return mFlags; }
     TRANSPORTDEC_ERROR setParam(TPDEC_PARAM param, int32_t value);
     TRANSPORTDEC_ERROR registerAscCallback(cbUpdateConfig_t callback, void* userData);
     // Takes bytes from buffer + (bufferSize - *bytesValid), as many as fit, and reduces

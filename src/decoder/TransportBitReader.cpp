@@ -67,6 +67,9 @@ void TransportBitReader::byteAlign() {
 }
 
 void TransportBitReader::readBytes(uint8_t* out, uint32_t count) {
+    if (count == 0) {
+        return;
+    }
     const uint64_t bits = static_cast<uint64_t>(count) * 8u;
     if (bits > mSizeBits - mPositionBits) {
         mOverrun = true;

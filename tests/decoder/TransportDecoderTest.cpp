@@ -433,6 +433,60 @@ TEST_F(TransportDecoderHoldBackTest, NextSyncWordConfirmsOnlyAfterALossOfSync) {
               errors);
 }
 
+// The decoder's own bounds-checked reader.
+class TransportBitReaderTest : public ::testing::Test {
+protected:
+    const std::vector<uint8_t> kBytes = {0xA5, 0x3C, 0xFF, 0x01, 0x80};
+};
+
+TEST_F(TransportBitReaderTest, ReadsFieldsMsbFirstAcrossBytes) {
+    struct Row {
+        unsigned int skip;
+        unsigned int count;
+        uint32_t value;
+    };
+    for (const Row& row :
+         {Row{0, 8, 0xA5}, Row{4, 8, 0x53}, Row{3, 13, 0x053C}, Row{0, 32, 0xA53CFF01},
+          Row{7, 32, 0x9E7F80C0}, Row{39, 1, 0}, Row{32, 1, 1}}) {
+        TransportBitReader r(kBytes.data(), static_cast<uint32_t>(kBytes.size()));
+        r.skipBits(row.skip);
+        EXPECT_EQ(row.value, r.peekBits(row.count)) << row.skip << "+" << row.count;
+        EXPECT_EQ(row.value, r.readBits(row.count)) << row.skip << "+" << row.count;
+        EXPECT_EQ(row.skip + row.count, r.bitPosition());
+        EXPECT_FALSE(r.overrun());
+    }
+}
+
+TEST_F(TransportBitReaderTest, ReadingPastTheEndLatchesOverrunWithoutMoving) {
+    TransportBitReader r(kBytes.data(), static_cast<uint32_t>(kBytes.size()));
+    r.skipBits(36);
+    EXPECT_EQ(0u, r.readBits(5));
+    EXPECT_TRUE(r.overrun());
+    EXPECT_EQ(36u, r.bitPosition());
+    EXPECT_EQ(0u, r.readBits(4));  // the field that fits still reads (zero bits here)
+    EXPECT_EQ(40u, r.bitPosition());
+    uint8_t out[2] = {0x11, 0x22};
+    r.readBytes(out, 1);
+    EXPECT_EQ(0x11, out[0]) << "nothing copied past the end";
+    r.readBytes(nullptr, 0);  // an empty copy is no overrun and touches nothing
+    EXPECT_EQ(40u, r.bitPosition());
+}
+
+TEST_F(TransportBitReaderTest, ReadsBytesAtAnyBitOffset) {
+    for (unsigned int offset = 0; offset < 8; ++offset) {
+        TransportBitReader r(kBytes.data(), static_cast<uint32_t>(kBytes.size()));
+        r.skipBits(offset);
+        uint8_t out[4] = {};
+        r.readBytes(out, 4);
+        TransportBitReader check(kBytes.data(), static_cast<uint32_t>(kBytes.size()));
+        check.skipBits(offset);
+        for (uint8_t b : out) {
+            EXPECT_EQ(check.readBits(8), b) << "offset " << offset;
+        }
+        EXPECT_EQ(offset + 32, r.bitPosition());
+    }
+}
+
 class TransportDecoderApiTest : public ::testing::Test {};
 
 TEST_F(TransportDecoderApiTest, OpensOnlyLoasAndAdtsWithOneLayer) {

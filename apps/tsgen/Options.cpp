@@ -252,7 +252,7 @@ int64_t Options::effectiveVideoBitrate() const {
     if (videoBitrate > 0) {
         return videoBitrate;
     }
-    // About 3.9 Mbit/s per 1080-line picture area at 30 Hz, at least 300 kbit/s.
+    // 8 Mbit/s for a 1920x1080 picture, scaled by area, at least 300 kbit/s.
     const double area = static_cast<double>(width) * height;
     const double rate = 8.0e6 * area / (1920.0 * 1080.0);
     return std::max<int64_t>(300000, static_cast<int64_t>(rate));
@@ -263,10 +263,11 @@ int64_t Options::effectiveAudioBitrate() const {
         return audioBitrate;
     }
     switch (audioCodec) {
+        // MPEG-2 low sampling rates (ISO/IEC 13818-3) allow at most 160 kbit/s.
         case AudioCodec::kMp2:
-            return 192000;
+            return audioRate >= 32000 ? 192000 : 96000;
         case AudioCodec::kMp3:
-            return 128000;
+            return audioRate >= 32000 ? 128000 : 64000;
         default:
             return audioChannels > 1 ? 128000 : 64000;
     }
@@ -309,7 +310,8 @@ Output and content:
       --audio CODEC          latm (default), adts, mp2, mp3 or none
       --audio-rate HZ        sampling rate (default 48000)
       --audio-channels N     1 or 2 (default 2)
-      --audio-bitrate BPS    audio bit rate (default 128000 AAC, 192000 MP2, 128000 MP3)
+      --audio-bitrate BPS    audio bit rate (default 128000 AAC, 192000 MP2, 128000 MP3;
+                             96000 MP2 and 64000 MP3 below 32 kHz)
       --audio-frames-per-pes N  audio frames in each PES packet (default 1)
       --tone-hz HZ           test tone frequency (default: from the seed)
       --caption SEC:TEXT     caption statement shown at SEC (repeatable); TEXT is UTF-8

@@ -166,51 +166,36 @@ TEST(H264SpsEditorTest, EmulationPreventionRoundTrip) {
     EXPECT_EQ(H264SpsEditor::toRbsp(ebsp.data(), ebsp.size()), rbsp);
 }
 
-TEST(H264SpsEditorTest, BaselineSpsLosesItsVui) {
-    // A Baseline SPS written bit by bit (ITU-T H.264, 7.3.2.1.1): 66, level 30,
-    // id 0, log2_max_frame_num-4 0, poc type 2, 1 ref, no gaps, 20x15 MBs,
-    // frame_mbs_only, direct_8x8, no cropping, VUI present with one flag byte.
+// A Baseline SPS written field by field (ITU-T H.264, 7.3.2.1.1): profile 66,
+// level 30, id 0, log2_max_frame_num - 4 = 0, POC type 2, one reference frame,
+// 20x15 macroblocks, frame_mbs_only, direct_8x8, no cropping; with VUI, a byte of
+// VUI flags follows.
+std::vector<uint8_t> baselineSps(bool withVui) {
     BitWriter w;
     w.putBits(0x67, 8);
     w.putBits(66, 8);
     w.putBits(0, 8);
     w.putBits(30, 8);
-    w.putUe(0);
-    w.putUe(0);
-    w.putUe(2);
-    w.putUe(1);
+    for (uint32_t ue : {0u, 0u, 2u, 1u}) {
+        w.putUe(ue);
+    }
     w.putBits(0, 1);
     w.putUe(19);
     w.putUe(14);
-    w.putBits(1, 1);
-    w.putBits(1, 1);
-    w.putBits(0, 1);
-    w.putBits(1, 1);            // vui_parameters_present_flag
-    w.putBits(0b000000000, 9);  // VUI flags that the edit must drop
-    w.putBits(1, 1);
+    w.putBits(0b110, 3);
+    w.putBits(withVui ? 1 : 0, 1);
+    if (withVui) {
+        w.putBits(0, 9);  // VUI flags, all clear
+    }
+    w.putBits(1, 1);  // rbsp_stop_one_bit
     w.alignZero();
-    std::vector<uint8_t> out;
-    ASSERT_EQ(H264SpsEditor::stripVuiFromNal(w.bytes(), out), 0);
+    return w.bytes();
+}
 
-    BitWriter expected;
-    expected.putBits(0x67, 8);
-    expected.putBits(66, 8);
-    expected.putBits(0, 8);
-    expected.putBits(30, 8);
-    expected.putUe(0);
-    expected.putUe(0);
-    expected.putUe(2);
-    expected.putUe(1);
-    expected.putBits(0, 1);
-    expected.putUe(19);
-    expected.putUe(14);
-    expected.putBits(1, 1);
-    expected.putBits(1, 1);
-    expected.putBits(0, 1);
-    expected.putBits(0, 1);  // no VUI
-    expected.putBits(1, 1);  // rbsp_stop_one_bit
-    expected.alignZero();
-    EXPECT_EQ(out, expected.bytes());
+TEST(H264SpsEditorTest, BaselineSpsLosesItsVui) {
+    std::vector<uint8_t> out;
+    ASSERT_EQ(H264SpsEditor::stripVuiFromNal(baselineSps(true), out), 0);
+    EXPECT_EQ(out, baselineSps(false));
 }
 
 TEST(H264SpsEditorTest, RejectsNonSpsAndTruncatedSps) {

@@ -16,6 +16,7 @@ struct AudioCase {
     const char* option;
     const char* codecName;  // as ffprobe names it
     uint8_t streamType;
+    const char* sampleRate = "48000";
 };
 
 class TsgenAudioCodecTest : public ::testing::TestWithParam<AudioCase> {};
@@ -41,7 +42,7 @@ TEST_P(TsgenAudioCodecTest, FfprobeFindsTheProgrammeAndItsStreams) {
     EXPECT_EQ(probe["streams.stream.0.r_frame_rate"], "30000/1001");
     EXPECT_EQ(probe["streams.stream.1.codec_name"], c.codecName);
     EXPECT_EQ(probe["streams.stream.1.id"], "0x112");
-    EXPECT_EQ(probe["streams.stream.1.sample_rate"], "48000");
+    EXPECT_EQ(probe["streams.stream.1.sample_rate"], c.sampleRate);
     EXPECT_EQ(probe["streams.stream.1.channels"], "2");
     EXPECT_EQ(probe["streams.stream.2.codec_name"], "arib_caption");
     EXPECT_EQ(probe["streams.stream.2.id"], "0x130");
@@ -63,12 +64,13 @@ TEST_P(TsgenAudioCodecTest, FfprobeFindsTheProgrammeAndItsStreams) {
     EXPECT_EQ(decode.err, "");
 }
 
-INSTANTIATE_TEST_SUITE_P(Codecs, TsgenAudioCodecTest,
-                         ::testing::Values(AudioCase{"Latm", "latm", "aac_latm", 0x11},
-                                           AudioCase{"Adts", "adts", "aac", 0x0F},
-                                           AudioCase{"Mp2", "mp2", "mp2", 0x03},
-                                           AudioCase{"Mp3", "mp3", "mp3", 0x03}),
-                         [](const auto& info) { return std::string(info.param.name); });
+INSTANTIATE_TEST_SUITE_P(
+    Codecs, TsgenAudioCodecTest,
+    ::testing::Values(AudioCase{"Latm", "latm", "aac_latm", 0x11},
+                      AudioCase{"Adts", "adts", "aac", 0x0F}, AudioCase{"Mp2", "mp2", "mp2", 0x03},
+                      AudioCase{"Mp3", "mp3", "mp3", 0x03},
+                      AudioCase{"Mp2HalfRate", "mp2 --audio-rate 24000", "mp2", 0x04, "24000"}),
+    [](const auto& info) { return std::string(info.param.name); });
 
 TEST(TsgenProgrammeTest, PidsProgramAndPictureAreConfigurable) {
     TempDir dir;
@@ -144,6 +146,31 @@ TEST(TsgenProgrammeTest, FullHdInterlacedIsTheDefault) {
     EXPECT_EQ(probe["streams.stream.0.height"], "1080");
     EXPECT_EQ(probe["streams.stream.0.field_order"], "tt");
     EXPECT_EQ(probe["streams.stream.1.codec_name"], "aac_latm");
+}
+
+TEST(TsgenProgrammeTest, DecodedPicturesShowTheirFrameNumber) {
+    TempDir dir;
+    const std::string file = dir.path("out.ts");
+    ASSERT_EQ(runTsgen(file, "-d 3 --size 640x360 --audio none").exitCode, 0);
+    // libavcodec decodes three pictures, in display order, as 8-bit luma.
+    const auto decoded =
+        runCommand("ffmpeg -nostdin -v error -i '" + file +
+                   "' -map 0:v -vf \"select='eq(n,0)+eq(n,37)+eq(n,89)'\" -vsync 0 -f rawvideo "
+                   "-pix_fmt gray -");
+    ASSERT_EQ(decoded.exitCode, 0) << decoded.err;
+    const size_t frameBytes = 640 * 360;
+    ASSERT_EQ(decoded.out.size(), 3 * frameBytes);
+    const int expected[] = {0, 37, 89};
+    for (int f = 0; f < 3; ++f) {
+        // 24 blocks of 16x16 on the second block row, most significant bit first.
+        int number = 0;
+        for (int bit = 0; bit < 24; ++bit) {
+            const size_t x = static_cast<size_t>((bit + 1) * 16 + 8);
+            const auto luma = static_cast<uint8_t>(decoded.out[f * frameBytes + 24 * 640 + x]);
+            number = (number << 1) | (luma > 128 ? 1 : 0);
+        }
+        EXPECT_EQ(number, expected[f]);
+    }
 }
 
 class TsgenDeterminismTest : public ::testing::Test {

@@ -1,0 +1,103 @@
+// Real captures (DVB, FFmpeg-muxed samples) through the TS parser module, one PID at
+// a time: every PES that a later unit start closes comes out as one record, its
+// header fields agree with the PES bytes it carries, and nothing is reported as
+// broken, because nothing in these files is.
+#include <gtest/gtest.h>
+
+#include <fstream>
+#include <string>
+#include <vector>
+
+#include "TsParserTestUtil.h"
+#include "support/TraceCapture.h"
+#include "tsparser/TSParser.h"
+
+namespace TavoPlayer {
+namespace {
+
+struct StreamCase {
+    const char* name;
+    const char* file;
+    uint16_t pid;
+    int kind;
+    uint8_t streamId;   // expected in every record
+    size_t unitStarts;  // PES starts on the PID (counted independently with a script)
+};
+
+class TSParserSharedStreamsTest : public ::testing::TestWithParam<StreamCase> {};
+
+TEST_P(TSParserSharedStreamsTest, EveryClosedPesIsOneConsistentRecord) {
+    const StreamCase& c = GetParam();
+    const std::string path = std::string(TAVO_SHARED_STREAMS_DIR) + "/" + c.file;
+    std::ifstream file(path, std::ios::binary);
+    if (!file)
+        GTEST_SKIP() << "shared sample streams not found at " << TAVO_SHARED_STREAMS_DIR;
+    const std::vector<uint8_t> ts((std::istreambuf_iterator<char>(file)),
+                                  std::istreambuf_iterator<char>());
+    std::vector<uint8_t> packets;
+    for (size_t at = 0; at + 188 <= ts.size(); at += 188) {
+        if (ts[at] == 0x47 && (((ts[at + 1] & 0x1F) << 8) | ts[at + 2]) == c.pid) {
+            packets.insert(packets.end(), ts.begin() + at, ts.begin() + at + 188);
+        }
+    }
+
+    test::TraceCapture trace;
+    auto input = test::makeRing("TS", 1 << 22);
+    auto output = test::makeRing("PES", 1 << 23);
+    android::sp<TSParser> parser = new TSParser(c.kind);
+    parser->setInput(input);
+    parser->addOutput(output, nullptr);
+    ASSERT_EQ(parser->start(), 0u);
+    ASSERT_TRUE(test::writeAll(*input, packets));
+    ASSERT_TRUE(test::waitConsumed(*input));
+    const auto records = test::drainRecords(*output);
+    EXPECT_EQ(parser->stop(), 0u);
+
+    EXPECT_EQ(records.size(), c.unitStarts - 1);
+    EXPECT_EQ(trace.count(TRACE_ERROR, ""), 0u) << trace.all();
+    for (size_t i = 0; i < records.size(); ++i) {
+        const auto& r = records[i];
+        ASSERT_GE(r.pes.size(), 6u) << i;
+        EXPECT_EQ(r.pes[0] | r.pes[1], 0) << i;
+        EXPECT_EQ(r.pes[2], 1) << i;
+        EXPECT_EQ(r.pes[3], c.streamId) << i;
+        EXPECT_EQ(r.size, 40u + r.pes.size()) << i;
+        const bool optionalHeader = PESPacketParser::hasOptionalHeader(c.streamId);
+        ASSERT_GE(r.pes.size(), optionalHeader ? 9u : 6u) << i;
+        EXPECT_EQ(r.offsetES, optionalHeader ? 40u + 9u + r.pes[8] : 46u) << i;
+        EXPECT_EQ(r.offsetES + r.sizeES, r.size) << i;
+        const uint16_t length = static_cast<uint16_t>((r.pes[4] << 8) | r.pes[5]);
+        if (length != 0) {
+            // Where the muxer gave a length, the assembled packet has exactly it.
+            EXPECT_EQ(r.pes.size(), 6u + length) << i;
+        }
+        if (optionalHeader && (r.pes[7] & 0x80)) {
+            const uint8_t* q = r.pes.data() + 9;
+            const uint64_t pts = (static_cast<uint64_t>(q[0] & 0x0E) << 29) | (q[1] << 22) |
+                                 ((q[2] >> 1) << 15) | (q[3] << 7) | (q[4] >> 1);
+            EXPECT_EQ(r.pts, pts) << i;
+        }
+    }
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Captures, TSParserSharedStreamsTest,
+    ::testing::Values(StreamCase{"DvbH264Video", "dvb_h264_1080_mpeg1audio_0x03.ts", 0x100,
+                                 TSParser::KIND_VIDEO, 0xE0, 299},
+                      StreamCase{"DvbMpeg1Audio", "dvb_h264_1080_mpeg1audio_0x03.ts", 0x101,
+                                 TSParser::KIND_AUDIO, 0xC0, 209},
+                      StreamCase{"DvbInterlacedVideo",
+                                 "dvb_h264_1080i_picstruct_sei_ac3_teletext.ts", 0x78,
+                                 TSParser::KIND_VIDEO, 0xE0, 29},
+                      StreamCase{"DvbAc3PrivateStream1",
+                                 "dvb_h264_1080i_picstruct_sei_ac3_teletext.ts", 0x82,
+                                 TSParser::KIND_AUDIO, 0xBD, 6},
+                      // A PID that carries nothing but 7-byte padding PES (stream id 0xBE).
+                      StreamCase{"DvbPaddingOnly", "dvb_h264_1080i_picstruct_sei_ac3_teletext.ts",
+                                 0x8E, TSParser::KIND_CLOSED_CAPTION, 0xBE, 3},
+                      StreamCase{"FfmpegH264", "exoplayer_sample_h264_mpeg_audio.ts", 0x100,
+                                 TSParser::KIND_VIDEO, 0xE0, 3}),
+    [](const auto& info) { return std::string(info.param.name); });
+
+}  // namespace
+}  // namespace TavoPlayer

@@ -64,21 +64,24 @@ int AacFramer::appendAdts(const uint8_t* raw, size_t size, std::vector<uint8_t>&
     return 0;
 }
 
-int AacFramer::appendLoas(const uint8_t* raw, size_t size, std::vector<uint8_t>& out) const {
+int AacFramer::appendLoas(const uint8_t* raw, size_t size, std::vector<uint8_t>& out,
+                          bool withConfig) const {
     // AudioMuxElement(muxConfigPresent = 1), ISO/IEC 14496-3, 1.7.3.1, Table 1.32.
     BitWriter mux;
-    mux.putBits(0, 1);  // useSameStreamMux: the configuration follows
-    // StreamMuxConfig (Table 1.33), audioMuxVersion 0.
-    mux.putBits(0, 1);  // audioMuxVersion
-    mux.putBits(1, 1);  // allStreamsSameTimeFraming
-    mux.putBits(0, 6);  // numSubFrames - 1
-    mux.putBits(0, 4);  // numProgram - 1
-    mux.putBits(0, 3);  // numLayer - 1
-    writeAudioSpecificConfig(mux);
-    mux.putBits(0, 3);     // frameLengthType 0: payload lengths in PayloadLengthInfo
-    mux.putBits(0xFF, 8);  // latmBufferFullness: variable rate
-    mux.putBits(0, 1);     // otherDataPresent
-    mux.putBits(0, 1);     // crcCheckPresent
+    mux.putBits(withConfig ? 0 : 1, 1);  // useSameStreamMux
+    if (withConfig) {
+        // StreamMuxConfig (Table 1.33), audioMuxVersion 0.
+        mux.putBits(0, 1);  // audioMuxVersion
+        mux.putBits(1, 1);  // allStreamsSameTimeFraming
+        mux.putBits(0, 6);  // numSubFrames - 1
+        mux.putBits(0, 4);  // numProgram - 1
+        mux.putBits(0, 3);  // numLayer - 1
+        writeAudioSpecificConfig(mux);
+        mux.putBits(0, 3);     // frameLengthType 0: payload lengths in PayloadLengthInfo
+        mux.putBits(0xFF, 8);  // latmBufferFullness: variable rate
+        mux.putBits(0, 1);     // otherDataPresent
+        mux.putBits(0, 1);     // crcCheckPresent
+    }
     // PayloadLengthInfo (Table 1.35): 255-valued bytes then the remainder.
     size_t remaining = size;
     while (remaining >= 255) {

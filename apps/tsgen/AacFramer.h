@@ -11,8 +11,8 @@ class BitWriter;
 // Wraps raw AAC access units (ISO/IEC 14496-3 raw_data_block) in one of the two
 // transports a broadcast uses: ADTS (ISO/IEC 14496-3, 1.A.2) or LOAS/LATM
 // (ISO/IEC 14496-3, 1.7.3): AudioSyncStream around an AudioMuxElement that
-// carries its StreamMuxConfig in every frame, so that a receiver can start
-// anywhere.
+// carries its StreamMuxConfig in every frame (so that a receiver can start
+// anywhere) or in every n-th frame, as some broadcasters do.
 class AacFramer {
 public:
     // audioObjectType 2 = AAC LC; samplingFrequencyIndex per ISO/IEC 14496-3,
@@ -25,7 +25,10 @@ public:
     // Returns 0 with the framed unit appended to out, 1 if the unit is too long
     // for the transport's length field.
     int appendAdts(const uint8_t* raw, size_t size, std::vector<uint8_t>& out) const;
-    int appendLoas(const uint8_t* raw, size_t size, std::vector<uint8_t>& out) const;
+    // withConfig false sets useSameStreamMux: the frame relies on the
+    // StreamMuxConfig of an earlier one.
+    int appendLoas(const uint8_t* raw, size_t size, std::vector<uint8_t>& out,
+                   bool withConfig = true) const;
 
     // ISO/IEC 14496-3, Table 1.18; -1 for a rate without an index.
     static int samplingFrequencyIndex(int sampleRate);

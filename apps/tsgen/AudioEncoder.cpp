@@ -185,7 +185,8 @@ int AudioEncoder::encodeFrame(std::vector<uint8_t>& out) {
     int rc = 0;
     switch (mOptions.audioCodec) {
         case AudioCodec::kAacLatm:
-            rc = mFramer->appendLoas(mPacket->data, static_cast<size_t>(mPacket->size), out);
+            rc = mFramer->appendLoas(mPacket->data, static_cast<size_t>(mPacket->size), out,
+                                     mEncodedFrames % mOptions.latmConfigInterval == 0);
             break;
         case AudioCodec::kAacAdts:
             rc = mFramer->appendAdts(mPacket->data, static_cast<size_t>(mPacket->size), out);
@@ -195,6 +196,7 @@ int AudioEncoder::encodeFrame(std::vector<uint8_t>& out) {
             break;
     }
     av_packet_unref(mPacket);
+    ++mEncodedFrames;
     if (rc != 0) {
         mError = "an AAC access unit is too long for its transport";
         return -1;

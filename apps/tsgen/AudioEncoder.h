@@ -44,6 +44,7 @@ private:
     int64_t mTotalSamples = 0;
     int64_t mSamplesSent = 0;
     int64_t mFramesOut = 0;
+    int64_t mEncodedFrames = 0;
     bool mFlushed = false;
     bool mEnded = false;
     double mToneHz = 1000.0;

@@ -59,6 +59,7 @@ enum OptionId {
     kOptPacketSize,
     kOptVideoPesBytes,
     kOptAudioPesBytes,
+    kOptLatmConfigInterval,
 };
 
 bool parseInt(const std::string& text, int64_t minValue, int64_t maxValue, int64_t& value) {
@@ -313,6 +314,8 @@ Output and content:
       --audio-bitrate BPS    audio bit rate (default 128000 AAC, 192000 MP2, 128000 MP3;
                              96000 MP2 and 64000 MP3 below 32 kHz)
       --audio-frames-per-pes N  audio frames in each PES packet (default 1)
+      --latm-config-interval N  StreamMuxConfig in every N-th LOAS frame, the others set
+                             useSameStreamMux (default 1: in every frame)
       --tone-hz HZ           test tone frequency (default: from the seed)
       --caption SEC:TEXT     caption statement shown at SEC (repeatable); TEXT is UTF-8
                              with escapes \xNN (any caption code), \n (APR), \f (CS), \\
@@ -412,6 +415,7 @@ int OptionParser::parse(int argc, char** argv, Options& o) {
         {"packet-size", required_argument, nullptr, kOptPacketSize},
         {"video-pes-bytes", required_argument, nullptr, kOptVideoPesBytes},
         {"audio-pes-bytes", required_argument, nullptr, kOptAudioPesBytes},
+        {"latm-config-interval", required_argument, nullptr, kOptLatmConfigInterval},
         {"verbose", no_argument, nullptr, 'v'},
         {"help", no_argument, nullptr, 'h'},
         {nullptr, 0, nullptr, 0},
@@ -718,6 +722,11 @@ int OptionParser::parse(int argc, char** argv, Options& o) {
             case kOptAudioPesBytes:
                 if (!intArg(1, 65000, o.audioPesBytes)) {
                     return bad("--audio-pes-bytes (1..65000)");
+                }
+                break;
+            case kOptLatmConfigInterval:
+                if (!intArg(1, 1000, o.latmConfigInterval)) {
+                    return bad("--latm-config-interval (1..1000)");
                 }
                 break;
             case 'v':

@@ -50,7 +50,8 @@ struct Options {
     int audioChannels = 2;
     int64_t audioBitrate = 0;  // 0: codec default
     int audioFramesPerPes = 1;
-    double toneHz = 0;  // 0: chosen from the seed
+    int latmConfigInterval = 1;  // StreamMuxConfig in every n-th LOAS frame
+    double toneHz = 0;           // 0: chosen from the seed
 
     bool captionStream = true;
     std::vector<CaptionEvent> captions;

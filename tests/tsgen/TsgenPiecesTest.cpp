@@ -83,6 +83,18 @@ TEST(AacFramerTest, LoasFrameCarriesStreamMuxConfigAndLength) {
     EXPECT_EQ(out, expected);
 }
 
+TEST(AacFramerTest, LoasFrameWithoutConfigReusesTheEarlierOne) {
+    AacFramer framer(2, 3, 2);
+    const std::vector<uint8_t> raw(10, 0xAB);
+    std::vector<uint8_t> out;
+    ASSERT_EQ(framer.appendLoas(raw.data(), raw.size(), out, false), 0);
+    // useSameStreamMux 1, then at once PayloadLengthInfo 10 and the payload
+    // shifted by one bit: 89 bits, 12 bytes.
+    const std::vector<uint8_t> expected = {0x56, 0xE0, 0x0C, 0x85, 0x55, 0xD5, 0xD5, 0xD5,
+                                           0xD5, 0xD5, 0xD5, 0xD5, 0xD5, 0xD5, 0x80};
+    EXPECT_EQ(out, expected);
+}
+
 TEST(AacFramerTest, LongUnitsUseSeveralLengthBytes) {
     AacFramer framer(2, 3, 2);
     const std::vector<uint8_t> raw(600, 0x01);

@@ -69,6 +69,8 @@ INSTANTIATE_TEST_SUITE_P(
     ::testing::Values(AudioCase{"Latm", "latm", "aac_latm", 0x11},
                       AudioCase{"Adts", "adts", "aac", 0x0F}, AudioCase{"Mp2", "mp2", "mp2", 0x03},
                       AudioCase{"Mp3", "mp3", "mp3", 0x03},
+                      AudioCase{"LatmConfigEvery8", "latm --latm-config-interval 8", "aac_latm",
+                                0x11},
                       AudioCase{"Mp2HalfRate", "mp2 --audio-rate 24000", "mp2", 0x04, "24000"}),
     [](const auto& info) { return std::string(info.param.name); });
 

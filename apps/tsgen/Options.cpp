@@ -349,13 +349,15 @@ Multiplex:
 
 Faults (PACKET = PID:INDEX[:COUNT], INDEX counts the PID's packets from 0; SEC here and
 in --caption counts from the first picture's PTS):
-      --cc-error PID:INDEX   continuity counter jumps by one extra at that packet (repeatable)
+      --cc-error PACKET      continuity counter jumps by one extra step at each of those
+                             packets and stays shifted (repeatable)
       --drop PACKET          leave those packets out (repeatable)
       --tei PACKET           set transport_error_indicator (repeatable)
       --scramble PACKET      set transport_scrambling_control (repeatable)
       --scrambling-value V   the scrambling control written, 1..3 (default 2)
       --pcr-jump SEC:MS      from time SEC on, PCR values are MS milliseconds off (repeatable)
       --gap SEC:MS           write no packets for MS milliseconds from SEC; the PCR runs on
+                             (repeatable)
       --timebase-jump SEC:MS from SEC on, PCR, PTS and DTS move by MS milliseconds, announced
                              by discontinuity_indicator on the first PCR after it (repeatable)
       --latm-as-adts         label LATM audio with stream_type 0x0F

@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cstddef>
+#include <cstring>
 
 namespace TavoPlayer::tsgen {
 
@@ -30,21 +31,26 @@ void TestPattern::render(int64_t frameIndex, uint8_t* y, int yStride, uint8_t* u
                          uint8_t* v, int vStride) const {
     const int barWidth = std::max(1, mWidth / 8);
     const int scroll = static_cast<int>((frameIndex * 4 + (mSeed % 97)) % mWidth);
-    for (int row = 0; row < mHeight; ++row) {
-        uint8_t* line = y + static_cast<std::ptrdiff_t>(row) * yStride;
-        for (int col = 0; col < mWidth; ++col) {
-            const int bar = ((col + scroll) % mWidth) / barWidth;
-            line[col] = kBars[std::min(bar, 7)][0];
-        }
+    // The bars are the same on every row: build one row of each plane and copy it.
+    uint8_t* firstY = y;
+    for (int col = 0; col < mWidth; ++col) {
+        const int bar = ((col + scroll) % mWidth) / barWidth;
+        firstY[col] = kBars[std::min(bar, 7)][0];
     }
-    for (int row = 0; row < mHeight / 2; ++row) {
-        uint8_t* lu = u + static_cast<std::ptrdiff_t>(row) * uStride;
-        uint8_t* lv = v + static_cast<std::ptrdiff_t>(row) * vStride;
-        for (int col = 0; col < mWidth / 2; ++col) {
-            const int bar = ((col * 2 + scroll) % mWidth) / barWidth;
-            lu[col] = kBars[std::min(bar, 7)][1];
-            lv[col] = kBars[std::min(bar, 7)][2];
-        }
+    for (int col = 0; col < mWidth / 2; ++col) {
+        const int bar = ((col * 2 + scroll) % mWidth) / barWidth;
+        u[col] = kBars[std::min(bar, 7)][1];
+        v[col] = kBars[std::min(bar, 7)][2];
+    }
+    for (int row = 1; row < mHeight; ++row) {
+        std::memcpy(y + static_cast<std::ptrdiff_t>(row) * yStride, firstY,
+                    static_cast<size_t>(mWidth));
+    }
+    for (int row = 1; row < mHeight / 2; ++row) {
+        std::memcpy(u + static_cast<std::ptrdiff_t>(row) * uStride, u,
+                    static_cast<size_t>(mWidth / 2));
+        std::memcpy(v + static_cast<std::ptrdiff_t>(row) * vStride, v,
+                    static_cast<size_t>(mWidth / 2));
     }
 
     // Seeded noise in the lower quarter, changing every frame, so that the

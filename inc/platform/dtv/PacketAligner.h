@@ -10,8 +10,10 @@
 // Lost sync is never fatal: bytes that do not belong to a packet are skipped and
 // counted, and the sync byte is searched for again. A packet is only handed out
 // once the sync byte of the packet after it has been seen (or at the end of the
-// stream), so a packet cut short by garbage is dropped rather than delivered with
-// the next packet's bytes in it.
+// stream). When that byte is not where it should be, the packet is held until the
+// next packet is found: if that one starts inside it, the packet was cut short and
+// is dropped rather than delivered with another packet's bytes in it; otherwise it
+// was whole and garbage (or a packet with a damaged sync byte) followed it.
 //
 // Pure: no I/O and no locks; one thread uses an aligner.
 #pragma once
@@ -49,9 +51,13 @@ private:
     enum class Lock { kYes, kNo, kNeedMore };
     size_t process(bool finishing, std::vector<uint8_t>& out);
     Lock tryLock(size_t at, size_t period, bool finishing) const;
+    void emit(size_t at, std::vector<uint8_t>& out);
+
+    static constexpr size_t kNone = static_cast<size_t>(-1);
 
     std::vector<uint8_t> mPending;
-    size_t mPos = 0;  // first unprocessed byte of mPending
+    size_t mPos = 0;          // first unprocessed byte of mPending
+    size_t mSuspect = kNone;  // a packet whose successor was not where it should be
     size_t mPacketSize = 0;
     uint64_t mSyncLosses = 0;
     uint64_t mBytesSkipped = 0;

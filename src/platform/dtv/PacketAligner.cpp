@@ -1,5 +1,7 @@
 #include "platform/dtv/PacketAligner.h"
 
+#include <algorithm>
+
 namespace TavoPlayer {
 
 namespace {
@@ -11,9 +13,12 @@ constexpr size_t kConfirmations = 2;
 size_t PacketAligner::push(const uint8_t* data, size_t size, std::vector<uint8_t>& out) {
     // Drop what has been processed before appending, so that the buffer stays
     // a few packets long whatever the piece size.
-    if (mPos > 0) {
-        mPending.erase(mPending.begin(), mPending.begin() + static_cast<std::ptrdiff_t>(mPos));
-        mPos = 0;
+    const size_t keepFrom = std::min(mPos, mSuspect);
+    if (keepFrom > 0) {
+        mPending.erase(mPending.begin(), mPending.begin() + static_cast<std::ptrdiff_t>(keepFrom));
+        mPos -= keepFrom;
+        if (mSuspect != kNone)
+            mSuspect -= keepFrom;
     }
     mPending.insert(mPending.end(), data, data + size);
     return process(false, out);
@@ -22,6 +27,11 @@ size_t PacketAligner::push(const uint8_t* data, size_t size, std::vector<uint8_t
 size_t PacketAligner::finish(std::vector<uint8_t>& out) {
     const uint64_t skippedBefore = mBytesSkipped;
     process(true, out);
+    if (mSuspect != kNone) {
+        // The stream ended inside the packet under suspicion: it was cut short.
+        mBytesSkipped += mPos - mSuspect;
+        mSuspect = kNone;
+    }
     const size_t remaining = mPending.size() - mPos;
     mBytesSkipped += remaining;
     const size_t dropped = static_cast<size_t>(mBytesSkipped - skippedBefore);
@@ -34,6 +44,7 @@ size_t PacketAligner::finish(std::vector<uint8_t>& out) {
 void PacketAligner::reset() {
     mPending.clear();
     mPos = 0;
+    mSuspect = kNone;
     mPacketSize = 0;
 }
 
@@ -54,14 +65,26 @@ PacketAligner::Lock PacketAligner::tryLock(size_t at, size_t period, bool finish
     return Lock::kYes;
 }
 
+void PacketAligner::emit(size_t at, std::vector<uint8_t>& out) {
+    out.insert(out.end(), mPending.begin() + static_cast<std::ptrdiff_t>(at),
+               mPending.begin() + static_cast<std::ptrdiff_t>(at + kPacketSize));
+    ++mPacketsOut;
+}
+
 size_t PacketAligner::process(bool finishing, std::vector<uint8_t>& out) {
-    size_t emitted = 0;
+    const uint64_t before = mPacketsOut;
     const size_t size = mPending.size();
     while (mPos < size) {
         if (mPacketSize == 0) {
             // Searching: find a 0x47 that repeats at 188 or at 204 bytes.
             bool needMore = false;
             while (mPos < size) {
+                if (mSuspect != kNone && mPos >= mSuspect + kPacketSize) {
+                    // No packet starts inside the suspect: it was whole, and what
+                    // followed it was garbage or a packet with a damaged sync byte.
+                    emit(mSuspect, out);
+                    mSuspect = kNone;
+                }
                 if (mPending[mPos] == kSyncByte) {
                     const Lock at188 = tryLock(mPos, kPacketSize, finishing);
                     if (at188 == Lock::kYes) {
@@ -79,10 +102,17 @@ size_t PacketAligner::process(bool finishing, std::vector<uint8_t>& out) {
                     }
                 }
                 ++mPos;
-                ++mBytesSkipped;
+                // Bytes of a suspect packet are counted once its fate is known.
+                if (mSuspect == kNone)
+                    ++mBytesSkipped;
             }
             if (needMore || mPacketSize == 0)
                 break;
+            if (mSuspect != kNone) {
+                // A packet starts inside the suspect: it was cut short.
+                mBytesSkipped += mPos - mSuspect;
+                mSuspect = kNone;
+            }
         }
         // Locked.
         if (size - mPos < mPacketSize) {
@@ -90,42 +120,35 @@ size_t PacketAligner::process(bool finishing, std::vector<uint8_t>& out) {
             // a 204-byte packet whose trailer is missing still carries its TS packet.
             if (finishing && mPacketSize == kRsPacketSize && size - mPos >= kPacketSize &&
                 mPending[mPos] == kSyncByte) {
-                out.insert(out.end(), mPending.begin() + static_cast<std::ptrdiff_t>(mPos),
-                           mPending.begin() + static_cast<std::ptrdiff_t>(mPos + kPacketSize));
-                ++emitted;
-                ++mPacketsOut;
+                emit(mPos, out);
                 mPos = size;
             }
             break;
         }
-        const size_t next = mPos + mPacketSize;
-        const size_t afterNext = next + mPacketSize;
-        bool whole = mPending[mPos] == kSyncByte;
-        if (whole && next < size && mPending[next] != kSyncByte) {
-            // The next packet does not start where it should: either its own sync
-            // byte is damaged (the one after it is in place) or this packet was cut
-            // short and the bytes after it belong to another packet.
-            if (afterNext >= size && !finishing)
-                break;  // decide when it arrives
-            whole = afterNext < size && mPending[afterNext] == kSyncByte;
-        }
-        if (!whole) {
-            // Search again from the next byte.
+        if (mPending[mPos] != kSyncByte) {
             ++mSyncLosses;
             mPacketSize = 0;
             ++mPos;
             ++mBytesSkipped;
             continue;
         }
+        const size_t next = mPos + mPacketSize;
+        if (next < size && mPending[next] != kSyncByte) {
+            // The next packet does not start where it should. Either this packet
+            // was cut short (a packet starts inside it) or garbage follows it; the
+            // search for the next packet tells which.
+            ++mSyncLosses;
+            mSuspect = mPos;
+            mPacketSize = 0;
+            ++mPos;
+            continue;
+        }
         if (next >= size && !finishing)
             break;  // wait for the next sync byte
-        out.insert(out.end(), mPending.begin() + static_cast<std::ptrdiff_t>(mPos),
-                   mPending.begin() + static_cast<std::ptrdiff_t>(mPos + kPacketSize));
-        ++emitted;
-        ++mPacketsOut;
+        emit(mPos, out);
         mPos = next;
     }
-    return emitted;
+    return static_cast<size_t>(mPacketsOut - before);
 }
 
 }  // namespace TavoPlayer

@@ -976,5 +976,55 @@ INSTANTIATE_TEST_SUITE_P(
         StreamCase{"ProgressiveBFrames", "aud=1:keyint=12:bframes=2:force-cfr=1", "", 1501}),
     [](const auto& info) { return std::string(info.param.name); });
 
+// --- sample broadcasts: golden dumps --------------------------------------------------
+
+struct SampleCase {
+    const char* name;
+    const char* file;
+    uint16_t pid;
+    size_t packetSize;
+};
+
+class H264GoldenTest : public H264Fixture, public ::testing::WithParamInterface<SampleCase> {};
+
+TEST_P(H264GoldenTest, UnitsMatchTheCheckedInDump) {
+    const SampleCase& c = GetParam();
+    const std::string path = std::string(TAVO_SHARED_STREAMS_DIR) + "/" + c.file;
+    if (!std::filesystem::exists(path)) {
+        GTEST_SKIP() << "sample stream folder absent: " << path;
+    }
+    const auto chunks = test::pesFromTs(test::readFile(path), c.pid, c.packetSize);
+    ASSERT_FALSE(chunks.empty());
+    const auto units = run(chunks);
+    EXPECT_EQ(test::compareGolden(std::string(c.name) + ".h264.txt", test::goldenDump(units)), "");
+
+    // Independent check: every unit is one that libavcodec's parser cuts from the same
+    // elementary stream (these muxers start each PES with an access unit).
+    Bytes es;
+    for (const auto& chunk : chunks) {
+        es.insert(es.end(), chunk.es.begin(), chunk.es.end());
+    }
+    std::map<Bytes, int> reference;
+    for (const auto& unit : ffmpegAccessUnits(es)) {
+        ++reference[unit.bytes];
+    }
+    for (size_t i = 0; i < units.size(); ++i) {
+        EXPECT_GT(reference[units[i].bytes]--, 0)
+            << "unit " << i << " of " << units.size() << ", " << units[i].bytes.size() << " bytes";
+    }
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Samples, H264GoldenTest,
+    ::testing::Values(
+        SampleCase{"dvb_1080_x264", "dvb_h264_1080_mpeg1audio_0x03.ts", 0x100, 188},
+        SampleCase{"dvb_1080i_picstruct", "dvb_h264_1080i_picstruct_sei_ac3_teletext.ts", 0x78,
+                   188},
+        SampleCase{"exoplayer_h264_mpeg_audio", "exoplayer_sample_h264_mpeg_audio.ts", 0x100, 188},
+        // The ISDB-Tb captures carry no PES start on their video PID, so nothing to cut.
+        SampleCase{"exoplayer_h264_no_aud_name",
+                   "exoplayer_sample_h264_no_access_unit_delimiters.ts", 0x100, 188}),
+    [](const auto& info) { return std::string(info.param.name); });
+
 }  // namespace
 }  // namespace TavoPlayer

@@ -440,5 +440,51 @@ INSTANTIATE_TEST_SUITE_P(
                     "mp3", AV_CODEC_ID_MP3, 2160}),
     [](const auto& info) { return std::string(info.param.name); });
 
+// Sample broadcasts: golden dumps, and libavcodec's frames where the stream needs no
+// padding (48 kHz), where this extractor's frame-length rule and the standard's agree.
+struct SampleCase {
+    const char* name;
+    const char* file;
+    uint16_t pid;
+    bool sameAsFfmpeg;
+};
+
+class MP3GoldenTest : public MP3ExtractorFixture,
+                      public ::testing::WithParamInterface<SampleCase> {};
+
+TEST_P(MP3GoldenTest, FramesMatchTheCheckedInDump) {
+    const SampleCase& c = GetParam();
+    const std::string path = std::string(TAVO_SHARED_STREAMS_DIR) + "/" + c.file;
+    if (!std::filesystem::exists(path)) {
+        GTEST_SKIP() << "sample stream folder absent: " << path;
+    }
+    mRing = test::makeRing(22);
+    mExtractor = new MP3MediaExtractor(mRing);
+    const auto chunks = test::pesFromTs(test::readFile(path), c.pid);
+    ASSERT_FALSE(chunks.empty());
+    const auto units = run(chunks);
+    ASSERT_FALSE(units.empty());
+    EXPECT_EQ(test::compareGolden(std::string(c.name) + ".mpa.txt", test::goldenDump(units)), "");
+    if (c.sameAsFfmpeg) {
+        std::vector<uint8_t> es;
+        for (const auto& chunk : chunks) {
+            es.insert(es.end(), chunk.es.begin(), chunk.es.end());
+        }
+        const auto reference = ffmpegFrames(es, AV_CODEC_ID_MP2);
+        ASSERT_EQ(units.size(), reference.size());
+        for (size_t i = 0; i < units.size(); ++i) {
+            ASSERT_EQ(units[i].bytes, reference[i]) << "frame " << i;
+        }
+    }
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Samples, MP3GoldenTest,
+    ::testing::Values(
+        SampleCase{"dvb_mp2_48k", "dvb_h264_1080_mpeg1audio_0x03.ts", 0x101, true},
+        SampleCase{"exoplayer_h264_mp2_44k", "exoplayer_sample_h264_mpeg_audio.ts", 0x101, false},
+        SampleCase{"exoplayer_h262_mp2_44k", "exoplayer_sample_h262_mpeg_audio.ts", 0x101, false}),
+    [](const auto& info) { return std::string(info.param.name); });
+
 }  // namespace
 }  // namespace TavoPlayer

@@ -7,6 +7,7 @@
 #include <fstream>
 #include <iterator>
 #include <new>
+#include <sstream>
 
 #include "common/data/PESData.h"
 
@@ -144,7 +145,7 @@ std::vector<PesChunk> fixedCuts(const std::vector<uint8_t>& es, size_t size, uin
     return chunks;
 }
 
-std::vector<PesChunk> pesFromTs(const std::vector<uint8_t>& ts, uint16_t pid) {
+std::vector<PesChunk> pesFromTs(const std::vector<uint8_t>& ts, uint16_t pid, size_t packetSize) {
     std::vector<PesChunk> chunks;
     std::vector<uint8_t> pes;
     uint64_t lastPts = 0;
@@ -168,7 +169,7 @@ std::vector<PesChunk> pesFromTs(const std::vector<uint8_t>& ts, uint16_t pid) {
         }
         pes.clear();
     };
-    for (size_t at = 0; at + 188 <= ts.size(); at += 188) {
+    for (size_t at = 0; at + packetSize <= ts.size(); at += packetSize) {
         const uint8_t* packet = &ts[at];
         if (packet[0] != 0x47 || (((packet[1] & 0x1F) << 8) | packet[2]) != pid) {
             continue;
@@ -189,6 +190,54 @@ std::vector<PesChunk> pesFromTs(const std::vector<uint8_t>& ts, uint16_t pid) {
     }
     flush();
     return chunks;
+}
+
+std::string goldenDump(const std::vector<ExtractedUnit>& units) {
+    std::string dump;
+    char line[128];
+    for (const ExtractedUnit& unit : units) {
+        std::snprintf(
+            line, sizeof line, "pts=%lld flags=%u size=%zu fnv=%016llx\n", unit.pts,
+            static_cast<unsigned>(unit.flags), unit.bytes.size(),
+            static_cast<unsigned long long>(fnv1a64(unit.bytes.data(), unit.bytes.size())));
+        dump += line;
+    }
+    return dump;
+}
+
+std::string compareGolden(const std::string& name, const std::string& dump) {
+    const std::string path = std::string(TAVO_SOURCE_DIR) + "/tests/decoder/golden/" + name;
+    const char* update = std::getenv("TAVO_UPDATE_GOLDEN");
+    if (update != nullptr && std::string(update) == "1") {
+        std::ofstream out(path, std::ios::binary | std::ios::trunc);
+        out << dump;
+        return out ? std::string() : "cannot write " + path;
+    }
+    const std::vector<uint8_t> expectedBytes = readFile(path);
+    if (expectedBytes.empty() && !dump.empty()) {
+        return "no golden dump at " + path + " (run with TAVO_UPDATE_GOLDEN=1 to create it)";
+    }
+    const std::string expected(expectedBytes.begin(), expectedBytes.end());
+    if (expected == dump) {
+        return {};
+    }
+    std::istringstream want(expected);
+    std::istringstream got(dump);
+    std::string wantLine;
+    std::string gotLine;
+    for (size_t line = 1;; ++line) {
+        const bool haveWant = static_cast<bool>(std::getline(want, wantLine));
+        const bool haveGot = static_cast<bool>(std::getline(got, gotLine));
+        if (!haveWant && !haveGot) {
+            break;
+        }
+        if (!haveWant || !haveGot || wantLine != gotLine) {
+            return path + " line " + std::to_string(line) + ": expected \"" +
+                   (haveWant ? wantLine : "<end>") + "\", got \"" + (haveGot ? gotLine : "<end>") +
+                   "\"";
+        }
+    }
+    return "differs from " + path;
 }
 
 int probePid(const std::string& path, const std::string& type) {

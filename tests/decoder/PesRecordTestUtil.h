@@ -65,7 +65,16 @@ std::vector<PesChunk> fixedCuts(const std::vector<uint8_t>& es, size_t size, uin
 // The PES packets of `pid` in a 188-byte-packet transport stream (ISO/IEC 13818-1,
 // 2.4.3.2 and 2.4.3.6), each as its ES payload with its PTS (the last PTS seen when
 // a packet has none). A small, independent splitter for test inputs only.
-std::vector<PesChunk> pesFromTs(const std::vector<uint8_t>& ts, uint16_t pid);
+std::vector<PesChunk> pesFromTs(const std::vector<uint8_t>& ts, uint16_t pid,
+                                size_t packetSize = 188);
+
+// One line per unit: "pts=<90 kHz> flags=<n> size=<bytes> fnv=<FNV-1a 64 of the bytes>".
+std::string goldenDump(const std::vector<ExtractedUnit>& units);
+
+// Compares `dump` with tests/decoder/golden/<name>; with TAVO_UPDATE_GOLDEN=1 in the
+// environment, (re)writes that file instead. Returns an empty string when they agree,
+// else a description of the first difference.
+std::string compareGolden(const std::string& name, const std::string& dump);
 
 // The PID of the first stream of `type` ("v" or "a") in a TS, found with ffprobe;
 // -1 when ffprobe finds none.

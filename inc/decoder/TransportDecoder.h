@@ -112,6 +112,7 @@ private:
     LatmConfig mLatm;
     bool mHaveConfig = false;
     CSAudioSpecificConfig mConfig;
+    uint32_t mAdtsFixedHeader = 0;  // profile, frequency index, channels of mConfig
 };
 
 using HANDLE_TRANSPORTDEC = TransportDecoder*;

@@ -24,9 +24,19 @@ uint32_t TransportBitReader::peekBits(unsigned int count) const {
     if (count == 0 || count > 32 || count > mSizeBits - mPositionBits) {
         return 0;
     }
-    // Load only the bytes the field spans (at most 5 for 32 bits at an odd offset).
     const uint8_t* at = mData + (mPositionBits >> 3);
     const unsigned int offset = static_cast<unsigned int>(mPositionBits & 7u);
+#if __BYTE_ORDER__ == __ORDER_LITTLE_ENDIAN__
+    // With eight bytes left from here, one big-endian 64-bit load covers any field.
+    if ((mPositionBits >> 3) + 8 <= (mSizeBits >> 3)) {
+        uint64_t word;
+        std::memcpy(&word, at, sizeof(word));
+        word = __builtin_bswap64(word);
+        return static_cast<uint32_t>((word << offset) >> (64u - count));
+    }
+#endif
+    // Otherwise load only the bytes the field spans (at most 5 for 32 bits at an odd
+    // offset).
     const unsigned int spanBytes = (offset + count + 7u) >> 3;
     uint64_t word = 0;
     for (unsigned int i = 0; i < spanBytes; ++i) {
@@ -84,7 +94,20 @@ void TransportBitReader::readBytes(uint8_t* out, uint32_t count) {
         // high `offset` bits of the next; the last input byte touched is still inside
         // the data because the whole field is.
         const unsigned int back = 8u - offset;
-        for (uint32_t i = 0; i < count; ++i) {
+        uint32_t i = 0;
+#if __BYTE_ORDER__ == __ORDER_LITTLE_ENDIAN__
+        // Eight output bytes per step from a big-endian 64-bit load and the byte after
+        // it (LATM payloads rarely start on a byte boundary, so this is the hot path).
+        for (; i + 8 <= count; i += 8) {
+            uint64_t word;
+            std::memcpy(&word, at + i, sizeof(word));
+            word = __builtin_bswap64(word);
+            word = (word << offset) | (at[i + 8] >> back);
+            word = __builtin_bswap64(word);
+            std::memcpy(out + i, &word, sizeof(word));
+        }
+#endif
+        for (; i < count; ++i) {
             out[i] = static_cast<uint8_t>((at[i] << offset) | (at[i + 1] >> back));
         }
     }

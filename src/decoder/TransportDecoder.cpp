@@ -336,18 +336,19 @@ TRANSPORTDEC_ERROR TransportDecoder::readAdtsFrame() {
         return TRANSPORTDEC_NOT_ENOUGH_BITS;
     }
     // ISO/IEC 13818-7, 6.2.1 / ISO/IEC 14496-3, 1.A.3.2: adts_fixed_header and
-    // adts_variable_header, 56 bits.
-    TransportBitReader header(mBuffer.data() + mReadPos, kAdtsHeaderBytes);
-    header.skipBits(12 + 1 + 2);  // syncword, ID, layer
-    const uint32_t protectionAbsent = header.readBits(1);
-    const uint32_t profile = header.readBits(2);
-    const uint32_t samplingFrequencyIndex = header.readBits(4);
-    header.skipBits(1);  // private_bit
-    const uint32_t channelConfiguration = header.readBits(3);
-    header.skipBits(1 + 1 + 1 + 1);  // original_copy, home, copyright id bit and start
-    const uint32_t frameLength = header.readBits(13);
-    header.skipBits(11);  // adts_buffer_fullness
-    const uint32_t rawDataBlocks = header.readBits(2);
+    // adts_variable_header, 56 bits, read straight from the bytes (every frame goes
+    // through here):
+    //   syncword 12, ID 1, layer 2, protection_absent 1 | profile 2,
+    //   sampling_frequency_index 4, private_bit 1, channel_configuration 3,
+    //   original_copy 1, home 1 | copyright bits 2, frame_length 13,
+    //   adts_buffer_fullness 11, number_of_raw_data_blocks_in_frame 2.
+    const uint8_t* h = mBuffer.data() + mReadPos;
+    const uint32_t protectionAbsent = h[1] & 1u;
+    const uint32_t profile = h[2] >> 6;
+    const uint32_t samplingFrequencyIndex = (h[2] >> 2) & 0x0Fu;
+    const uint32_t channelConfiguration = ((h[2] & 1u) << 2) | (h[3] >> 6);
+    const uint32_t frameLength = ((h[3] & 3u) << 11) | (h[4] << 3) | (h[5] >> 5);
+    const uint32_t rawDataBlocks = h[6] & 3u;
     const uint32_t headerBytes = kAdtsHeaderBytes + (protectionAbsent ? 0 : kAdtsCrcBytes);
     if (TransportDecoderAsc::samplingFrequencyOf(samplingFrequencyIndex) == 0 ||
         frameLength < headerBytes) {
@@ -365,9 +366,16 @@ TRANSPORTDEC_ERROR TransportDecoder::readAdtsFrame() {
         // (ISO/IEC 13818-7, 6.2.2): not handled.
         return dropFrame(frameEnd, TRANSPORTDEC_UNSUPPORTED_FORMAT);
     }
-    CSAudioSpecificConfig config;
-    TransportDecoderAsc::fromAdts(profile, samplingFrequencyIndex, channelConfiguration, &config);
-    reportConfig(config);
+    // The fixed header rarely changes: only a change is turned into a configuration.
+    const uint32_t fixedHeader =
+        (profile << 8) | (samplingFrequencyIndex << 4) | channelConfiguration;
+    if (!mHaveConfig || fixedHeader != mAdtsFixedHeader) {
+        CSAudioSpecificConfig config;
+        TransportDecoderAsc::fromAdts(profile, samplingFrequencyIndex, channelConfiguration,
+                                      &config);
+        reportConfig(config);
+        mAdtsFixedHeader = fixedHeader;
+    }
     mInFrame = true;
     mSynced = true;
     mFrameStart = mReadPos;

@@ -9,6 +9,21 @@
 
 namespace TavoPlayer {
 
+namespace {
+
+// libutils' thread drops its own strong reference just after join() has returned.
+// Waiting for that makes the joining thread the one that destroys the thread object,
+// after the thread's last step; otherwise the exiting thread may destroy it while the
+// joiner is still leaving join(), which ThreadSanitizer reports as a race because it
+// cannot see libutils' (uninstrumented) reference counts.
+void waitForLastReference(const android::sp<TSReceiver::TSReceiverThread>& thread) {
+    for (int i = 0; i < 10000 && thread->getStrongCount() > 1; ++i)
+        usleep(100);
+    thread->isRunning();  // takes the thread's lock: orders its last unlock before us
+}
+
+}  // namespace
+
 TSReceiver::TSReceiverThread::TSReceiverThread(TSReceiver& receiver)
     : android::Thread(false), mReceiver(receiver) {}
 
@@ -171,6 +186,7 @@ unsigned int TSReceiver::stop() {
             TAVO_LOGE("%s - could not stop thread!\n", __func__);
             return ERROR_TSRECEIVER_PID_OR_THREAD;
         }
+        waitForLastReference(mThread);
         mThread.clear();
     }
     stopFiltering();

@@ -1,5 +1,7 @@
 #include "platform/dtv/Demux.h"
 
+#include <unistd.h>
+
 #include <cerrno>
 #include <chrono>
 #include <cstring>
@@ -240,6 +242,12 @@ void Demux::closeSource_c() {
     mThread->wake();
     mSource->interrupt();
     mThread->join();
+    // libutils' thread drops its own reference just after join() returns; letting it
+    // go first makes this thread destroy the object, after the thread's last step
+    // (ThreadSanitizer cannot see libutils' reference counts).
+    for (int i = 0; i < 10000 && mThread->getStrongCount() > 1; ++i)
+        usleep(100);
+    mThread->isRunning();  // takes the thread's lock: orders its last unlock before us
     mThread.clear();
     TAVO_LOGI("%s: demux source %s closed\n", "DemuxBinder_StopFiltering",
               mSource->describe().c_str());

@@ -97,12 +97,18 @@ private:
     void releaseRecord_l(uint32_t commitBytes);
     bool finishPES();
     void discardPES();
-    // Returns false when the thread must leave (exit request while waiting).
+    // Appends to the record in assembly (or only counts, without one). False: the
+    // first output lacks room for it now; nothing was done.
     bool appendPayload(const uint8_t* payload, uint32_t length);
+    // Waits, 100 ms at a time, until the record and `length` more bytes fit; false
+    // on an exit request.
     bool waitForOutputSpace_l(uint32_t length);
     bool exitRequested();
     // Releases what the worker holds and ends the round with "stop".
     bool leaveForExit(bool holdingInput);
+    // Feeds the batch's last PCR (kind 0), consumes `consumeBytes` of the input and
+    // releases its read lock.
+    void endBatch(uint32_t consumeBytes, bool pcrSeen, uint64_t lastPCR);
     void feedClock(uint64_t pts);
     void releaseOnExit();
 
@@ -121,9 +127,12 @@ private:
     uint16_t mScrambledCount;
 
     // Worker only: whether it holds the first output's writer lock (a record is in
-    // assembly), and whether it must reserve the first record on its first round.
+    // assembly); whether it must reserve a record before its next batch; whether the
+    // first packet of the next batch was parsed already and only waits for that
+    // record to take its payload.
     bool mHoldsRecord;
     bool mReservePending;
+    bool mPendingPacket;
 };
 
 }  // namespace TavoPlayer

@@ -1,5 +1,7 @@
 #include "tsparser/TSParser.h"
 
+#include <unistd.h>
+
 #include <cstring>
 #include <string>
 
@@ -40,7 +42,8 @@ TSParser::TSParser(int kind)
       mNotify(0),
       mScrambledCount(0),
       mHoldsRecord(false),
-      mReservePending(false) {}
+      mReservePending(false),
+      mPendingPacket(false) {}
 
 TSParser::~TSParser() {
     if (mThread != nullptr)
@@ -83,6 +86,7 @@ unsigned int TSParser::start() {
     mPESSize = 0;
     mRBFreeSpace = 0;
     mHoldsRecord = false;
+    mPendingPacket = false;
     mScrambledCount = 0;
 
     mThread = new TSParserThread(this);
@@ -108,6 +112,11 @@ unsigned int TSParser::stop() {
             TAVO_LOGE("%s - could not stop thread!\n", __func__);
             return ERROR_TSPARSER_START_STOP;
         }
+        // The thread drops its own reference to itself just after join returns.
+        // Waiting for that (briefly) makes this thread release the last one, so the
+        // thread object is destroyed here, after everything the thread did with it.
+        for (int i = 0; i < 1000 && mThread->getStrongCount() > 1; ++i)
+            usleep(1000);
         mThread.clear();
     }
     // The worker has released the input's read lock and the first output's writer
@@ -121,6 +130,7 @@ unsigned int TSParser::stop() {
     mPESSize = 0;
     mRBFreeSpace = 0;
     mReservePending = false;
+    mPendingPacket = false;
     if (mInput != nullptr)
         mInput->wakeAll();
     for (const auto& output : mOutputs)
@@ -214,14 +224,16 @@ bool TSParser::finishPES() {
     }
     // Without a record (no room when it was reserved) the payload was only counted:
     // there is nothing to parse or commit, and the next PES gets a fresh try.
-    reserveRecord();
+    mPESSize = 0;
+    mReservePending = true;
     return emitted;
 }
 
 void TSParser::discardPES() {
     if (mHoldsRecord)
         releaseRecord_l(0);
-    reserveRecord();
+    mPESSize = 0;
+    mReservePending = true;
 }
 
 void TSParser::feedClock(uint64_t pts) {
@@ -285,8 +297,8 @@ bool TSParser::appendPayload(const uint8_t* payload, uint32_t length) {
             discardPES();
             return true;
         }
-        if (!waitForOutputSpace_l(length))
-            return false;
+        // Waited for at the start of the next round, without the input's read lock.
+        return false;
     }
     memcpy(mpPESWriter, payload, length);
     mpPESWriter += length;
@@ -307,17 +319,32 @@ bool TSParser::leaveForExit(bool holdingInput) {
     return false;
 }
 
+// Lock order: the first output's writer lock, then the input's read lock; never the
+// other way round, so that no wait on the output happens with the input held. A
+// record is therefore reserved, and room in the output waited for, only between
+// batches: a batch ends just before the first packet whose payload needs a record
+// that is not reserved yet (the packet that starts the next PES, mostly) or more
+// room than the output has. That packet has been parsed; the next round reserves
+// the record or waits for room, then appends its payload without parsing it again.
 bool TSParser::threadLoop() {
     if (mReservePending) {
         mReservePending = false;
         if (!mOutputs.empty())
             reserveRecord();
     }
+    if (mPendingPacket && mHoldsRecord) {
+        const android::sp<RingBuffer>& first = mOutputs.front();
+        mRBFreeSpace = static_cast<int32_t>(first->freeSpace() - kHeaderSize - mPESSize);
+        if (mRBFreeSpace < static_cast<int32_t>(mTSParsedData->mPayloadLength) &&
+            !waitForOutputSpace_l(mTSParsedData->mPayloadLength)) {
+            return false;  // exit requested; the thread releases the record
+        }
+    }
     RingBuffer* input = mInput.get();
     if (!input->waitForData(kPacketSize))
         return true;
 
-    // The batch: every whole packet readable now, under one read-lock acquisition.
+    // The batch: the whole packets readable now, under one read-lock acquisition.
     const uint32_t available = input->usedSpace();
     const uint32_t packets = available / kPacketSize;
     const uint8_t* base = input->readPointer();
@@ -329,6 +356,17 @@ bool TSParser::threadLoop() {
     for (uint32_t i = 0; i < packets; ++i) {
         if (exitRequested())
             return leaveForExit(true);
+        if (mPendingPacket) {
+            // Parsed in the round before, which ended here to reserve its record or
+            // to wait for room; ts still describes it, and it has stayed in place.
+            mPendingPacket = false;
+            if (!appendPayload(ts->mPayload, ts->mPayloadLength)) {
+                mPendingPacket = true;
+                endBatch(0, false, 0);
+                return true;
+            }
+            continue;
+        }
         const uint8_t* packet = base + static_cast<size_t>(kPacketSize) * i;
         ts->mTransportScramblingControl = 0;
         uint32_t r = mTSPacketParser->parse(packet, ts);
@@ -366,27 +404,37 @@ bool TSParser::threadLoop() {
         if ((r & TSPacketParser::RESULT_ERROR) || ts->mPayloadLength >= 185) {
             TAVO_LOGE("%s - TS parser error; discarding entire PES packet.", __func__);
             discardPES();
-            if (!(r & TSPacketParser::RESULT_PAYLOAD))
-                continue;
-        } else if (!(r & TSPacketParser::RESULT_PAYLOAD)) {
+            // After a continuity error on a unit start, the payload left in ts is the
+            // packet before's, not this one's: nothing of it is appended.
             continue;
         }
-        if (!appendPayload(ts->mPayload, ts->mPayloadLength))
-            return leaveForExit(true);
+        if (!(r & TSPacketParser::RESULT_PAYLOAD))
+            continue;
+        if (mReservePending || !appendPayload(ts->mPayload, ts->mPayloadLength)) {
+            mPendingPacket = true;
+            endBatch(static_cast<uint32_t>(kPacketSize) * i, pcrSeen, lastPCR);
+            return true;
+        }
     }
+    // The whole readable area goes, even bytes after the last whole packet: the
+    // receiver writes whole packets, so a partial one can only be garbage.
+    endBatch(available, pcrSeen, lastPCR);
+    return true;
+}
 
+void TSParser::endBatch(uint32_t consumeBytes, bool pcrSeen, uint64_t lastPCR) {
     if (mSynchronization != nullptr && mKind == KIND_PCR && pcrSeen) {
         mSynchronization->setBasePCR(lastPCR, Synchronization::RealPCR);
     }
-    // A continuity error on a unit start leaves the payload of the packet before it
-    // in the record, and that one is appended; it must never be a packet of an
-    // earlier batch, whose bytes the receiver may already be overwriting.
-    ts->mPayload = nullptr;
-    ts->mPayloadLength = 0;
-    // The whole readable area goes, even bytes after the last whole packet: the
-    // receiver writes whole packets, so a partial one can only be garbage.
-    input->consume(available);
-    return true;
+    if (!mPendingPacket) {
+        mTSParsedData->mPayload = nullptr;
+        mTSParsedData->mPayloadLength = 0;
+    }
+    if (consumeBytes == 0) {
+        mInput->abortRead();
+    } else {
+        mInput->consume(consumeBytes);
+    }
 }
 
 }  // namespace TavoPlayer

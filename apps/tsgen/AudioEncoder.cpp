@@ -86,6 +86,8 @@ int AudioEncoder::open() {
                      std::to_string(mOptions.audioRate) + " Hz";
             return 1;
         }
+        // ISO/IEC 14496-3, Table 1.19: channelConfiguration 1..6 are 1..6 channels
+        // (6 being 5.1), which is also FFmpeg's default layout for those counts.
         mFramer = std::make_unique<AacFramer>(2, index, mOptions.audioChannels);
     }
     int rc = avcodec_open2(mContext, codec, nullptr);
@@ -116,8 +118,13 @@ void AudioEncoder::fillTone() {
     for (int i = 0; i < n; ++i) {
         const int64_t t = mSamplesSent + i;
         for (int ch = 0; ch < channels; ++ch) {
-            // The right channel an octave up, so that a channel swap is audible.
-            const double hz = mToneHz * (ch == 0 ? 1.0 : 2.0);
+            // Channel k plays harmonic k + 1 (the right channel an octave up), so
+            // that a swap of channels is audible; harmonics above Nyquist fall
+            // back to the fundamental.
+            double hz = mToneHz * (ch + 1);
+            if (hz >= mOptions.audioRate / 2.0) {
+                hz = mToneHz;
+            }
             // Phase from an integer sample count keeps the tone exact over hours.
             const double phase = 2.0 * M_PI *
                                  std::fmod(hz * static_cast<double>(t), mOptions.audioRate) /

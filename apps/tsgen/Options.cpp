@@ -270,7 +270,7 @@ int64_t Options::effectiveAudioBitrate() const {
         case AudioCodec::kMp3:
             return audioRate >= 32000 ? 128000 : 64000;
         default:
-            return audioChannels > 1 ? 128000 : 64000;
+            return audioChannels > 2 ? 320000 : audioChannels > 1 ? 128000 : 64000;
     }
 }
 
@@ -310,7 +310,7 @@ Output and content:
       --no-vui               rewrite every SPS without VUI parameters (fault)
       --audio CODEC          latm (default), adts, mp2, mp3 or none
       --audio-rate HZ        sampling rate (default 48000)
-      --audio-channels N     1 or 2 (default 2)
+      --audio-channels N     1 or 2, or up to 6 for AAC (6 = 5.1) (default 2)
       --audio-bitrate BPS    audio bit rate (default 128000 AAC, 192000 MP2, 128000 MP3;
                              96000 MP2 and 64000 MP3 below 32 kHz)
       --audio-frames-per-pes N  audio frames in each PES packet (default 1)
@@ -555,8 +555,8 @@ int OptionParser::parse(int argc, char** argv, Options& o) {
                 }
                 break;
             case kOptAudioChannels:
-                if (!intArg(1, 2, o.audioChannels)) {
-                    return bad("--audio-channels (1 or 2)");
+                if (!intArg(1, 6, o.audioChannels)) {
+                    return bad("--audio-channels (1..6)");
                 }
                 break;
             case kOptAudioBitrate:
@@ -774,6 +774,11 @@ int OptionParser::parse(int argc, char** argv, Options& o) {
     if (o.pcrPid >= 0 && o.pcrPid != o.videoPid &&
         std::binary_search(pids.begin(), pids.end(), static_cast<uint16_t>(o.pcrPid))) {
         return fail("--pcr-pid must be the video PID or a PID of its own");
+    }
+    // MPEG-1/2 audio carries at most two channels (ISO/IEC 11172-3 modes).
+    if (o.audioChannels > 2 &&
+        (o.audioCodec == AudioCodec::kMp2 || o.audioCodec == AudioCodec::kMp3)) {
+        return fail("--audio-channels above 2 needs AAC (--audio latm or adts)");
     }
     if (!o.captions.empty() && !o.captionStream) {
         return fail("--caption cannot be combined with --no-caption-stream");

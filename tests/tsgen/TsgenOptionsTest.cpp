@@ -45,6 +45,7 @@ INSTANTIATE_TEST_SUITE_P(
                       BadOption{"-o /dev/null --caption '1:\xe4\xb8\xad'", "no Latin caption code"},
                       BadOption{"-o /dev/null --mux-rate 200000", "below the contents"},
                       BadOption{"-o /dev/null --bogus", "unknown option --bogus"},
+                      BadOption{"-o /dev/null --audio mp2 --audio-channels 6", "needs AAC"},
                       BadOption{"-o /dev/null --seed", "needs a value"},
                       BadOption{"-o /dev/null stray", "unexpected argument 'stray'"}));
 

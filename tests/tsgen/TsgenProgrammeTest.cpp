@@ -17,6 +17,7 @@ struct AudioCase {
     const char* codecName;  // as ffprobe names it
     uint8_t streamType;
     const char* sampleRate = "48000";
+    const char* channels = "2";
 };
 
 class TsgenAudioCodecTest : public ::testing::TestWithParam<AudioCase> {};
@@ -43,7 +44,7 @@ TEST_P(TsgenAudioCodecTest, FfprobeFindsTheProgrammeAndItsStreams) {
     EXPECT_EQ(probe["streams.stream.1.codec_name"], c.codecName);
     EXPECT_EQ(probe["streams.stream.1.id"], "0x112");
     EXPECT_EQ(probe["streams.stream.1.sample_rate"], c.sampleRate);
-    EXPECT_EQ(probe["streams.stream.1.channels"], "2");
+    EXPECT_EQ(probe["streams.stream.1.channels"], c.channels);
     EXPECT_EQ(probe["streams.stream.2.codec_name"], "arib_caption");
     EXPECT_EQ(probe["streams.stream.2.id"], "0x130");
 
@@ -71,6 +72,7 @@ INSTANTIATE_TEST_SUITE_P(
                       AudioCase{"Mp3", "mp3", "mp3", 0x03},
                       AudioCase{"LatmConfigEvery8", "latm --latm-config-interval 8", "aac_latm",
                                 0x11},
+                      AudioCase{"Adts51", "adts --audio-channels 6", "aac", 0x0F, "48000", "6"},
                       AudioCase{"Mp2HalfRate", "mp2 --audio-rate 24000", "mp2", 0x04, "24000"}),
     [](const auto& info) { return std::string(info.param.name); });
 

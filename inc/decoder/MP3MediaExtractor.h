@@ -91,6 +91,9 @@ private:
     uint8_t mEmphasis;
     uint32_t mFrameLength;
     std::unique_ptr<uint8_t[]> mCarryBuffer;  // mFrameLength + 4 bytes
+    // The 32 header bits of the last header that parsed, whose results the fields hold.
+    uint32_t mLastHeaderWord;
+    bool mLastHeaderValid;
 };
 
 }  // namespace TavoPlayer

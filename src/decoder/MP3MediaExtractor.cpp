@@ -78,7 +78,9 @@ MP3MediaExtractor::MP3MediaExtractor(android::sp<RingBuffer> ring)
       mRights(false),
       mOriginal(false),
       mEmphasis(0),
-      mFrameLength(0) {}
+      mFrameLength(0),
+      mLastHeaderWord(0),
+      mLastHeaderValid(false) {}
 
 MP3MediaExtractor::~MP3MediaExtractor() {
     if (mCurrentRecord != nullptr) {
@@ -194,6 +196,16 @@ unsigned int MP3MediaExtractor::parseHeader() {
         TAVO_LOGE("%s: No enough bits to parse header.\n", "parseHeader");
         return RESULT_NOT_ENOUGH_BYTES;
     }
+    const uint8_t* at = mPayload + mPosition;
+    const uint32_t word = (static_cast<uint32_t>(at[0]) << 24) |
+                          (static_cast<uint32_t>(at[1]) << 16) |
+                          (static_cast<uint32_t>(at[2]) << 8) | at[3];
+    if (mLastHeaderValid && word == mLastHeaderWord && left >= kHeaderWithCrcBytes) {
+        // The same 32 bits as the last header that parsed: every field, the frame length
+        // and the duration are already what this header gives (a CBR stream repeats one
+        // header word, two with padding).
+        return RESULT_OK;
+    }
     ReadBitInterface reader(mPayload + mPosition, static_cast<unsigned int>(left));
     const uint32_t sync = reader.readBits(11);
     if (sync != kSyncWord) {
@@ -267,6 +279,8 @@ unsigned int MP3MediaExtractor::parseHeader() {
         frameLength = static_cast<uint32_t>((bitRate * 1000.0 / samplingRate + pad) * 144.0);
     }
     mFrameDuration = static_cast<uint64_t>(frameLength * 8u / bitRate) * 90u;
+    mLastHeaderWord = word;
+    mLastHeaderValid = true;
 
     if (frameLength != mFrameLength) {
         auto carry = std::make_unique<uint8_t[]>(frameLength + 4);

@@ -40,7 +40,115 @@ std::vector<uint8_t> pesDataPacket(uint8_t dataGroupId, const std::vector<uint8_
     return out;
 }
 
+int hexDigit(char c) {
+    if (c >= '0' && c <= '9') {
+        return c - '0';
+    }
+    if (c >= 'a' && c <= 'f') {
+        return c - 'a' + 10;
+    }
+    if (c >= 'A' && c <= 'F') {
+        return c - 'A' + 10;
+    }
+    return -1;
+}
+
+void appendUtf8CodePoint(uint32_t cp, std::vector<uint8_t>& bytes, bool& ok) {
+    // ABNT NBR 15606-1 Latin set: ISO 8859-1 positions, with the ISO 8859-15
+    // replacements for the euro sign and the Š, š, Ž, ž, Œ, œ, Ÿ letters.
+    static const struct {
+        uint32_t codePoint;
+        uint8_t code;
+    } kReplacements[] = {{0x20AC, 0xA4}, {0x0160, 0xA6}, {0x0161, 0xA8}, {0x017D, 0xB4},
+                         {0x017E, 0xB8}, {0x0152, 0xBC}, {0x0153, 0xBD}, {0x0178, 0xBE}};
+    for (const auto& r : kReplacements) {
+        if (r.codePoint == cp) {
+            bytes.push_back(r.code);
+            return;
+        }
+    }
+    if (cp < 0x100) {
+        bytes.push_back(static_cast<uint8_t>(cp));
+        return;
+    }
+    ok = false;
+}
+
 }  // namespace
+
+bool CaptionWriter::encodeText(const std::string& text, std::vector<uint8_t>& bytes,
+                               std::string& error) {
+    bytes.clear();
+    size_t i = 0;
+    while (i < text.size()) {
+        const auto c = static_cast<uint8_t>(text[i]);
+        if (c == '\\') {
+            if (i + 1 >= text.size()) {
+                error = "caption text ends with a lone backslash";
+                return false;
+            }
+            const char e = text[i + 1];
+            if (e == 'x') {
+                const int high = i + 3 < text.size() ? hexDigit(text[i + 2]) : -1;
+                const int low = i + 3 < text.size() ? hexDigit(text[i + 3]) : -1;
+                if (high < 0 || low < 0) {
+                    error = "bad \\x escape in caption text (two hex digits expected)";
+                    return false;
+                }
+                bytes.push_back(static_cast<uint8_t>(high * 16 + low));
+                i += 4;
+                continue;
+            }
+            if (e == 'n') {
+                bytes.push_back(0x0D);  // APR: first position of the next row
+            } else if (e == 'f') {
+                bytes.push_back(0x0C);  // CS: clear screen
+            } else if (e == '\\') {
+                bytes.push_back('\\');
+            } else {
+                error = std::string("unknown escape \\") + e + " in caption text";
+                return false;
+            }
+            i += 2;
+            continue;
+        }
+        uint32_t cp = c;
+        int extra = 0;
+        if (c >= 0xF0) {
+            cp = c & 0x07;
+            extra = 3;
+        } else if (c >= 0xE0) {
+            cp = c & 0x0F;
+            extra = 2;
+        } else if (c >= 0xC0) {
+            cp = c & 0x1F;
+            extra = 1;
+        } else if (c >= 0x80) {
+            error = "caption text is not valid UTF-8";
+            return false;
+        }
+        if (i + extra >= text.size() + (extra ? 0 : 1)) {
+            error = "caption text is not valid UTF-8";
+            return false;
+        }
+        for (int k = 1; k <= extra; ++k) {
+            const auto cc = static_cast<uint8_t>(text[i + k]);
+            if ((cc & 0xC0) != 0x80) {
+                error = "caption text is not valid UTF-8";
+                return false;
+            }
+            cp = (cp << 6) | (cc & 0x3F);
+        }
+        bool ok = true;
+        appendUtf8CodePoint(cp, bytes, ok);
+        if (!ok) {
+            error = "caption character U+" + std::to_string(cp) + " has no Latin caption code";
+            return false;
+        }
+        i += 1 + extra;
+    }
+    return true;
+}
 
 uint16_t CaptionWriter::crc16(const uint8_t* data, size_t size) {
     uint16_t crc = 0;

@@ -2,6 +2,7 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <string>
 #include <vector>
 
 #include "Options.h"
@@ -20,6 +21,13 @@ public:
 
     // Returns 0 with the next PES unit in time order, 1 when none is left.
     int next(PesUnit& unit);
+
+    // Turns caption text from the command line into 8-bit caption codes:
+    // UTF-8 characters map to their ABNT NBR 15606-1 Latin code (ISO 8859-15
+    // positions), and \xNN, \n (APR, 0x0D), \f (CS, 0x0C) and \\ are escapes.
+    // Returns false with a message in error for text that cannot be coded.
+    static bool encodeText(const std::string& text, std::vector<uint8_t>& bytes,
+                           std::string& error);
 
     static std::vector<uint8_t> managementPayload();
     static std::vector<uint8_t> statementPayload(const std::vector<uint8_t>& text);

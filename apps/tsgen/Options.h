@@ -94,22 +94,4 @@ struct Options {
     int64_t effectiveMuxRate() const;
 };
 
-class OptionParser {
-public:
-    // Returns 0 with the options filled in, 1 with a message in error(), or 2
-    // when --help was asked for (the usage text is then in usage()).
-    int parse(int argc, char** argv, Options& options);
-    const std::string& error() const { return mError; }
-    static std::string usage();
-
-private:
-    int fail(const std::string& message);
-    std::string mError;
-};
-
-// Turns caption text from the command line into 8-bit caption codes:
-// UTF-8 characters map to their ABNT NBR 15606-1 Latin code (ISO 8859-15
-// positions), and \xNN, \n (APR, 0x0D), \f (CS, 0x0C) and \\ are escapes.
-bool encodeCaptionText(const std::string& text, std::vector<uint8_t>& bytes, std::string& error);
-
 }  // namespace TavoPlayer::tsgen

@@ -10,6 +10,7 @@ extern "C" {
 #include "AudioEncoder.h"
 #include "CaptionWriter.h"
 #include "FaultInjector.h"
+#include "OptionParser.h"
 #include "Options.h"
 #include "PesResegmenter.h"
 #include "PsiWriter.h"

@@ -122,6 +122,43 @@ TEST(CaptionWriterTest, Crc16MatchesTheCatalogueCheckValue) {
               0x31C3);
 }
 
+TEST(CaptionWriterTest, TextBecomesLatinCaptionCodes) {
+    const struct {
+        const char* text;
+        std::vector<uint8_t> codes;
+    } kCases[] = {
+        {"Ola", {'O', 'l', 'a'}},
+        {"Olá ç", {'O', 'l', 0xE1, ' ', 0xE7}},
+        // ISO 8859-15 positions of the letters that ISO 8859-1 lacks.
+        {"€ŠšŽžŒœŸ", {0xA4, 0xA6, 0xA8, 0xB4, 0xB8, 0xBC, 0xBD, 0xBE}},
+        {"a\\x1D\\x21b", {'a', 0x1D, 0x21, 'b'}},  // SS3 + music note
+        {"\\f\\n\\\\", {0x0C, 0x0D, '\\'}},
+    };
+    for (const auto& c : kCases) {
+        std::vector<uint8_t> codes;
+        std::string error;
+        ASSERT_TRUE(CaptionWriter::encodeText(c.text, codes, error)) << c.text << ": " << error;
+        EXPECT_EQ(codes, c.codes) << c.text;
+    }
+}
+
+TEST(CaptionWriterTest, UncodableTextIsRefusedWithAReason) {
+    const struct {
+        const char* text;
+        const char* error;
+    } kCases[] = {
+        {"\\x1", "two hex digits"},   {"\\xg0", "two hex digits"},     {"a\\", "lone backslash"},
+        {"\\q", "unknown escape"},    {"中", "no Latin caption code"}, {"\xC3", "not valid UTF-8"},
+        {"\xC3(", "not valid UTF-8"}, {"\x80", "not valid UTF-8"},
+    };
+    for (const auto& c : kCases) {
+        std::vector<uint8_t> codes;
+        std::string error;
+        EXPECT_FALSE(CaptionWriter::encodeText(c.text, codes, error)) << c.text;
+        EXPECT_NE(error.find(c.error), std::string::npos) << c.text << ": " << error;
+    }
+}
+
 TEST(CaptionWriterTest, StatementDataGroupLayout) {
     const std::vector<uint8_t> text = {0x0C, 'O', 'l', 0xE1};
     const auto p = CaptionWriter::statementPayload(text);

@@ -1004,12 +1004,16 @@ TEST_P(H264GoldenTest, UnitsMatchTheCheckedInDump) {
     for (const auto& chunk : chunks) {
         es.insert(es.end(), chunk.es.begin(), chunk.es.end());
     }
-    std::map<Bytes, int> reference;
+    // Keyed by size and hash of the bytes.
+    auto key = [](const Bytes& b) {
+        return std::make_pair(b.size(), test::fnv1a64(b.data(), b.size()));
+    };
+    std::map<std::pair<size_t, uint64_t>, int> reference;
     for (const auto& unit : ffmpegAccessUnits(es)) {
-        ++reference[unit.bytes];
+        ++reference[key(unit.bytes)];
     }
     for (size_t i = 0; i < units.size(); ++i) {
-        EXPECT_GT(reference[units[i].bytes]--, 0)
+        EXPECT_GT(reference[key(units[i].bytes)]--, 0)
             << "unit " << i << " of " << units.size() << ", " << units[i].bytes.size() << " bytes";
     }
 }

@@ -111,16 +111,6 @@ TEST(TSPacketParserNullTest, NullParametersAreErrors) {
     EXPECT_EQ(trace.count("parseHeader - null parameter!"), 1u) << trace.all();
 }
 
-TEST(TSPacketParserNullTest, ConstructionState) {
-    TSParsedData data;
-    EXPECT_EQ(data.mPID, 0xFFFF);
-    EXPECT_EQ(data.mPayload, nullptr);
-    EXPECT_EQ(data.mTransportPrivateData, nullptr);
-    TSPacketParser parser;
-    EXPECT_FALSE(parser.inPES());
-    EXPECT_EQ(parser.lastContinuityCounter(), 0u);
-}
-
 // --- sequences: the continuity counter --------------------------------------------
 
 struct Step {

@@ -21,6 +21,8 @@
 // and the ring locks it holds. Since a lock must be released by the thread that
 // took it, the worker releases everything it holds when it sees the exit request;
 // stop() only wakes, joins and cleans up. dump reads the record fields unlocked.
+// Lock order: the first output's writer lock, then the input's read lock, then the
+// further outputs' writer locks (only while a copy is made).
 #pragma once
 
 #include <cstdint>

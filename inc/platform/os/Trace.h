@@ -23,6 +23,8 @@ enum TraceSeverity : uint32_t {
     TRACE_WARNING = 0x40000800u,
     TRACE_INFO = 0x20000800u,
     TRACE_DEBUG = 0x10000800u,
+    // Not a message severity: as a level, nothing is written.
+    TRACE_NONE = 0xFFFFFFFFu,
 };
 
 // One formatted message as the facility saw it; handed to an installed sink.

@@ -17,7 +17,7 @@ namespace {
 
 // Severity words are ordered by their top byte: error 0x80 > ... > debug 0x10.
 // A message passes when its word is at least the configured one.
-constexpr uint32_t kTraceNone = 0xFFFFFFFFu;
+constexpr uint32_t kTraceNone = TRACE_NONE;
 
 std::atomic<uint32_t> gLevel{TRACE_INFO};
 std::atomic<bool> gInitialized{false};

@@ -115,6 +115,8 @@ TEST(TraceTest, LevelFiltersWhatReachesStderr) {
     EXPECT_FALSE(OneSegPGL_TraceEnabled(TRACE_DEBUG));
     setTraceLevel(TRACE_DEBUG);
     EXPECT_TRUE(OneSegPGL_TraceEnabled(TRACE_DEBUG));
+    setTraceLevel(TRACE_NONE);
+    EXPECT_FALSE(OneSegPGL_TraceEnabled(TRACE_ERROR));
     setTraceLevel(TRACE_INFO);
 }
 

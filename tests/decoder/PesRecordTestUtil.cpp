@@ -1,6 +1,8 @@
 #include "PesRecordTestUtil.h"
 
 #include <algorithm>
+#include <atomic>
+#include <chrono>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
@@ -8,8 +10,11 @@
 #include <iterator>
 #include <new>
 #include <sstream>
+#include <thread>
 
+#include "common/Synchronization.h"
 #include "common/data/PESData.h"
+#include "tsparser/TSParser.h"
 
 namespace TavoPlayer::test {
 
@@ -130,6 +135,67 @@ std::vector<ExtractedUnit> runExtractor(MediaExtractor& extractor, RingBuffer& r
     }
     while (pull() == MediaExtractor::RESULT_OK) {
     }
+    return units;
+}
+
+std::vector<ExtractedUnit> runThroughTsParser(MediaExtractor& extractor,
+                                              const android::sp<RingBuffer>& output,
+                                              const std::vector<uint8_t>& ts, uint16_t pid,
+                                              int kind, size_t outputSize) {
+    const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(60);
+    android::sp<RingBuffer> input = makeRing(20, "TestTS");
+    android::sp<Synchronization> clock = new Synchronization();
+    android::sp<TSParser> parser = new TSParser(kind);
+    parser->setInput(input);
+    parser->addOutput(output, nullptr);
+    parser->configure(clock);
+    std::vector<ExtractedUnit> units;
+    if (parser->start() != 0) {
+        return units;
+    }
+    std::atomic<bool> fed{false};
+    std::thread feeder([&] {
+        std::vector<uint8_t> batch;
+        auto flush = [&] {
+            while (!batch.empty() && std::chrono::steady_clock::now() < deadline) {
+                const auto size = static_cast<uint32_t>(batch.size());
+                if (input->waitForSpace(size)) {
+                    std::memcpy(input->writePointer(), batch.data(), size);
+                    input->commitWrite(size);
+                    batch.clear();
+                }
+            }
+        };
+        for (size_t at = 0; at + 188 <= ts.size(); at += 188) {
+            if ((((ts[at + 1] & 0x1F) << 8) | ts[at + 2]) == pid) {
+                batch.insert(batch.end(), ts.begin() + static_cast<long>(at),
+                             ts.begin() + static_cast<long>(at + 188));
+                if (batch.size() >= 64 * 188) {
+                    flush();
+                }
+            }
+        }
+        flush();
+        fed = true;
+    });
+    std::vector<uint8_t> out(outputSize);
+    int idle = 0;
+    while (idle < 3 && std::chrono::steady_clock::now() < deadline) {
+        unsigned long length = 0;
+        long long pts = 0;
+        unsigned char flags = 0;
+        const unsigned int result =
+            extractor.getDecodableUnit(out.data(), out.size(), &length, &pts, &flags);
+        if (result == MediaExtractor::RESULT_OK && length > 0) {
+            units.push_back({std::vector<uint8_t>(out.begin(), out.begin() + length), pts, flags});
+        }
+        // Done once everything is fed and parsed and three waits in a row found nothing.
+        idle = (result == MediaExtractor::RESULT_NO_INPUT && fed && input->usedSpace() == 0)
+                   ? idle + 1
+                   : 0;
+    }
+    feeder.join();
+    parser->stop();
     return units;
 }
 

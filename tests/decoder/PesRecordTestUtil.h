@@ -57,6 +57,16 @@ std::vector<ExtractedUnit> runExtractor(MediaExtractor& extractor, RingBuffer& r
                                         size_t outputSize = 4u << 20,
                                         unsigned* ringFaults = nullptr);
 
+// Feeds the TS packets of `pid` from `ts` (188-byte packets) through the system's TS
+// parser module of `kind` into `output`, on a feeder thread, while `extractor` reads
+// from `output` on this thread; returns the units once the parser has taken every
+// packet and no more records come. The parser emits a PES only when the next one
+// starts, so the last PES of the stream is never seen.
+std::vector<ExtractedUnit> runThroughTsParser(MediaExtractor& extractor,
+                                              const android::sp<RingBuffer>& output,
+                                              const std::vector<uint8_t>& ts, uint16_t pid,
+                                              int kind, size_t outputSize = 4u << 20);
+
 // Re-cuts an elementary stream into PES chunks of `size` bytes; every chunk carries
 // the PTS `firstPts` + index x `ptsStep`.
 std::vector<PesChunk> fixedCuts(const std::vector<uint8_t>& es, size_t size, uint64_t firstPts,

@@ -101,7 +101,7 @@ private:
         if (mSource.paced())
             mPacer.endOfStream(monotonicNs());
         if (n == DemuxSource::kRestart) {
-            TAVO_LOGI("%s: %s: looping to the start\n", "DemuxSource", mSource.describe().c_str());
+            TAVO_LOGD("%s: %s: looping to the start\n", "DemuxSource", mSource.describe().c_str());
             return true;
         }
         mFinished = true;  // the paced packets still held go out first

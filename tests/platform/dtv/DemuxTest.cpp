@@ -434,22 +434,6 @@ TEST_F(DemuxTest, GarbageBetweenPacketsIsSkippedAndTheRestDelivered) {
     EXPECT_TRUE(trace.contains("ends with 165 bytes that are no whole TS packet")) << trace.all();
 }
 
-TEST_F(DemuxTest, FileThatIsNoTransportStreamIsReportedAndDeliversNothing) {
-    std::vector<uint8_t> text;
-    const std::string line = "this is a text file, not a transport stream\n";
-    for (int i = 0; i < 500; ++i)
-        text.insert(text.end(), line.begin(), line.end());
-    TempFile file(text, ".txt");
-    TraceCapture trace;
-    ScopedDemuxSource source("file:" + file.path());
-    const int handle = start(0x100);
-    ASSERT_GE(handle, 0);  // the file opens; it just holds no packets
-    EXPECT_TRUE(readPackets(handle, 1, 100ms).empty());
-    ASSERT_TRUE(test::waitUntil([] { return Demux::instance().sourceStats().ended; }, kDeadline));
-    EXPECT_TRUE(readPackets(handle, 1, 100ms).empty());
-    EXPECT_TRUE(trace.contains("held no TS packets")) << trace.all();
-}
-
 // --- UDP ------------------------------------------------------------------------
 
 class UdpSender {

@@ -77,9 +77,10 @@ Demuxed demux(const std::string& path, const char* format = nullptr) {
 // ADTS packets through FFmpeg's aac_adtstoasc: raw access units and the
 // AudioSpecificConfig it derives.
 bool adtsToRaw(const std::string& path, std::vector<std::vector<uint8_t>>* units,
-               std::vector<uint8_t>* asc) {
+               std::vector<uint8_t>* asc, const char* format = "aac") {
     AVFormatContext* ctx = nullptr;
-    if (avformat_open_input(&ctx, path.c_str(), av_find_input_format("aac"), nullptr) < 0) {
+    const AVInputFormat* input = format ? av_find_input_format(format) : nullptr;
+    if (avformat_open_input(&ctx, path.c_str(), input, nullptr) < 0) {
         return false;
     }
     bool ok = false;
@@ -390,6 +391,63 @@ TEST_F(AACReferenceTest, ExoPlayerLatmInTransportStream) {
     expectGolden("aac_exoplayer_sample_latm_ts.txt", units);
     EXPECT_EQ(ref.channels, decoded.channels);
 }
+
+// Whole transport streams from tsgen: the audio PID's PES payloads go to the
+// extractor as the TS parser would deliver them; FFmpeg demuxes the same file.
+struct TsgenCase {
+    std::string name;
+    std::string args;
+    bool adts;
+};
+
+class AACTsgenTest : public AACReferenceTest, public ::testing::WithParamInterface<TsgenCase> {};
+
+TEST_P(AACTsgenTest, UnitsAndTimesMatchFfmpeg) {
+#ifndef TAVO_TSGEN_PATH
+    GTEST_SKIP() << "tsgen is not part of this build";
+#else
+    const TsgenCase& c = GetParam();
+    const std::string path = (mDir / (c.name + ".ts")).string();
+    ASSERT_TRUE(test::runCommand(std::string(TAVO_TSGEN_PATH) + " -o " + path +
+                                 " -d 2 --size 160x120 --audio " + (c.adts ? "adts " : "latm ") +
+                                 c.args + " >/dev/null 2>&1"));
+    const Demuxed ref = demux(path);
+    ASSERT_TRUE(ref.ok);
+    ASSERT_GT(ref.packets.size(), 50u);
+    std::vector<test::PesChunk> records;
+    for (const auto& p : test::pesPayloadsOfPid(test::readFile(path), 0x112)) {
+        records.push_back({p.es, p.pts});
+    }
+    const auto layer =
+        c.adts ? AACMediaExtractor::TRANSPORT_LAYER_ADTS : AACMediaExtractor::TRANSPORT_LAYER_LOAS;
+    const auto units = extract(records, layer);
+    ASSERT_EQ(ref.packets.size() - 1, units.size());
+    for (size_t i = 1; i < units.size(); ++i) {
+        EXPECT_EQ(ref.packets[i].pts, units[i].pts) << "unit " << i;
+    }
+    if (c.adts) {
+        std::vector<std::vector<uint8_t>> reference;
+        std::vector<uint8_t> asc;
+        ASSERT_TRUE(adtsToRaw(path, &reference, &asc, nullptr));
+        expectUnits(units, reference, asc);
+    }
+    const Decoded decoded = decodeRaw(units[0].bytes, units);
+    EXPECT_EQ(0, decoded.errors);
+    EXPECT_EQ(static_cast<int>(units.size()) - 1, decoded.frames);
+    EXPECT_EQ(ref.sampleRate, decoded.sampleRate);
+    EXPECT_EQ(ref.channels, decoded.channels);
+#endif
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Streams, AACTsgenTest,
+    ::testing::Values(TsgenCase{"LatmOneFramePerPes", "", false},
+                      TsgenCase{"LatmThreeFramesPerPes", "--audio-frames-per-pes 3", false},
+                      TsgenCase{"LatmOddPesCuts", "--audio-pes-bytes 333", false},
+                      TsgenCase{"LatmConfigEveryFifthFrame", "--latm-config-interval 5", false},
+                      TsgenCase{"AdtsOneFramePerPes", "", true},
+                      TsgenCase{"AdtsOddPesCuts", "--audio-pes-bytes 211", true}),
+    [](const auto& info) { return info.param.name; });
 
 }  // namespace
 }  // namespace TavoPlayer

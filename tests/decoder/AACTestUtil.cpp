@@ -13,7 +13,7 @@ void BitSink::put(uint32_t value, unsigned int bits) {
         if (mBits % 8 == 0) {
             mBytes.push_back(0);
         }
-        if ((value >> i) & 1u) {
+        if (i < 32 && ((value >> i) & 1u)) {  // fields wider than 32 bits are zero-extended
             mBytes.back() |= static_cast<uint8_t>(0x80u >> (mBits % 8));
         }
         ++mBits;
@@ -224,17 +224,20 @@ std::vector<PesPayload> pesPayloadsOfPid(const std::vector<uint8_t>& ts, uint16_
         }
     }
     std::vector<PesPayload> out;
+    uint64_t lastPts = 0;  // a PES without PTS carries the last one seen, as the TS parser does
     for (const auto& pes : packets) {
         if (pes.size() < 9 || pes[0] != 0 || pes[1] != 0 || pes[2] != 1) {
             continue;
         }
         PesPayload unit;
+        unit.pts = lastPts;
         const size_t headerEnd = 9u + pes[8];
         if ((pes[7] & 0x80) && pes.size() >= 14) {
             unit.pts = (static_cast<uint64_t>(pes[9] & 0x0E) << 29) |
                        (static_cast<uint64_t>(pes[10]) << 22) |
                        (static_cast<uint64_t>(pes[11] & 0xFE) << 14) |
                        (static_cast<uint64_t>(pes[12]) << 7) | (pes[13] >> 1);
+            lastPts = unit.pts;
         }
         // PES_packet_length bounds the payload when given; otherwise all of it.
         size_t end = pes.size();

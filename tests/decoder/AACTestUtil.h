@@ -98,7 +98,8 @@ std::string dumpUnits(const std::vector<Unit>& units);
 std::string sharedStream(const std::string& name);
 
 // The PES payloads (with PTS) of one PID in a 188-byte TS, as a TS parser would
-// hand them on (ISO/IEC 13818-1, 2.4.3.2 and 2.4.3.6).
+// hand them on (ISO/IEC 13818-1, 2.4.3.2 and 2.4.3.6); a PES without PTS carries
+// the last PTS seen.
 struct PesPayload {
     std::vector<uint8_t> es;
     uint64_t pts = 0;

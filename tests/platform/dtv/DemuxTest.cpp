@@ -438,10 +438,18 @@ TEST_F(DemuxTest, GarbageBetweenPacketsIsSkippedAndTheRestDelivered) {
 
 class UdpSender {
 public:
-    explicit UdpSender(int port) : mFd(socket(AF_INET, SOCK_DGRAM, 0)) {
+    // To `group` (127.0.0.1 by default) on `port`; a multicast group is sent to
+    // through the loopback interface.
+    explicit UdpSender(int port, const char* group = "127.0.0.1")
+        : mFd(socket(AF_INET, SOCK_DGRAM, 0)) {
         mTo.sin_family = AF_INET;
         mTo.sin_port = htons(static_cast<uint16_t>(port));
-        mTo.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+        inet_pton(AF_INET, group, &mTo.sin_addr);
+        in_addr loopback{};
+        loopback.s_addr = htonl(INADDR_LOOPBACK);
+        setsockopt(mFd, IPPROTO_IP, IP_MULTICAST_IF, &loopback, sizeof loopback);
+        const unsigned char loop = 1;
+        setsockopt(mFd, IPPROTO_IP, IP_MULTICAST_LOOP, &loop, sizeof loop);
     }
     ~UdpSender() { close(mFd); }
     void send(const uint8_t* data, size_t size) {
@@ -497,6 +505,24 @@ TEST_F(DemuxTest, UdpDatagramsOfOneToSevenPacketsArriveIntact) {
     EXPECT_EQ(summary(readPackets(other, 143)), summary(expected[0x101]));
     EXPECT_TRUE(trace.contains("UDP datagram of 812 bytes is not a whole number of TS packets"))
         << trace.all();
+}
+
+TEST_F(DemuxTest, UdpMulticastGroupIsJoinedOnTheGivenInterface) {
+    const int port = test::freeUdpPort();
+    ScopedDemuxSource source("udp://239.255.42.42:" + std::to_string(port) + "?iface=127.0.0.1");
+    const int handle = start(0x100);
+    if (handle < 0)
+        GTEST_SKIP() << "this host cannot join a multicast group on loopback";
+    StreamPlan plan;
+    plan.pids = {0x100};
+    plan.rounds = 21;
+    const std::vector<uint8_t> stream = buildStream(plan);
+    UdpSender sender(port, "239.255.42.42");
+    for (size_t at = 0; at < stream.size(); at += 7 * 188)
+        sender.send(stream.data() + at, 7 * 188);
+    auto expected = test::toPackets(stream);
+    expected.pop_back();  // waits for a sync byte after it
+    EXPECT_EQ(summary(readPackets(handle, 20)), summary(expected));
 }
 
 }  // namespace

@@ -976,6 +976,121 @@ INSTANTIATE_TEST_SUITE_P(
         StreamCase{"ProgressiveBFrames", "aud=1:keyint=12:bframes=2:force-cfr=1", "", 1501}),
     [](const auto& info) { return std::string(info.param.name); });
 
+// --- generated transport streams ------------------------------------------------------
+
+class H264TsgenTest : public H264Fixture {
+protected:
+    // The video PES of a generated stream, and libavcodec's units of the same bytes.
+    bool generate(const std::string& arguments) {
+        const Bytes ts = test::runTsgen(arguments);
+        if (ts.empty()) {
+            return false;
+        }
+        mChunks = test::pesFromTs(ts, 0x111);
+        Bytes es;
+        for (const auto& chunk : mChunks) {
+            es.insert(es.end(), chunk.es.begin(), chunk.es.end());
+        }
+        mReference = ffmpegAccessUnits(es);
+        return true;
+    }
+    std::vector<PesChunk> mChunks;
+    std::vector<ReferenceUnit> mReference;
+};
+
+TEST_F(H264TsgenTest, Interlaced1080StreamOfOneUnitPerPes) {
+    if (!generate("-d 1 --audio none --no-caption-stream")) {
+        GTEST_SKIP() << "tsgen not available";
+    }
+    ASSERT_EQ(mReference.size(), mChunks.size());
+    const auto units = run(mChunks);
+    ASSERT_EQ(units.size(), mReference.size());
+    for (size_t i = 0; i < units.size(); ++i) {
+        ASSERT_EQ(units[i].bytes, mReference[i].bytes) << "unit " << i;
+        EXPECT_EQ(units[i].pts, static_cast<long long>(mChunks[i].pts)) << "unit " << i;
+        EXPECT_EQ((units[i].flags & H264MediaExtractor::kFlagIdr) != 0, mReference[i].key);
+    }
+    EXPECT_EQ(units[0].flags, H264MediaExtractor::kFlagIdr | H264MediaExtractor::kFlagSps);
+    // 1088 coded lines (34 field macroblock pairs) cropped by 2 x 4 to 1080.
+    EXPECT_EQ(mExtractor->getCroppedWidth(), 1920u);
+    EXPECT_EQ(mExtractor->getCroppedHeight(), 1080u);
+    // 29.97 Hz without fixed_frame_rate_flag: one tick of 1001/60000 s per unit.
+    EXPECT_EQ(mExtractor->getFrameDuration(), 1501);
+}
+
+TEST_F(H264TsgenTest, StreamWithoutVuiYieldsOneUnitPerRecord) {
+    if (!generate("-d 1 --size 352x288 --audio none --no-caption-stream --no-vui")) {
+        GTEST_SKIP() << "tsgen not available";
+    }
+    test::TraceCapture trace;
+    const auto units = run(mChunks);
+    ASSERT_EQ(units.size(), mReference.size());
+    for (size_t i = 0; i < units.size(); ++i) {
+        ASSERT_EQ(units[i].bytes, mReference[i].bytes) << "unit " << i;
+        EXPECT_EQ(units[i].pts, static_cast<long long>(mChunks[i].pts)) << "unit " << i;
+        EXPECT_EQ(units[i].flags & H264MediaExtractor::kFlagSps, 0);
+    }
+    EXPECT_FALSE(mExtractor->isFrameDurationKnown());
+    EXPECT_EQ(trace.count("decodeSPS: VUI is not present"), 1u);
+}
+
+TEST_F(H264TsgenTest, StreamWithoutDelimitersSwitchesToTheWorkaround) {
+    if (!generate("-d 2 --size 352x288 --audio none --no-caption-stream --no-aud --gop 100")) {
+        GTEST_SKIP() << "tsgen not available";
+    }
+    ASSERT_EQ(mReference.size(), mChunks.size());
+    ASSERT_GT(mChunks.size(), 40u);
+    test::TraceCapture trace;
+    const auto units = run(mChunks);
+    EXPECT_EQ(trace.count("getNextAccessUnit: apply workaround"), 1u);
+    // The first record (it has the SPS), nothing for the next 31, then one per record.
+    ASSERT_EQ(units.size(), 1 + (mChunks.size() - 32));
+    EXPECT_EQ(units[0].bytes, mReference[0].bytes);
+    for (size_t i = 1; i < units.size(); ++i) {
+        const size_t record = 31 + i;
+        const Bytes& whole = mReference[record].bytes;
+        // The unit runs from the picture's first slice (its SEI before it is left out)
+        // to the end of the record.
+        ASSERT_LE(units[i].bytes.size(), whole.size());
+        EXPECT_TRUE(std::equal(units[i].bytes.rbegin(), units[i].bytes.rend(), whole.rbegin()))
+            << "record " << record;
+        EXPECT_EQ(units[i].pts, static_cast<long long>(mChunks[record].pts));
+    }
+}
+
+TEST_F(H264TsgenTest, FixedSizePesCutsUnitsAtRecordEnds) {
+    if (!generate("-d 1 --size 352x288 --audio none --no-caption-stream --video-pes-bytes 1500")) {
+        GTEST_SKIP() << "tsgen not available";
+    }
+    Bytes es;
+    std::vector<size_t> recordEnds;
+    for (const auto& chunk : mChunks) {
+        es.insert(es.end(), chunk.es.begin(), chunk.es.end());
+        recordEnds.push_back(es.size());
+    }
+    std::map<size_t, size_t> unitAt;
+    size_t offset = 0;
+    for (size_t i = 0; i < mReference.size(); ++i) {
+        unitAt[offset] = i;
+        offset += mReference[i].bytes.size();
+    }
+    const auto units = run(mChunks);
+    ASSERT_FALSE(units.empty());
+    size_t searchFrom = 0;
+    for (const auto& unit : units) {
+        auto it = std::search(es.begin() + static_cast<long>(searchFrom), es.end(),
+                              unit.bytes.begin(), unit.bytes.end());
+        ASSERT_NE(it, es.end());
+        const size_t at = static_cast<size_t>(it - es.begin());
+        // Inside one record, starting at one of FFmpeg's units (or one byte into its
+        // 4-byte start code).
+        const size_t end = *std::upper_bound(recordEnds.begin(), recordEnds.end(), at);
+        EXPECT_LE(at + unit.bytes.size(), end);
+        EXPECT_TRUE(unitAt.count(at) != 0 || unitAt.count(at - 1) != 0) << "unit at " << at;
+        searchFrom = at + unit.bytes.size();
+    }
+}
+
 // --- sample broadcasts: golden dumps --------------------------------------------------
 
 struct SampleCase {

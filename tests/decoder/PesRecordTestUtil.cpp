@@ -7,6 +7,7 @@
 #include <cstdlib>
 #include <cstring>
 #include <fstream>
+#include <functional>
 #include <iterator>
 #include <new>
 #include <sstream>
@@ -320,6 +321,22 @@ int probePid(const std::string& path, const std::string& type) {
         return -1;
     }
     return static_cast<int>(std::strtol(line, nullptr, 0));
+}
+
+std::vector<uint8_t> runTsgen(const std::string& arguments) {
+#ifdef TAVO_TSGEN_PATH
+    const std::string path = std::string(TAVO_BINARY_DIR) + "/extractor_tsgen_" +
+                             std::to_string(std::hash<std::string>()(arguments)) + ".ts";
+    if (!runCommand(std::string(TAVO_TSGEN_PATH) + " -o '" + path + "' " + arguments)) {
+        return {};
+    }
+    std::vector<uint8_t> ts = readFile(path);
+    std::remove(path.c_str());
+    return ts;
+#else
+    (void)arguments;
+    return {};
+#endif
 }
 
 std::vector<uint8_t> readFile(const std::string& path) {

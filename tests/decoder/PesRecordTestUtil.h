@@ -90,6 +90,10 @@ std::string compareGolden(const std::string& name, const std::string& dump);
 // -1 when ffprobe finds none.
 int probePid(const std::string& path, const std::string& type);
 
+// Runs the project's stream generator with `arguments` and returns the stream it wrote;
+// empty when the generator is not built or fails.
+std::vector<uint8_t> runTsgen(const std::string& arguments);
+
 // Reads a whole file; empty when it cannot be read.
 std::vector<uint8_t> readFile(const std::string& path);
 

@@ -47,6 +47,9 @@ public:
         explicit TSReceiverThread(TSReceiver& receiver);
 
     private:
+        // Names the kernel thread "TSReceiver" (libutils does so only on Android), so
+        // that logs and tools such as top show it.
+        android::status_t readyToRun() override;
         bool threadLoop() override;
         TSReceiver& mReceiver;  // owns this thread and joins it before it goes
     };

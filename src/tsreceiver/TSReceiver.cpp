@@ -1,5 +1,6 @@
 #include "tsreceiver/TSReceiver.h"
 
+#include <pthread.h>
 #include <unistd.h>
 
 #include <cstring>
@@ -26,6 +27,11 @@ void waitForLastReference(const android::sp<TSReceiver::TSReceiverThread>& threa
 
 TSReceiver::TSReceiverThread::TSReceiverThread(TSReceiver& receiver)
     : android::Thread(false), mReceiver(receiver) {}
+
+android::status_t TSReceiver::TSReceiverThread::readyToRun() {
+    pthread_setname_np(pthread_self(), "TSReceiver");
+    return android::NO_ERROR;
+}
 
 bool TSReceiver::TSReceiverThread::threadLoop() {
     TSReceiver& r = mReceiver;

@@ -396,8 +396,13 @@ TEST_F(TSReceiverLive, StopEndsTheThreadAndReleasesEveryFilter) {
     send({0x111, 0x112}, 100, 0);
     ASSERT_TRUE(drains[0]->waitForPackets(100, kDeadline));
     EXPECT_TRUE(Demux::instance().sourceStats().open);
+    EXPECT_EQ(test::threadsNamed("TSReceiver"), 1u);
+    EXPECT_EQ(test::threadsNamed("DemuxSource"), 1u);
     EXPECT_EQ(receiver->stop(), 0u);
     EXPECT_FALSE(Demux::instance().sourceStats().open);
+    // No thread is left behind.
+    EXPECT_EQ(test::threadsNamed("TSReceiver"), 0u);
+    EXPECT_EQ(test::threadsNamed("DemuxSource"), 0u);
     // The writer lock of the full ring was released by the thread that took it.
     EXPECT_TRUE(rings[0]->waitForSpace(0));
     rings[0]->abortWrite();
@@ -419,6 +424,8 @@ TEST_F(TSReceiverTest, DestroyingARunningReceiverJoinsItsThread) {
     ASSERT_TRUE(drains[0]->waitForPackets(200, kDeadline));
     receiver.clear();  // no stop(): the destructor must not leave anything behind
     EXPECT_FALSE(Demux::instance().sourceStats().open);
+    EXPECT_EQ(test::threadsNamed("TSReceiver"), 0u);
+    EXPECT_EQ(test::threadsNamed("DemuxSource"), 0u);
 }
 
 // --- bad input ----------------------------------------------------------------------

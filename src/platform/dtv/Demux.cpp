@@ -1,5 +1,6 @@
 #include "platform/dtv/Demux.h"
 
+#include <pthread.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -59,6 +60,12 @@ public:
     }
 
 private:
+    // libutils names the kernel thread only on Android.
+    android::status_t readyToRun() override {
+        pthread_setname_np(pthread_self(), "DemuxSource");
+        return android::NO_ERROR;
+    }
+
     bool threadLoop() override {
         if (exitPending())
             return false;

@@ -116,6 +116,9 @@ android::sp<RingBuffer> makeRing(const std::string& name, unsigned int log2Size)
 // Polls `condition` every few milliseconds until it holds or `deadline` passes.
 bool waitUntil(const std::function<bool()>& condition, std::chrono::milliseconds deadline);
 
+// Threads of this process with this name (/proc/self/task/*/comm).
+size_t threadsNamed(const std::string& name);
+
 // A free UDP port on 127.0.0.1 at the time of the call.
 int freeUdpPort();
 

@@ -8,6 +8,7 @@
 #include <fstream>
 #include <sstream>
 #include <string>
+#include <thread>
 #include <vector>
 
 #include "AACTestUtil.h"
@@ -365,6 +366,31 @@ INSTANTIATE_TEST_SUITE_P(Framings, AACResegmentTest,
                          ::testing::Values(Framing::Loas, Framing::Adts), [](const auto& info) {
                              return info.param == Framing::Loas ? "Loas" : "Adts";
                          });
+
+// ---- a writer thread on the other side ----------------------------------------------
+
+// The extractor gives the reader lock back and takes it again while a record is in
+// use; with a small ring the writer keeps waiting for the space that consumption
+// frees. Every unit must come out once, in order.
+TEST_F(AACExtractorTest, WriterThreadAndExtractorShareASmallRing) {
+    android::sp<RingBuffer> ring = test::makeRing(14);  // 16 KiB: a few dozen records
+    const Stream s = makeStream(Framing::Loas, 300, 5, 3);
+    std::thread writer([&] {
+        for (size_t i = 0; i < s.frames.size(); ++i) {
+            while (!test::writePesRecord(*ring, s.frames[i], i * kTicksPerFrame48k, 0xC0)) {
+            }
+        }
+    });
+    android::sp<AACMediaExtractor> extractor =
+        new AACMediaExtractor(ring, AACMediaExtractor::TRANSPORT_LAYER_LOAS);
+    const auto units = drain(*extractor, 4096, 10);
+    writer.join();
+    ASSERT_EQ(s.units.size() - 1, units.size());
+    for (size_t i = 1; i < units.size(); ++i) {
+        ASSERT_EQ(s.units[i], units[i].bytes) << i;
+        EXPECT_EQ(static_cast<long long>(i * kTicksPerFrame48k), units[i].pts) << i;
+    }
+}
 
 // ---- bad input ------------------------------------------------------------------------
 

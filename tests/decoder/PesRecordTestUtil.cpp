@@ -307,22 +307,6 @@ std::string compareGolden(const std::string& name, const std::string& dump) {
     return "differs from " + path;
 }
 
-int probePid(const std::string& path, const std::string& type) {
-    const std::string command = "ffprobe -v error -select_streams " + type +
-                                ":0 -show_entries stream=id -of csv=p=0 '" + path + "'";
-    FILE* pipe = popen(command.c_str(), "r");
-    if (pipe == nullptr) {
-        return -1;
-    }
-    char line[64] = {};
-    const bool got = fgets(line, sizeof line, pipe) != nullptr;
-    pclose(pipe);
-    if (!got) {
-        return -1;
-    }
-    return static_cast<int>(std::strtol(line, nullptr, 0));
-}
-
 std::vector<uint8_t> runTsgen(const std::string& arguments) {
 #ifdef TAVO_TSGEN_PATH
     const std::string path = std::string(TAVO_BINARY_DIR) + "/extractor_tsgen_" +

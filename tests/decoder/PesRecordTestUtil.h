@@ -86,10 +86,6 @@ std::string goldenDump(const std::vector<ExtractedUnit>& units);
 // else a description of the first difference.
 std::string compareGolden(const std::string& name, const std::string& dump);
 
-// The PID of the first stream of `type` ("v" or "a") in a TS, found with ffprobe;
-// -1 when ffprobe finds none.
-int probePid(const std::string& path, const std::string& type);
-
 // Runs the project's stream generator with `arguments` and returns the stream it wrote;
 // empty when the generator is not built or fails.
 std::vector<uint8_t> runTsgen(const std::string& arguments);

@@ -14,7 +14,7 @@
 // across calls (see MediaExtractor).
 //
 // Every bitstream read is bounded by the NAL unit it belongs to, and every NAL unit by
-// its record: a truncated or corrupted SPS or SEI fails with the designed message, and
+// its record: a truncated or corrupted SPS or SEI fails with its logged reason, and
 // a record whose stated payload runs past its end is read only up to its end.
 #pragma once
 

@@ -51,7 +51,7 @@ public:
     // valid header: 0 there, RESULT_RESYNC_FAILED when the payload ends first.
     unsigned int resync();
     // Parses the 32-bit header at the position (ISO/IEC 11172-3, 2.4.1.3). Returns 0,
-    // RESULT_NOT_ENOUGH_BYTES or RESULT_INVALID, with the designed message.
+    // RESULT_NOT_ENOUGH_BYTES or RESULT_INVALID, each logged with its reason.
     unsigned int parseHeader();
     unsigned int getNextFragment(void* buffer, unsigned long size, unsigned long* length,
                                  long long* pts);

@@ -51,7 +51,7 @@ protected:
     // for a record header, and checks that the whole record is readable. On
     // RESULT_OK *record points at the record in place and the reader lock stays held;
     // otherwise the lock has been released (RESULT_NO_INPUT, RESULT_RING_FAULT with
-    // the designed message naming `function`).
+    // the ring-fault message naming `function`).
     unsigned int acquireRecord(const char* function, PESData** record);
     // The record is used up: advance past it, release the reader lock, wake the writer.
     void consumeRecord(PESData* record);

@@ -55,7 +55,7 @@ TEST_F(ReadBitInterfaceTest, EveryStartAndWidthMatchesBitByBitReference) {
     }
 }
 
-TEST_F(ReadBitInterfaceTest, ByteAndSpanningReadsAdvanceAsDesigned) {
+TEST_F(ReadBitInterfaceTest, ByteAndSpanningReadsAdvanceThePointer) {
     ReadBitInterface reader(mBytes.data(), mBytes.size());
     EXPECT_EQ(reader.readBits(8), 0xA5u);
     EXPECT_EQ(reader.getBitCounter(), 0);

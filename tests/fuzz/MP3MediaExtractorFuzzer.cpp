@@ -24,7 +24,7 @@ using TavoPlayer::RingBuffer;
 
 android::sp<RingBuffer> sharedRing() {
     static android::sp<RingBuffer> ring = [] {
-        TavoPlayer::setTraceLevel(0xFFFFFFFFu);  // level "none": nothing is logged while fuzzing
+        TavoPlayer::setTraceLevel(TavoPlayer::TRACE_NONE);  // nothing is logged while fuzzing
         android::sp<RingBuffer> r = new RingBuffer();
         r->configure("FuzzPES", 20);
         return r;

@@ -760,6 +760,11 @@ unsigned int H264MediaExtractor::getNextAccessUnit(void* buffer, unsigned long s
     bool endedInside = false;
     bool firstSliceSeen = false;
 
+    // Opens the AU at a unit; a 4-byte start code is taken whole.
+    auto open = [&](unsigned int unitStart) {
+        haveStart = true;
+        auStart = (unitStart > 0 && mPayload[unitStart - 1] == 0) ? unitStart - 1 : unitStart;
+    };
     // The delimiter rule for AUDs and SPSs: true when the unit ends the open AU.
     auto delimit = [&](unsigned int unitStart) {
         if (haveStart) {
@@ -769,9 +774,7 @@ unsigned int H264MediaExtractor::getNextAccessUnit(void* buffer, unsigned long s
             auEnd = unitStart;
             return true;
         }
-        haveStart = true;
-        // A 4-byte start code is taken whole.
-        auStart = (unitStart > 0 && mPayload[unitStart - 1] == 0) ? unitStart - 1 : unitStart;
+        open(unitStart);
         return false;
     };
 
@@ -862,24 +865,14 @@ unsigned int H264MediaExtractor::getNextAccessUnit(void* buffer, unsigned long s
                 if (mOverrun || firstMb != 0 || !mFrameDurationKnown) {
                     break;
                 }
-                if (mWorkaround) {
-                    if (haveStart) {
-                        auEnd = unitStart;
-                        ends = true;
-                    } else {
-                        haveStart = true;
-                        auStart = (unitStart > 0 && mPayload[unitStart - 1] == 0) ? unitStart - 1
-                                                                                  : unitStart;
-                    }
-                } else if (!firstSliceSeen) {
-                    firstSliceSeen = true;
-                } else if (haveStart) {
+                if (haveStart && (mWorkaround || firstSliceSeen)) {
                     auEnd = unitStart;
                     ends = true;
+                } else if (!mWorkaround && !firstSliceSeen) {
+                    // The first such slice of the call belongs to the AU a delimiter opened.
+                    firstSliceSeen = true;
                 } else {
-                    haveStart = true;
-                    auStart =
-                        (unitStart > 0 && mPayload[unitStart - 1] == 0) ? unitStart - 1 : unitStart;
+                    open(unitStart);
                 }
                 break;
             }

@@ -305,32 +305,31 @@ protected:
     const std::string red = "\e[01;31m", green = "\e[01;32m", bar = "\e[01;33m|";
 };
 
-TEST_F(RingBufferDumpTest, EmptyRingIsAllGreen) {
-    EXPECT_EQ(bar + green + std::string(80, '=') + bar + "\e[m", ring->getRepresentation());
-}
-
-TEST_F(RingBufferDumpTest, FullRingIsAllRed) {
-    fill(8 * kPage, 0);
-    // Head and tail both at column 0: red, red-at-0, green-at-0, then the picture.
-    EXPECT_EQ(bar + red + green + red + std::string(80, '=') + bar + "\e[m",
-              ring->getRepresentation());
-}
-
+// The picture for head and tail positions given in eighths of the ring: used bytes
+// red, free bytes green, 80 columns between yellow bars.
 TEST_F(RingBufferDumpTest, UsedBytesAreRedAndFreeBytesGreen) {
-    const uint32_t size = 8 * kPage;
-    fill(size / 2, size / 4);  // tail at column 20, head at column 40
-    EXPECT_EQ(bar + green + std::string(20, '=') + red + std::string(20, '=') + green +
-                  std::string(40, '=') + bar + "\e[m",
-              ring->getRepresentation());
-}
-
-TEST_F(RingBufferDumpTest, WrappedUsedBytesStartRed) {
-    const uint32_t size = 8 * kPage;
-    fill(size / 2, size / 2);
-    fill(size * 3 / 4, 0);  // head wrapped to column 20, tail at column 40
-    EXPECT_EQ(bar + red + std::string(20, '=') + green + std::string(20, '=') + red +
-                  std::string(40, '=') + bar + "\e[m",
-              ring->getRepresentation());
+    const std::string r = red, g = green;
+    const struct {
+        const char* name;
+        uint32_t headEighths, tailEighths, wrapEighths;  // wrap: write and read this first
+        std::string picture;
+    } cases[] = {
+        {"empty", 0, 0, 0, g + std::string(80, '=')},
+        // Head and tail both at column 0: red in front, red and green inserted at 0.
+        {"full", 8, 0, 0, r + g + r + std::string(80, '=')},
+        {"used in the middle", 4, 2, 0,
+         g + std::string(20, '=') + r + std::string(20, '=') + g + std::string(40, '=')},
+        {"used bytes wrap", 6, 0, 4,
+         r + std::string(20, '=') + g + std::string(20, '=') + r + std::string(40, '=')},
+    };
+    for (const auto& c : cases) {
+        android::sp<RingBuffer> fresh = new RingBuffer;
+        ASSERT_EQ(0u, fresh->configureWithSize("picture", 8 * kPage));
+        ring = fresh;
+        fill(c.wrapEighths * kPage, c.wrapEighths * kPage);
+        fill(c.headEighths * kPage, c.tailEighths * kPage);
+        EXPECT_EQ(bar + c.picture + bar + "\e[m", ring->getRepresentation()) << c.name;
+    }
 }
 
 TEST_F(RingBufferDumpTest, DumpOfUnconfiguredRingIsTwoLines) {

@@ -7,8 +7,6 @@
 
 #include <cstdio>
 #include <filesystem>
-#include <fstream>
-#include <sstream>
 #include <string>
 #include <vector>
 
@@ -26,7 +24,7 @@ extern "C" {
 namespace TavoPlayer {
 namespace {
 
-using test::Unit;
+using Unit = test::ExtractedUnit;
 
 struct Packet {
     std::vector<uint8_t> bytes;
@@ -193,35 +191,17 @@ protected:
     void expectSameUnitsThreeWays(const std::vector<Packet>& packets,
                                   AACMediaExtractor::transportLayer_t layer,
                                   std::vector<Unit>* onePerPes) {
-        std::vector<test::PesChunk> perPacket;
-        std::vector<uint8_t> es;
-        std::vector<test::PesChunk> grouped;
-        for (size_t i = 0; i < packets.size(); ++i) {
-            perPacket.push_back({packets[i].bytes, static_cast<uint64_t>(i) * 1920});
-            if (i % 4 == 0) {
-                grouped.push_back({{}, static_cast<uint64_t>(i) * 1920});
-            }
-            grouped.back().es.insert(grouped.back().es.end(), packets[i].bytes.begin(),
-                                     packets[i].bytes.end());
-            es.insert(es.end(), packets[i].bytes.begin(), packets[i].bytes.end());
+        std::vector<std::vector<uint8_t>> units;
+        for (const Packet& packet : packets) {
+            units.push_back(packet.bytes);
         }
-        std::vector<test::PesChunk> odd;
-        for (size_t at = 0; at < es.size(); at += 181) {
-            odd.push_back({std::vector<uint8_t>(
-                               es.begin() + static_cast<long>(at),
-                               es.begin() + static_cast<long>(std::min(es.size(), at + 181))),
-                           at});
-        }
+        const auto perPacket = test::groupCuts(units, 1, 0, 1920);
         *onePerPes = extract(perPacket, layer);
-        const auto bytesOf = [](const std::vector<Unit>& units) {
-            std::vector<std::vector<uint8_t>> out;
-            for (const auto& u : units) {
-                out.push_back(u.bytes);
-            }
-            return out;
-        };
-        EXPECT_EQ(bytesOf(*onePerPes), bytesOf(extract(odd, layer))) << "odd cuts";
-        EXPECT_EQ(bytesOf(*onePerPes), bytesOf(extract(grouped, layer))) << "grouped";
+        const auto odd = test::fixedCuts(test::joinEs(perPacket), 181, 0, 181);
+        EXPECT_EQ(test::bytesOf(*onePerPes), test::bytesOf(extract(odd, layer))) << "odd cuts";
+        EXPECT_EQ(test::bytesOf(*onePerPes),
+                  test::bytesOf(extract(test::groupCuts(units, 4, 0, 1920), layer)))
+            << "grouped";
     }
 
     // Units: the configuration first, then every reference unit but the first (whose
@@ -244,20 +224,6 @@ protected:
             EXPECT_EQ(0, units[i].flags);
             ASSERT_EQ(reference[i], units[i].bytes) << "unit " << i;
         }
-    }
-
-    // One line per unit against a checked-in dump; TAVO_UPDATE_GOLDEN=1 rewrites it.
-    void expectGolden(const std::string& name, const std::vector<Unit>& units) {
-        const std::string dump = test::dumpUnits(units);
-        const std::string path = std::string(TAVO_SOURCE_DIR) + "/tests/decoder/golden/" + name;
-        if (std::getenv("TAVO_UPDATE_GOLDEN") != nullptr) {
-            std::ofstream(path) << dump;
-        }
-        std::ifstream in(path);
-        ASSERT_TRUE(in.good()) << path;
-        std::stringstream golden;
-        golden << in.rdbuf();
-        EXPECT_EQ(golden.str(), dump);
     }
 
     bool ffmpeg(const std::string& args) {
@@ -302,8 +268,8 @@ TEST_F(AACReferenceTest, FfmpegAdtsAndLatmGiveFfmpegsUnits) {
 }
 
 TEST_F(AACReferenceTest, ExoPlayerAdtsSamples) {
-    const std::string plain = test::sharedStream("exoplayer_sample.adts");
-    const std::string withId3 = test::sharedStream("exoplayer_sample_with_id3.adts");
+    const std::string plain = test::sampleStream("exoplayer_sample.adts");
+    const std::string withId3 = test::sampleStream("exoplayer_sample_with_id3.adts");
     if (plain.empty() || withId3.empty()) {
         GTEST_SKIP() << "sample streams not found in " << TAVO_SHARED_STREAMS_DIR;
     }
@@ -317,7 +283,7 @@ TEST_F(AACReferenceTest, ExoPlayerAdtsSamples) {
     expectUnits(units, reference, asc);
     EXPECT_EQ((std::vector<uint8_t>{0x12, 0x08}),
               std::vector<uint8_t>(units[0].bytes.begin(), units[0].bytes.begin() + 2));
-    expectGolden("aac_exoplayer_sample_adts.txt", units);
+    EXPECT_EQ(test::compareGolden("aac_exoplayer_sample_adts.txt", test::goldenDump(units)), "");
 
     // The same audio with ID3v2 tags: one before the first frame and one between the
     // first and the second. The tags are skipped as junk; the first frame, followed
@@ -330,14 +296,8 @@ TEST_F(AACReferenceTest, ExoPlayerAdtsSamples) {
     EXPECT_EQ(asc, taggedAsc);
     const std::vector<uint8_t> file = test::readFile(withId3);
     ASSERT_FALSE(file.empty());
-    std::vector<test::PesChunk> records;
-    for (size_t at = 0; at < file.size(); at += 500) {
-        records.push_back({std::vector<uint8_t>(
-                               file.begin() + static_cast<long>(at),
-                               file.begin() + static_cast<long>(std::min(file.size(), at + 500))),
-                           at});
-    }
-    const auto tagged = extract(records, AACMediaExtractor::TRANSPORT_LAYER_ADTS);
+    const auto tagged =
+        extract(test::fixedCuts(file, 500, 0, 500), AACMediaExtractor::TRANSPORT_LAYER_ADTS);
     ASSERT_EQ(taggedReference.size() - 2, tagged.size());
     EXPECT_EQ(units[0].bytes, tagged[0].bytes);
     for (size_t i = 1; i < tagged.size(); ++i) {
@@ -346,18 +306,14 @@ TEST_F(AACReferenceTest, ExoPlayerAdtsSamples) {
 }
 
 TEST_F(AACReferenceTest, ExoPlayerLatmInTransportStream) {
-    const std::string path = test::sharedStream("exoplayer_sample_latm.ts");
+    const std::string path = test::sampleStream("exoplayer_sample_latm.ts");
     if (path.empty()) {
         GTEST_SKIP() << "sample stream not found in " << TAVO_SHARED_STREAMS_DIR;
     }
     const Demuxed ref = demux(path);
     ASSERT_TRUE(ref.ok);
-    const auto pes = test::pesPayloadsOfPid(test::readFile(path), 0x100);
-    ASSERT_FALSE(pes.empty());
-    std::vector<test::PesChunk> records;
-    for (const auto& p : pes) {
-        records.push_back({p.es, p.pts});
-    }
+    const auto records = test::pesFromTs(test::readFile(path), 0x100);
+    ASSERT_FALSE(records.empty());
     const auto units = extract(records, AACMediaExtractor::TRANSPORT_LAYER_LOAS);
 
     // FFmpeg's packets: one LOAS frame each. All but the first (the configuration's
@@ -388,7 +344,7 @@ TEST_F(AACReferenceTest, ExoPlayerLatmInTransportStream) {
     EXPECT_EQ(0, decoded.errors);
     EXPECT_EQ(static_cast<int>(units.size()) - 1, decoded.frames);
     EXPECT_EQ(ref.sampleRate, decoded.sampleRate);
-    expectGolden("aac_exoplayer_sample_latm_ts.txt", units);
+    EXPECT_EQ(test::compareGolden("aac_exoplayer_sample_latm_ts.txt", test::goldenDump(units)), "");
     EXPECT_EQ(ref.channels, decoded.channels);
 }
 
@@ -399,6 +355,7 @@ struct TsgenCase {
     std::string args;
     bool adts;
 };
+using test::PrintTo;
 
 class AACTsgenTest : public AACReferenceTest, public ::testing::WithParamInterface<TsgenCase> {};
 
@@ -414,13 +371,9 @@ TEST_P(AACTsgenTest, UnitsAndTimesMatchFfmpeg) {
     const Demuxed ref = demux(path);
     ASSERT_TRUE(ref.ok);
     ASSERT_GT(ref.packets.size(), 50u);
-    std::vector<test::PesChunk> records;
-    for (const auto& p : test::pesPayloadsOfPid(test::readFile(path), 0x112)) {
-        records.push_back({p.es, p.pts});
-    }
-    const auto layer =
-        c.adts ? AACMediaExtractor::TRANSPORT_LAYER_ADTS : AACMediaExtractor::TRANSPORT_LAYER_LOAS;
-    const auto units = extract(records, layer);
+    const auto units = extract(
+        test::pesFromTs(test::readFile(path), 0x112),
+        c.adts ? AACMediaExtractor::TRANSPORT_LAYER_ADTS : AACMediaExtractor::TRANSPORT_LAYER_LOAS);
     ASSERT_EQ(ref.packets.size() - 1, units.size());
     for (size_t i = 1; i < units.size(); ++i) {
         EXPECT_EQ(ref.packets[i].pts, units[i].pts) << "unit " << i;

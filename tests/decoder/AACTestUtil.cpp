@@ -1,11 +1,5 @@
 #include "AACTestUtil.h"
 
-#include <cinttypes>
-#include <cstdio>
-#include <filesystem>
-
-#include "PesRecordTestUtil.h"
-
 namespace TavoPlayer::test {
 
 void BitSink::put(uint32_t value, unsigned int bits) {
@@ -155,101 +149,6 @@ std::vector<uint8_t> patternPayload(size_t size, uint32_t seed) {
     for (auto& b : out) {
         x = x * 1103515245u + 12345u;
         b = static_cast<uint8_t>(x >> 16);
-    }
-    return out;
-}
-
-std::vector<Unit> drain(AACMediaExtractor& extractor, size_t outputSize, int idleCalls) {
-    std::vector<Unit> units;
-    std::vector<uint8_t> buffer(outputSize);
-    int idle = 0;
-    while (idle < idleCalls) {
-        unsigned long length = 0;
-        long long pts = 0;
-        unsigned char flags = 0;
-        const unsigned int result =
-            extractor.getDecodableUnit(buffer.data(), buffer.size(), &length, &pts, &flags);
-        if (result == MediaExtractor::RESULT_NO_INPUT && length == 0) {
-            ++idle;
-            continue;
-        }
-        idle = 0;
-        if (result == MediaExtractor::RESULT_RING_FAULT) {
-            break;
-        }
-        if (length > 0) {
-            units.push_back(
-                {std::vector<uint8_t>(buffer.begin(), buffer.begin() + length), pts, flags});
-        }
-    }
-    return units;
-}
-
-std::string dumpUnits(const std::vector<Unit>& units) {
-    std::string out;
-    char line[96];
-    for (const auto& u : units) {
-        std::snprintf(line, sizeof(line), "%lld %u %zu %016" PRIx64 "\n", u.pts,
-                      static_cast<unsigned int>(u.flags), u.bytes.size(),
-                      fnv1a64(u.bytes.data(), u.bytes.size()));
-        out += line;
-    }
-    return out;
-}
-
-std::string sharedStream(const std::string& name) {
-    const std::filesystem::path path = std::filesystem::path(TAVO_SHARED_STREAMS_DIR) / name;
-    return std::filesystem::exists(path) ? path.string() : std::string();
-}
-
-std::vector<PesPayload> pesPayloadsOfPid(const std::vector<uint8_t>& ts, uint16_t pid) {
-    std::vector<std::vector<uint8_t>> packets;
-    for (size_t at = 0; at + 188 <= ts.size(); at += 188) {
-        const uint8_t* p = &ts[at];
-        if (p[0] != 0x47 || (((p[1] & 0x1F) << 8) | p[2]) != pid) {
-            continue;
-        }
-        size_t payload = 4;
-        if (p[3] & 0x20) {
-            payload += 1 + p[4];
-        }
-        if (!(p[3] & 0x10) || payload >= 188) {
-            continue;
-        }
-        if (p[1] & 0x40) {
-            packets.emplace_back();
-        }
-        if (!packets.empty()) {
-            packets.back().insert(packets.back().end(), p + payload, p + 188);
-        }
-    }
-    std::vector<PesPayload> out;
-    uint64_t lastPts = 0;  // a PES without PTS carries the last one seen, as the TS parser does
-    for (const auto& pes : packets) {
-        if (pes.size() < 9 || pes[0] != 0 || pes[1] != 0 || pes[2] != 1) {
-            continue;
-        }
-        PesPayload unit;
-        unit.pts = lastPts;
-        const size_t headerEnd = 9u + pes[8];
-        if ((pes[7] & 0x80) && pes.size() >= 14) {
-            unit.pts = (static_cast<uint64_t>(pes[9] & 0x0E) << 29) |
-                       (static_cast<uint64_t>(pes[10]) << 22) |
-                       (static_cast<uint64_t>(pes[11] & 0xFE) << 14) |
-                       (static_cast<uint64_t>(pes[12]) << 7) | (pes[13] >> 1);
-            lastPts = unit.pts;
-        }
-        // PES_packet_length bounds the payload when given; otherwise all of it.
-        size_t end = pes.size();
-        const size_t packetLength = (static_cast<size_t>(pes[4]) << 8) | pes[5];
-        if (packetLength != 0 && 6 + packetLength < end) {
-            end = 6 + packetLength;
-        }
-        if (headerEnd <= end) {
-            unit.es.assign(pes.begin() + static_cast<long>(headerEnd),
-                           pes.begin() + static_cast<long>(end));
-            out.push_back(std::move(unit));
-        }
     }
     return out;
 }

@@ -6,6 +6,7 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <filesystem>
 #include <fstream>
 #include <functional>
 #include <iterator>
@@ -16,6 +17,10 @@
 #include "common/Synchronization.h"
 #include "common/data/PESData.h"
 #include "tsparser/TSParser.h"
+
+extern "C" {
+#include <libavcodec/avcodec.h>
+}
 
 namespace TavoPlayer::test {
 
@@ -105,22 +110,63 @@ std::vector<PesChunk> cutAt(const std::vector<uint8_t>& es, const std::vector<si
     return chunks;
 }
 
+std::vector<PesChunk> groupCuts(const std::vector<Bytes>& units, size_t perPes, uint64_t firstPts,
+                                uint64_t ptsStep) {
+    std::vector<PesChunk> chunks;
+    for (size_t i = 0; i < units.size(); ++i) {
+        if (i % perPes == 0) {
+            chunks.push_back({{}, firstPts + i * ptsStep});
+        }
+        chunks.back().es.insert(chunks.back().es.end(), units[i].begin(), units[i].end());
+    }
+    return chunks;
+}
+
+Bytes joinEs(const std::vector<PesChunk>& chunks) {
+    Bytes es;
+    for (const PesChunk& chunk : chunks) {
+        es.insert(es.end(), chunk.es.begin(), chunk.es.end());
+    }
+    return es;
+}
+
+Bytes concat(std::initializer_list<Bytes> parts) {
+    Bytes out;
+    for (const Bytes& part : parts) {
+        out.insert(out.end(), part.begin(), part.end());
+    }
+    return out;
+}
+
+std::vector<Bytes> bytesOf(const std::vector<ExtractedUnit>& units) {
+    std::vector<Bytes> out;
+    for (const ExtractedUnit& unit : units) {
+        out.push_back(unit.bytes);
+    }
+    return out;
+}
+
+unsigned int pullUnit(MediaExtractor& extractor, Bytes& out, std::vector<ExtractedUnit>* units) {
+    unsigned long length = 0;
+    long long pts = 0;
+    unsigned char flags = 0;
+    const unsigned int result =
+        extractor.getDecodableUnit(out.data(), out.size(), &length, &pts, &flags);
+    if (result == MediaExtractor::RESULT_OK && length > 0) {
+        units->push_back({Bytes(out.begin(), out.begin() + static_cast<long>(length)), pts, flags});
+    }
+    return result;
+}
+
 std::vector<ExtractedUnit> runExtractor(MediaExtractor& extractor, RingBuffer& ring,
                                         const std::vector<PesChunk>& chunks, size_t outputSize,
                                         unsigned* ringFaults) {
     std::vector<ExtractedUnit> units;
-    std::vector<uint8_t> out(outputSize);
+    Bytes out(outputSize);
     auto pull = [&]() {
-        unsigned long length = 0;
-        long long pts = 0;
-        unsigned char flags = 0;
-        const unsigned int result =
-            extractor.getDecodableUnit(out.data(), out.size(), &length, &pts, &flags);
+        const unsigned int result = pullUnit(extractor, out, &units);
         if (result == MediaExtractor::RESULT_RING_FAULT && ringFaults != nullptr) {
             ++*ringFaults;
-        }
-        if (result == MediaExtractor::RESULT_OK && length > 0) {
-            units.push_back({std::vector<uint8_t>(out.begin(), out.begin() + length), pts, flags});
         }
         return result;
     };
@@ -135,6 +181,20 @@ std::vector<ExtractedUnit> runExtractor(MediaExtractor& extractor, RingBuffer& r
         writePesRecord(ring, chunk.es, chunk.pts);
     }
     while (pull() == MediaExtractor::RESULT_OK) {
+    }
+    return units;
+}
+
+std::vector<ExtractedUnit> drain(MediaExtractor& extractor, size_t outputSize, int idleCalls) {
+    std::vector<ExtractedUnit> units;
+    Bytes out(outputSize);
+    for (int idle = 0; idle < idleCalls;) {
+        const size_t before = units.size();
+        const unsigned int result = pullUnit(extractor, out, &units);
+        if (result == MediaExtractor::RESULT_RING_FAULT) {
+            break;
+        }
+        idle = (result == MediaExtractor::RESULT_NO_INPUT && units.size() == before) ? idle + 1 : 0;
     }
     return units;
 }
@@ -179,17 +239,10 @@ std::vector<ExtractedUnit> runThroughTsParser(MediaExtractor& extractor,
         flush();
         fed = true;
     });
-    std::vector<uint8_t> out(outputSize);
+    Bytes out(outputSize);
     int idle = 0;
     while (idle < 3 && std::chrono::steady_clock::now() < deadline) {
-        unsigned long length = 0;
-        long long pts = 0;
-        unsigned char flags = 0;
-        const unsigned int result =
-            extractor.getDecodableUnit(out.data(), out.size(), &length, &pts, &flags);
-        if (result == MediaExtractor::RESULT_OK && length > 0) {
-            units.push_back({std::vector<uint8_t>(out.begin(), out.begin() + length), pts, flags});
-        }
+        const unsigned int result = pullUnit(extractor, out, &units);
         // Done once everything is fed and parsed and three waits in a row found nothing.
         idle = (result == MediaExtractor::RESULT_NO_INPUT && fed && input->usedSpace() == 0)
                    ? idle + 1
@@ -229,10 +282,12 @@ std::vector<PesChunk> pesFromTs(const std::vector<uint8_t>& ts, uint16_t pid, si
                       (static_cast<uint64_t>(pes[11] & 0xFE) << 14) |
                       (static_cast<uint64_t>(pes[12]) << 7) | (pes[13] >> 1);
         }
-        if (headerEnd <= pes.size()) {
-            chunks.push_back(
-                {std::vector<uint8_t>(pes.begin() + static_cast<long>(headerEnd), pes.end()),
-                 lastPts});
+        const size_t packetLength = (static_cast<size_t>(pes[4]) << 8) | pes[5];
+        const size_t end = packetLength != 0 ? std::min(pes.size(), 6 + packetLength) : pes.size();
+        if (headerEnd <= end) {
+            chunks.push_back({Bytes(pes.begin() + static_cast<long>(headerEnd),
+                                    pes.begin() + static_cast<long>(end)),
+                              lastPts});
         }
         pes.clear();
     };
@@ -257,6 +312,31 @@ std::vector<PesChunk> pesFromTs(const std::vector<uint8_t>& ts, uint16_t pid, si
     }
     flush();
     return chunks;
+}
+
+std::vector<ParsedUnit> ffmpegParse(const Bytes& es, int codecId) {
+    std::vector<ParsedUnit> units;
+    AVCodecParserContext* parser = av_parser_init(codecId);
+    AVCodecContext* context = avcodec_alloc_context3(nullptr);
+    const uint8_t* data = es.data();
+    int left = static_cast<int>(es.size());
+    while (true) {
+        uint8_t* out = nullptr;
+        int outSize = 0;
+        const int used = av_parser_parse2(parser, context, &out, &outSize, data, left,
+                                          AV_NOPTS_VALUE, AV_NOPTS_VALUE, 0);
+        if (outSize > 0) {
+            units.push_back({Bytes(out, out + outSize), parser->key_frame == 1});
+        }
+        if (left == 0 && outSize == 0) {
+            break;
+        }
+        data += used;
+        left -= used;
+    }
+    avcodec_free_context(&context);
+    av_parser_close(parser);
+    return units;
 }
 
 std::string goldenDump(const std::vector<ExtractedUnit>& units) {
@@ -305,6 +385,11 @@ std::string compareGolden(const std::string& name, const std::string& dump) {
         }
     }
     return "differs from " + path;
+}
+
+std::string sampleStream(const std::string& name) {
+    const std::string path = std::string(TAVO_SHARED_STREAMS_DIR) + "/" + name;
+    return std::filesystem::exists(path) ? path : std::string();
 }
 
 std::vector<uint8_t> runTsgen(const std::string& arguments) {

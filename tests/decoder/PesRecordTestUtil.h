@@ -1,9 +1,12 @@
 // Writes PESData records of given elementary-stream bytes into a ring, the way the TS
 // parser module lays them out: a 40-byte header, then a PES packet whose header is a
 // minimal optional header with a PTS (ISO/IEC 13818-1, 2.4.3.6-7), then the ES bytes.
+// Also the drivers that run an extractor over such records, libavcodec's parsers as
+// an independent reference, and golden dumps.
 #pragma once
 
 #include <cstdint>
+#include <ostream>
 #include <string>
 #include <vector>
 
@@ -14,8 +17,20 @@
 
 namespace TavoPlayer::test {
 
+using Bytes = std::vector<uint8_t>;
+
+// Test parameters print as their case name, so that test names stay readable; a test
+// file brings this in with `using test::PrintTo;`.
+template <typename T>
+requires requires(const T& t) {
+    *static_cast<std::ostream*>(nullptr) << t.name;
+}
+void PrintTo(const T& param, std::ostream* os) {
+    *os << param.name;
+}
+
 struct PesChunk {
-    std::vector<uint8_t> es;
+    Bytes es;
     uint64_t pts = 0;
 };
 
@@ -26,7 +41,7 @@ android::sp<RingBuffer> makeRing(unsigned int log2Size = 20, const std::string& 
 // no room (after its one wait). `streamId` goes into the PES header.
 bool writePesRecord(RingBuffer& ring, const uint8_t* es, size_t esSize, uint64_t pts,
                     uint8_t streamId = 0xE0);
-inline bool writePesRecord(RingBuffer& ring, const std::vector<uint8_t>& es, uint64_t pts,
+inline bool writePesRecord(RingBuffer& ring, const Bytes& es, uint64_t pts,
                            uint8_t streamId = 0xE0) {
     return writePesRecord(ring, es.data(), es.size(), pts, streamId);
 }
@@ -34,20 +49,37 @@ inline bool writePesRecord(RingBuffer& ring, const std::vector<uint8_t>& es, uin
 // Appends a record whose header fields are written as given (mSize, mOffsetES,
 // mSizeES), with `bytes` after the 40-byte header: for inconsistent records.
 bool writeRawRecord(RingBuffer& ring, uint32_t size, uint32_t offsetES, uint32_t sizeES,
-                    uint64_t pts, const std::vector<uint8_t>& bytes);
+                    uint64_t pts, const Bytes& bytes);
 
 // Cuts `es` into chunks at the given offsets (ascending, each inside es), giving the
 // chunk that starts at offsets[i] the PTS ptsOf[i].
-std::vector<PesChunk> cutAt(const std::vector<uint8_t>& es, const std::vector<size_t>& offsets,
+std::vector<PesChunk> cutAt(const Bytes& es, const std::vector<size_t>& offsets,
                             const std::vector<uint64_t>& ptsOf);
+
+// Re-cuts an elementary stream into PES chunks of `size` bytes; every chunk carries
+// the PTS `firstPts` + index x `ptsStep`.
+std::vector<PesChunk> fixedCuts(const Bytes& es, size_t size, uint64_t firstPts, uint64_t ptsStep);
+
+// Puts `perPes` units into each chunk; a chunk's PTS is `firstPts` + (index of its first
+// unit) x `ptsStep`.
+std::vector<PesChunk> groupCuts(const std::vector<Bytes>& units, size_t perPes, uint64_t firstPts,
+                                uint64_t ptsStep);
+
+// The chunks' ES bytes one after the other, and parts joined.
+Bytes joinEs(const std::vector<PesChunk>& chunks);
+Bytes concat(std::initializer_list<Bytes> parts);
 
 // One unit as an extractor delivered it.
 struct ExtractedUnit {
-    std::vector<uint8_t> bytes;
+    Bytes bytes;
     long long pts = 0;
     unsigned char flags = 0;
     bool operator==(const ExtractedUnit&) const = default;
 };
+std::vector<Bytes> bytesOf(const std::vector<ExtractedUnit>& units);
+
+// One getDecodableUnit call into `out`; a delivered unit is appended to *units.
+unsigned int pullUnit(MediaExtractor& extractor, Bytes& out, std::vector<ExtractedUnit>* units);
 
 // Feeds `chunks` as PESData records into `ring` (writing only while the ring has room,
 // so one thread can do both sides) and collects every unit `extractor` delivers until
@@ -57,6 +89,11 @@ std::vector<ExtractedUnit> runExtractor(MediaExtractor& extractor, RingBuffer& r
                                         size_t outputSize = 4u << 20,
                                         unsigned* ringFaults = nullptr);
 
+// Calls getDecodableUnit until `idleCalls` calls in a row found no input (the ring is
+// drained) or the ring faults, collecting what came out.
+std::vector<ExtractedUnit> drain(MediaExtractor& extractor, size_t outputSize = 8192,
+                                 int idleCalls = 3);
+
 // Feeds the TS packets of `pid` from `ts` (188-byte packets) through the system's TS
 // parser module of `kind` into `output`, on a feeder thread, while `extractor` reads
 // from `output` on this thread; returns the units once the parser has taken every
@@ -64,19 +101,20 @@ std::vector<ExtractedUnit> runExtractor(MediaExtractor& extractor, RingBuffer& r
 // starts, so the last PES of the stream is never seen.
 std::vector<ExtractedUnit> runThroughTsParser(MediaExtractor& extractor,
                                               const android::sp<RingBuffer>& output,
-                                              const std::vector<uint8_t>& ts, uint16_t pid,
-                                              int kind, size_t outputSize = 4u << 20);
+                                              const Bytes& ts, uint16_t pid, int kind,
+                                              size_t outputSize = 4u << 20);
 
-// Re-cuts an elementary stream into PES chunks of `size` bytes; every chunk carries
-// the PTS `firstPts` + index x `ptsStep`.
-std::vector<PesChunk> fixedCuts(const std::vector<uint8_t>& es, size_t size, uint64_t firstPts,
-                                uint64_t ptsStep);
+// The PES packets of `pid` in a transport stream (ISO/IEC 13818-1, 2.4.3.2 and
+// 2.4.3.6), each as its ES payload (bounded by PES_packet_length when given) with its
+// PTS (the last PTS seen when a packet has none). A small, independent splitter.
+std::vector<PesChunk> pesFromTs(const Bytes& ts, uint16_t pid, size_t packetSize = 188);
 
-// The PES packets of `pid` in a 188-byte-packet transport stream (ISO/IEC 13818-1,
-// 2.4.3.2 and 2.4.3.6), each as its ES payload with its PTS (the last PTS seen when
-// a packet has none). A small, independent splitter for test inputs only.
-std::vector<PesChunk> pesFromTs(const std::vector<uint8_t>& ts, uint16_t pid,
-                                size_t packetSize = 188);
+// libavcodec's parser for `codecId` (an AVCodecID) over a whole elementary stream.
+struct ParsedUnit {
+    Bytes bytes;
+    bool key = false;
+};
+std::vector<ParsedUnit> ffmpegParse(const Bytes& es, int codecId);
 
 // One line per unit: "pts=<90 kHz> flags=<n> size=<bytes> fnv=<FNV-1a 64 of the bytes>".
 std::string goldenDump(const std::vector<ExtractedUnit>& units);
@@ -86,12 +124,15 @@ std::string goldenDump(const std::vector<ExtractedUnit>& units);
 // else a description of the first difference.
 std::string compareGolden(const std::string& name, const std::string& dump);
 
+// Path of a sample stream in the shared folder, empty when it is absent.
+std::string sampleStream(const std::string& name);
+
 // Runs the project's stream generator with `arguments` and returns the stream it wrote;
 // empty when the generator is not built or fails.
-std::vector<uint8_t> runTsgen(const std::string& arguments);
+Bytes runTsgen(const std::string& arguments);
 
 // Reads a whole file; empty when it cannot be read.
-std::vector<uint8_t> readFile(const std::string& path);
+Bytes readFile(const std::string& path);
 
 // Runs a shell command; true when it exits with status 0.
 bool runCommand(const std::string& command);

@@ -5,17 +5,18 @@
 
 #include <gtest/gtest.h>
 
-#include <functional>
 #include <string>
 #include <vector>
 
 #include "AACTestUtil.h"
+#include "PesRecordTestUtil.h"
 
 namespace TavoPlayer {
 namespace {
 
 using test::adtsFrame;
 using test::AdtsOptions;
+using test::AscFields;
 using test::loasFrame;
 using test::LoasOptions;
 using test::patternPayload;
@@ -97,13 +98,7 @@ private:
     HANDLE_TRANSPORTDEC mHandle;
 };
 
-std::vector<uint8_t> concat(std::initializer_list<std::vector<uint8_t>> parts) {
-    std::vector<uint8_t> out;
-    for (const auto& p : parts) {
-        out.insert(out.end(), p.begin(), p.end());
-    }
-    return out;
-}
+using test::concat;
 
 const std::vector<uint8_t> kA = patternPayload(40, 1);
 const std::vector<uint8_t> kB = patternPayload(300, 2);  // length escape (255 + 45)
@@ -112,158 +107,66 @@ const std::vector<uint8_t> kC = patternPayload(7, 3);
 struct HeaderCase {
     std::string name;
     TRANSPORT_TYPE type;
-    std::function<std::vector<uint8_t>()> build;
+    std::vector<uint8_t> stream;
     std::vector<Outcome> expected;
 };
-
-LoasOptions v1() {
-    LoasOptions o;
-    o.audioMuxVersion = 1;
-    return o;
-}
+using test::PrintTo;
 
 std::vector<HeaderCase> headerCases() {
     const auto ok = [](const std::vector<uint8_t>& u) { return Outcome{TRANSPORTDEC_OK, u}; };
     const auto err = [](uint32_t e) { return Outcome{e, {}}; };
-    LoasOptions same;
-    same.useSameStreamMux = true;
-    return {
-        {"LoasVersion0", TT_MP4_LOAS, [] { return loasFrame({}, {kA}); }, {ok(kA)}},
-        {"LoasVersion1", TT_MP4_LOAS, [] { return loasFrame(v1(), {kA}); }, {ok(kA)}},
-        {"LoasVersion1WithAscFillBits",
-         TT_MP4_LOAS,
-         [] {
-             LoasOptions o = v1();
-             o.ascFillBits = 13;
-             return loasFrame(o, {kA});
-         },
-         {ok(kA)}},
-        {"LoasLongPayloadLength", TT_MP4_LOAS, [] { return loasFrame({}, {kB}); }, {ok(kB)}},
-        {"LoasCrcByte",
-         TT_MP4_LOAS,
-         [] {
-             LoasOptions o;
-             o.crc = true;
-             return loasFrame(o, {kA});
-         },
-         {ok(kA)}},
-        {"LoasOtherDataVersion0",
-         TT_MP4_LOAS,
-         [] {
-             LoasOptions o;
-             o.otherDataBits = 300;  // two escape-coded bytes
-             return loasFrame(o, {kA});
-         },
-         {ok(kA)}},
-        {"LoasOtherDataVersion1",
-         TT_MP4_LOAS,
-         [] {
-             LoasOptions o = v1();
-             o.otherDataBits = 17;
-             return loasFrame(o, {kC});
-         },
-         {ok(kC)}},
-        {"LoasSubFramesAreUnits",
-         TT_MP4_LOAS,
-         [] {
-             return loasFrame({}, {kA, kB, kC});
-         },
-         {ok(kA), ok(kB), ok(kC)}},
-        {"LoasUseSameStreamMuxAfterConfig",
-         TT_MP4_LOAS,
-         [same] {
-             return concat({loasFrame({}, {kA}), loasFrame(same, {kC})});
-         },
-         {ok(kA), ok(kC)}},
-        {"LoasUseSameStreamMuxBeforeAnyConfig",
-         TT_MP4_LOAS,
-         [same] {
-             return concat({loasFrame(same, {kC}), loasFrame({}, {kA})});
-         },
-         {err(TRANSPORTDEC_NO_CONFIGURATION), ok(kA)}},
-        {"LoasGarbageBeforeSync",
-         TT_MP4_LOAS,
-         [] {
-             return concat({{0x00, 0x11, 0x56, 0x00, 0x22}, loasFrame({}, {kA})});
-         },
-         {err(TRANSPORTDEC_SYNC_ERROR), ok(kA)}},
-        {"LoasTwoProgramsUnsupported",
-         TT_MP4_LOAS,
-         [] {
-             LoasOptions o;
-             o.numProgram = 1;
-             return concat({loasFrame(o, {kA}), loasFrame({}, {kC})});
-         },
-         {err(TRANSPORTDEC_UNSUPPORTED_FORMAT), ok(kC)}},
-        {"LoasTwoLayersUnsupported",
-         TT_MP4_LOAS,
-         [] {
-             LoasOptions o;
-             o.numLayer = 1;
-             return concat({loasFrame(o, {kA}), loasFrame({}, {kC})});
-         },
-         {err(TRANSPORTDEC_UNSUPPORTED_FORMAT), ok(kC)}},
-        {"LoasFrameLengthType1Unsupported",
-         TT_MP4_LOAS,
-         [] {
-             LoasOptions o;
-             o.frameLengthType = 1;
-             return concat({loasFrame(o, {kA}), loasFrame({}, {kC})});
-         },
-         {err(TRANSPORTDEC_UNSUPPORTED_FORMAT), ok(kC)}},
-        {"LoasAudioMuxVersionAUnsupported",
-         TT_MP4_LOAS,
-         [] {
-             LoasOptions o = v1();
-             o.audioMuxVersionA = 1;
-             return concat({loasFrame(o, {kA}), loasFrame({}, {kC})});
-         },
-         {err(TRANSPORTDEC_UNSUPPORTED_FORMAT), ok(kC)}},
-        {"AdtsWithoutCrc", TT_MP4_ADTS, [] { return adtsFrame({}, kA); }, {ok(kA)}},
-        {"AdtsWithCrc",
-         TT_MP4_ADTS,
-         [] {
-             AdtsOptions o;
-             o.crc = true;
-             return adtsFrame(o, kA);
-         },
-         {ok(kA)}},
-        {"AdtsSeveralBlocksWithoutCrcIsOneUnit",
-         TT_MP4_ADTS,
-         [] {
-             AdtsOptions o;
-             o.rawDataBlocks = 2;
-             return adtsFrame(o, kB);
-         },
-         {ok(kB)}},
-        {"AdtsSeveralBlocksWithCrcUnsupported",
-         TT_MP4_ADTS,
-         [] {
-             AdtsOptions o;
-             o.crc = true;
-             o.rawDataBlocks = 1;
-             return concat({adtsFrame(o, kA), adtsFrame({}, kC)});
-         },
-         {err(TRANSPORTDEC_UNSUPPORTED_FORMAT), ok(kC)}},
-        {"AdtsReservedFrequencyIsNoHeader",
-         TT_MP4_ADTS,
-         [] {
-             AdtsOptions o;
-             o.samplingFrequencyIndex = 13;
-             return concat({adtsFrame(o, kC), adtsFrame({}, kA)});
-         },
-         {err(TRANSPORTDEC_SYNC_ERROR), ok(kA)}},
-        {"AdtsGarbageBeforeSync",
-         TT_MP4_ADTS,
-         [] {
-             return concat({{0x12, 0xFF, 0x00, 0xFF}, adtsFrame({}, kA), adtsFrame({}, kC)});
-         },
-         {err(TRANSPORTDEC_SYNC_ERROR), ok(kA), ok(kC)}},
-        {"AdtsStreamReadAsLoasIsSyncErrors",
-         TT_MP4_LOAS,
-         [] { return adtsFrame({}, kA); },
-         {err(TRANSPORTDEC_SYNC_ERROR)}},
+    const auto loas = [](const LoasOptions& o, const std::vector<uint8_t>& payload) {
+        return loasFrame(o, {payload});
     };
+    const Outcome unsupported = err(TRANSPORTDEC_UNSUPPORTED_FORMAT);
+    const Outcome syncError = err(TRANSPORTDEC_SYNC_ERROR);
+    const LoasOptions same{.useSameStreamMux = true};
+    const std::vector<uint8_t> plainC = loas({}, kC);
+    // clang-format off
+    return {
+        {"LoasVersion0", TT_MP4_LOAS, loas({}, kA), {ok(kA)}},
+        {"LoasVersion1", TT_MP4_LOAS, loas({.audioMuxVersion = 1}, kA), {ok(kA)}},
+        {"LoasVersion1WithAscFillBits", TT_MP4_LOAS,
+         loas({.audioMuxVersion = 1, .ascFillBits = 13}, kA), {ok(kA)}},
+        {"LoasLongPayloadLength", TT_MP4_LOAS, loas({}, kB), {ok(kB)}},
+        {"LoasCrcByte", TT_MP4_LOAS, loas({.crc = true}, kA), {ok(kA)}},
+        // Two escape-coded bytes of other data length.
+        {"LoasOtherDataVersion0", TT_MP4_LOAS, loas({.otherDataBits = 300}, kA), {ok(kA)}},
+        {"LoasOtherDataVersion1", TT_MP4_LOAS,
+         loas({.audioMuxVersion = 1, .otherDataBits = 17}, kC), {ok(kC)}},
+        {"LoasSubFramesAreUnits", TT_MP4_LOAS, loasFrame({}, {kA, kB, kC}),
+         {ok(kA), ok(kB), ok(kC)}},
+        {"LoasUseSameStreamMuxAfterConfig", TT_MP4_LOAS, concat({loas({}, kA), loas(same, kC)}),
+         {ok(kA), ok(kC)}},
+        {"LoasUseSameStreamMuxBeforeAnyConfig", TT_MP4_LOAS,
+         concat({loas(same, kC), loas({}, kA)}), {err(TRANSPORTDEC_NO_CONFIGURATION), ok(kA)}},
+        {"LoasGarbageBeforeSync", TT_MP4_LOAS, concat({{0x00, 0x11, 0x56, 0x00, 0x22}, loas({}, kA)}),
+         {syncError, ok(kA)}},
+        {"LoasTwoProgramsUnsupported", TT_MP4_LOAS, concat({loas({.numProgram = 1}, kA), plainC}),
+         {unsupported, ok(kC)}},
+        {"LoasTwoLayersUnsupported", TT_MP4_LOAS, concat({loas({.numLayer = 1}, kA), plainC}),
+         {unsupported, ok(kC)}},
+        {"LoasFrameLengthType1Unsupported", TT_MP4_LOAS,
+         concat({loas({.frameLengthType = 1}, kA), plainC}), {unsupported, ok(kC)}},
+        {"LoasAudioMuxVersionAUnsupported", TT_MP4_LOAS,
+         concat({loas({.audioMuxVersion = 1, .audioMuxVersionA = 1}, kA), plainC}),
+         {unsupported, ok(kC)}},
+        {"AdtsWithoutCrc", TT_MP4_ADTS, adtsFrame({}, kA), {ok(kA)}},
+        {"AdtsWithCrc", TT_MP4_ADTS, adtsFrame({.crc = true}, kA), {ok(kA)}},
+        {"AdtsSeveralBlocksWithoutCrcIsOneUnit", TT_MP4_ADTS, adtsFrame({.rawDataBlocks = 2}, kB),
+         {ok(kB)}},
+        {"AdtsSeveralBlocksWithCrcUnsupported", TT_MP4_ADTS,
+         concat({adtsFrame({.crc = true, .rawDataBlocks = 1}, kA), adtsFrame({}, kC)}),
+         {unsupported, ok(kC)}},
+        {"AdtsReservedFrequencyIsNoHeader", TT_MP4_ADTS,
+         concat({adtsFrame({.samplingFrequencyIndex = 13}, kC), adtsFrame({}, kA)}),
+         {syncError, ok(kA)}},
+        {"AdtsGarbageBeforeSync", TT_MP4_ADTS,
+         concat({{0x12, 0xFF, 0x00, 0xFF}, adtsFrame({}, kA), adtsFrame({}, kC)}),
+         {syncError, ok(kA), ok(kC)}},
+        {"AdtsStreamReadAsLoasIsSyncErrors", TT_MP4_LOAS, adtsFrame({}, kA), {syncError}},
+    };
+    // clang-format on
 }
 
 class TransportDecoderHeaderTest : public ::testing::TestWithParam<HeaderCase> {};
@@ -271,7 +174,7 @@ class TransportDecoderHeaderTest : public ::testing::TestWithParam<HeaderCase> {
 TEST_P(TransportDecoderHeaderTest, YieldsTheExpectedUnits) {
     const HeaderCase& c = GetParam();
     Harness harness(c.type);
-    const auto got = harness.run(c.build());
+    const auto got = harness.run(c.stream);
     ASSERT_EQ(c.expected.size(), got.size());
     for (size_t i = 0; i < got.size(); ++i) {
         EXPECT_EQ(c.expected[i].error, got[i].error) << "result " << i;
@@ -282,7 +185,7 @@ TEST_P(TransportDecoderHeaderTest, YieldsTheExpectedUnits) {
 // Cutting the stream into fills at any byte must not change what comes out.
 TEST_P(TransportDecoderHeaderTest, TruncationAtEveryByteThenRestGivesSameUnits) {
     const HeaderCase& c = GetParam();
-    const auto stream = c.build();
+    const auto& stream = c.stream;
     std::vector<std::vector<uint8_t>> expectedUnits;
     for (const auto& o : c.expected) {
         if (o.error == TRANSPORTDEC_OK) {
@@ -304,80 +207,81 @@ TEST_P(TransportDecoderHeaderTest, TruncationAtEveryByteThenRestGivesSameUnits) 
 INSTANTIATE_TEST_SUITE_P(Headers, TransportDecoderHeaderTest, ::testing::ValuesIn(headerCases()),
                          [](const auto& info) { return info.param.name; });
 
-class TransportDecoderConfigTest : public ::testing::Test {
-protected:
-    CSAudioSpecificConfig configOf(TRANSPORT_TYPE type, const std::vector<uint8_t>& stream) {
-        Harness harness(type);
-        harness.run(stream);
-        EXPECT_EQ(1u, harness.configs.size());
-        return harness.configs.empty() ? CSAudioSpecificConfig{} : harness.configs.front();
-    }
+// What the configuration callback reports; kAny leaves a field unchecked.
+constexpr int kAny = -2;
+struct ConfigCase {
+    std::string name;
+    TRANSPORT_TYPE type;
+    std::vector<uint8_t> stream;
+    uint32_t sampleRate;
+    uint32_t channels;
+    int extensionAot;
+    uint32_t extensionRate;
+    int sbrPresent;
+    int psPresent;
 };
 
-TEST_F(TransportDecoderConfigTest, LcFromStreamMuxConfig) {
-    const auto c = configOf(TT_MP4_LOAS, loasFrame({}, {kA}));
-    EXPECT_EQ(2, c.m_aot);
-    EXPECT_EQ(3u, c.m_samplingFrequencyIndex);
-    EXPECT_EQ(48000u, c.m_samplingFrequency);
-    EXPECT_EQ(2u, c.m_channelConfiguration);
-    EXPECT_EQ(AOT_NONE, c.m_extensionAudioObjectType);
-    EXPECT_EQ(1024u, c.m_samplesPerFrame);
+std::vector<ConfigCase> configCases() {
+    constexpr AscFields kHeAac{.samplingFrequencyIndex = 6, .extensionSamplingFrequencyIndex = 3};
+    AscFields hierarchicalSbr = kHeAac;
+    hierarchicalSbr.hierarchicalExtension = 5;
+    AscFields hierarchicalPs = hierarchicalSbr;
+    hierarchicalPs.hierarchicalExtension = 29;
+    hierarchicalPs.channelConfiguration = 1;
+    AscFields backwardCompatible = kHeAac;
+    backwardCompatible.backwardCompatibleSbr = true;
+    backwardCompatible.backwardCompatiblePs = true;
+    // clang-format off
+    return {
+        {"LcFromStreamMuxConfig", TT_MP4_LOAS, loasFrame({}, {kA}), 48000, 2, AOT_NONE, 0, kAny, kAny},
+        {"HierarchicalSbr", TT_MP4_LOAS, loasFrame({.asc = hierarchicalSbr}, {kA}), 24000, 2, AOT_SBR, 48000, kAny, -1},
+        {"HierarchicalPs", TT_MP4_LOAS, loasFrame({.asc = hierarchicalPs}, {kA}), 24000, 1, AOT_SBR, 48000, kAny, 1},
+        // Backward-compatible signalling needs ascLen, i.e. audioMuxVersion 1.
+        {"BackwardCompatibleSbrAndPs", TT_MP4_LOAS,
+         loasFrame({.audioMuxVersion = 1, .asc = backwardCompatible}, {kA}), 24000, 2, AOT_SBR, 48000, 1, 1},
+        {"ImplicitSbrIsNotReported", TT_MP4_LOAS, loasFrame({.audioMuxVersion = 1, .asc = kHeAac}, {kA}),
+         24000, 2, AOT_NONE, 0, -1, kAny},
+        // ADTS profile 1 is object type 2.
+        {"AdtsHeader", TT_MP4_ADTS,
+         adtsFrame({.samplingFrequencyIndex = 4, .channelConfiguration = 1}, kA), 44100, 1, AOT_NONE, 0, kAny, kAny},
+    };
+    // clang-format on
 }
 
-TEST_F(TransportDecoderConfigTest, HierarchicalSbrAndPs) {
-    for (uint32_t extension : {5u, 29u}) {
-        LoasOptions o;
-        o.asc.hierarchicalExtension = extension;
-        o.asc.samplingFrequencyIndex = 6;
-        o.asc.extensionSamplingFrequencyIndex = 3;
-        o.asc.channelConfiguration = extension == 29 ? 1 : 2;
-        const auto c = configOf(TT_MP4_LOAS, loasFrame(o, {kA}));
-        EXPECT_EQ(2, c.m_aot);
-        EXPECT_EQ(24000u, c.m_samplingFrequency);
-        EXPECT_EQ(AOT_SBR, c.m_extensionAudioObjectType);
-        EXPECT_EQ(3u, c.m_extensionSamplingFrequencyIndex);
-        EXPECT_EQ(48000u, c.m_extensionSamplingFrequency);
-        EXPECT_EQ(extension == 29 ? 1 : -1, c.m_psPresentFlag);
+class TransportDecoderConfigTest : public ::testing::TestWithParam<ConfigCase> {};
+
+TEST_P(TransportDecoderConfigTest, ReportsTheStreamsConfiguration) {
+    const ConfigCase& c = GetParam();
+    Harness harness(c.type);
+    harness.run(c.stream);
+    ASSERT_EQ(1u, harness.configs.size());
+    const CSAudioSpecificConfig& got = harness.configs.front();
+    EXPECT_EQ(2, got.m_aot);
+    EXPECT_EQ(c.sampleRate, got.m_samplingFrequency);
+    EXPECT_EQ(c.sampleRate == 48000   ? 3u
+              : c.sampleRate == 44100 ? 4u
+                                      : 6u,
+              got.m_samplingFrequencyIndex);
+    EXPECT_EQ(c.channels, got.m_channelConfiguration);
+    EXPECT_EQ(1024u, got.m_samplesPerFrame);
+    EXPECT_EQ(c.extensionAot, got.m_extensionAudioObjectType);
+    if (c.extensionAot == AOT_SBR) {
+        EXPECT_EQ(3u, got.m_extensionSamplingFrequencyIndex);
+        EXPECT_EQ(c.extensionRate, got.m_extensionSamplingFrequency);
+    }
+    if (c.sbrPresent != kAny) {
+        EXPECT_EQ(c.sbrPresent, got.m_sbrPresentFlag);
+    }
+    if (c.psPresent != kAny) {
+        EXPECT_EQ(c.psPresent, got.m_psPresentFlag);
     }
 }
 
-TEST_F(TransportDecoderConfigTest, BackwardCompatibleSbrNeedsAscLen) {
-    LoasOptions o = v1();
-    o.asc.samplingFrequencyIndex = 6;
-    o.asc.extensionSamplingFrequencyIndex = 3;
-    o.asc.backwardCompatibleSbr = true;
-    o.asc.backwardCompatiblePs = true;
-    const auto c = configOf(TT_MP4_LOAS, loasFrame(o, {kA}));
-    EXPECT_EQ(2, c.m_aot);
-    EXPECT_EQ(AOT_SBR, c.m_extensionAudioObjectType);
-    EXPECT_EQ(1, c.m_sbrPresentFlag);
-    EXPECT_EQ(48000u, c.m_extensionSamplingFrequency);
-    EXPECT_EQ(1, c.m_psPresentFlag);
-}
+INSTANTIATE_TEST_SUITE_P(Configs, TransportDecoderConfigTest, ::testing::ValuesIn(configCases()),
+                         [](const auto& info) { return info.param.name; });
 
-TEST_F(TransportDecoderConfigTest, ImplicitSbrIsNotReported) {
-    LoasOptions o = v1();
-    o.asc.samplingFrequencyIndex = 6;
-    const auto c = configOf(TT_MP4_LOAS, loasFrame(o, {kA}));
-    EXPECT_EQ(AOT_NONE, c.m_extensionAudioObjectType);
-    EXPECT_EQ(-1, c.m_sbrPresentFlag);
-}
-
-TEST_F(TransportDecoderConfigTest, AdtsHeaderGivesProfilePlusOne) {
-    AdtsOptions o;
-    o.profile = 1;
-    o.samplingFrequencyIndex = 4;
-    o.channelConfiguration = 1;
-    const auto c = configOf(TT_MP4_ADTS, adtsFrame(o, kA));
-    EXPECT_EQ(2, c.m_aot);
-    EXPECT_EQ(44100u, c.m_samplingFrequency);
-    EXPECT_EQ(1u, c.m_channelConfiguration);
-    EXPECT_EQ(1024u, c.m_samplesPerFrame);
-}
-
-TEST_F(TransportDecoderConfigTest, ReportedAgainOnlyWhenItChanges) {
-    LoasOptions other;
-    other.asc.channelConfiguration = 1;
+TEST(TransportDecoderConfigChangeTest, ReportedAgainOnlyWhenItChanges) {
+    const LoasOptions other{.asc = {.channelConfiguration = 1}};
     Harness harness(TT_MP4_LOAS);
     harness.run(concat({loasFrame({}, {kA}), loasFrame({}, {kA}), loasFrame(other, {kA})}));
     ASSERT_EQ(2u, harness.configs.size());
@@ -413,24 +317,22 @@ TEST_F(TransportDecoderHoldBackTest, NextSyncWordConfirmsOnlyAfterALossOfSync) {
     const auto c = adtsFrame({}, kC);
     Harness harness(TT_MP4_ADTS);
     const auto got = harness.run(concat({a, {0x00, 0x00}, c, c}));
-    std::vector<uint32_t> errors;
-    for (const auto& o : got) {
-        errors.push_back(o.error);
-    }
+    const auto errorsOf = [](const std::vector<Outcome>& outcomes) {
+        std::vector<uint32_t> errors;
+        for (const auto& o : outcomes) {
+            errors.push_back(o.error);
+        }
+        return errors;
+    };
     // First frame: followed by junk while not yet in sync, so it is not trusted and
     // everything up to the next sync word is skipped.
     EXPECT_EQ((std::vector<uint32_t>{TRANSPORTDEC_SYNC_ERROR, TRANSPORTDEC_OK, TRANSPORTDEC_OK}),
-              errors);
+              errorsOf(got));
     EXPECT_EQ(kC, got.back().unit);
     Harness synced(TT_MP4_ADTS);
-    const auto got2 = synced.run(concat({a, a, {0x00, 0x00}, c}));
-    errors.clear();
-    for (const auto& o : got2) {
-        errors.push_back(o.error);
-    }
     EXPECT_EQ((std::vector<uint32_t>{TRANSPORTDEC_OK, TRANSPORTDEC_OK, TRANSPORTDEC_SYNC_ERROR,
                                      TRANSPORTDEC_OK}),
-              errors);
+              errorsOf(synced.run(concat({a, a, {0x00, 0x00}, c}))));
 }
 
 // The decoder's own bounds-checked reader.

@@ -2,97 +2,21 @@
 // through a ring into MP3MediaExtractor. Every frame delivered must lie inside the
 // output buffer, and a frame held across records must come out whole or not at all.
 //
-// Input layout: byte 0 picks the output size; then records, each a 2-byte big-endian
-// length (top bit: write the record with a stated ES size far beyond the record) and
-// that many ES bytes.
-#include <cstdint>
-#include <cstdlib>
-#include <cstring>
-#include <memory>
-#include <new>
-#include <vector>
-
-#include "common/RingBuffer.h"
-#include "common/data/PESData.h"
+// Input layout: byte 0 picks the output size; then the records.
+#include "ExtractorFuzzHarness.h"
 #include "decoder/MP3MediaExtractor.h"
-#include "platform/os/Trace.h"
 
-namespace {
-
-using TavoPlayer::PESData;
-using TavoPlayer::RingBuffer;
-
-android::sp<RingBuffer> sharedRing() {
-    static android::sp<RingBuffer> ring = [] {
-        TavoPlayer::setTraceLevel(TavoPlayer::TRACE_NONE);  // nothing is logged while fuzzing
-        android::sp<RingBuffer> r = new RingBuffer();
-        r->configure("FuzzPES", 20);
-        return r;
-    }();
-    return ring;
-}
-
-void writeRecord(RingBuffer& ring, const uint8_t* es, uint32_t size, bool lie, uint64_t pts) {
-    const uint32_t recordSize = PESData::kHeaderSize + size;
-    if (ring.freeSpace() < RingBuffer::roundUp4(recordSize) ||
-        !ring.waitForSpace(RingBuffer::roundUp4(recordSize))) {
-        return;
-    }
-    auto* record = new (ring.writePointer()) PESData();
-    record->mSize = recordSize;
-    record->mOffsetES = PESData::kHeaderSize;
-    record->mSizeES = lie ? size * 7 + 1000 : size;
-    record->mPTS = pts;
-    if (size > 0) {
-        std::memcpy(record->pesBytes(), es, size);
-    }
-    ring.commitWrite(recordSize);
-}
-
-}  // namespace
+using namespace TavoPlayer;
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     if (size < 1) {
         return 0;
     }
-    android::sp<RingBuffer> ring = sharedRing();
-    ring->reset();
-    const size_t outputSize = 64 + static_cast<size_t>(data[0]) * 64;
-    std::vector<uint8_t> output(outputSize);
-    {
-        android::sp<TavoPlayer::MP3MediaExtractor> extractor =
-            new TavoPlayer::MP3MediaExtractor(ring);
-        size_t at = 1;
-        uint64_t pts = 0;
-        while (at + 2 <= size) {
-            const bool lie = (data[at] & 0x80) != 0;
-            uint32_t length = ((data[at] & 0x7F) << 8) | data[at + 1];
-            at += 2;
-            if (length > size - at) {
-                length = static_cast<uint32_t>(size - at);
-            }
-            writeRecord(*ring, data + at, length, lie, pts);
-            at += length;
-            pts += 2160;
-            // Drain what is there, so that the ring never fills.
-            for (int calls = 0; calls < 4096; ++calls) {
-                unsigned long length = 0;
-                long long unitPts = 0;
-                unsigned char flags = 0;
-                const unsigned int result = extractor->getDecodableUnit(
-                    output.data(), output.size(), &length, &unitPts, &flags);
-                if (length > output.size()) {
-                    std::abort();
-                }
-                if (result != 0 || ring->usedSpace() == 0) {
-                    break;
-                }
-            }
-            if (ring->usedSpace() != 0) {
-                break;  // the extractor is holding a record it cannot finish: stop here
-            }
-        }
-        extractor->reset();
-    }
+    android::sp<RingBuffer> ring = fuzz::freshRing();
+    std::vector<uint8_t> output(64 + static_cast<size_t>(data[0]) * 64);
+    android::sp<MP3MediaExtractor> extractor = new MP3MediaExtractor(ring);
+    fuzz::feedRecords(*ring, data, size, 1, 2160,
+                      [&] { return fuzz::drainRing(*extractor, *ring, output); });
+    extractor->reset();
     return 0;
 }

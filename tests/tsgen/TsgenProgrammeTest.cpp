@@ -3,7 +3,6 @@
 
 #include <gtest/gtest.h>
 
-#include <cmath>
 #include <cstdlib>
 
 #include "TsgenTestUtil.h"
@@ -11,154 +10,110 @@
 namespace TavoPlayer::test {
 namespace {
 
-struct AudioCase {
+struct ProbeCase {
     const char* name;
-    const char* option;
-    const char* codecName;  // as ffprobe names it
-    uint8_t streamType;
-    const char* sampleRate = "48000";
-    const char* channels = "2";
+    std::string args;
+    std::string probe;    // ffprobe's view, as "key=value" items
+    uint8_t audioType;    // PMT stream_type of the audio
+    double audioSeconds;  // audio in whole frames of 1024 or 1152 samples
 };
 
-class TsgenAudioCodecTest : public ::testing::TestWithParam<AudioCase> {};
-
-TEST_P(TsgenAudioCodecTest, FfprobeFindsTheProgrammeAndItsStreams) {
-    const AudioCase& c = GetParam();
-    TempDir dir;
-    const std::string file = dir.path("out.ts");
-    const auto run =
-        runTsgen(file, std::string("-d 3 --size 320x240 --audio ") + c.option + " --caption 1:Ola");
-    ASSERT_EQ(run.exitCode, 0) << run.err;
-
-    auto probe = ffprobe(file);
-    EXPECT_EQ(probe["programs.program.0.program_num"], "1");
-    EXPECT_EQ(probe["programs.program.0.pmt_pid"], "4096");
-    EXPECT_EQ(probe["programs.program.0.pcr_pid"], "273");
-    EXPECT_EQ(probe["programs.program.0.nb_streams"], "3");
-    EXPECT_EQ(probe["streams.stream.0.codec_name"], "h264");
-    EXPECT_EQ(probe["streams.stream.0.id"], "0x111");
-    EXPECT_EQ(probe["streams.stream.0.width"], "320");
-    EXPECT_EQ(probe["streams.stream.0.height"], "240");
-    EXPECT_EQ(probe["streams.stream.0.field_order"], "tt");
-    EXPECT_EQ(probe["streams.stream.0.r_frame_rate"], "30000/1001");
-    EXPECT_EQ(probe["streams.stream.1.codec_name"], c.codecName);
-    EXPECT_EQ(probe["streams.stream.1.id"], "0x112");
-    EXPECT_EQ(probe["streams.stream.1.sample_rate"], c.sampleRate);
-    EXPECT_EQ(probe["streams.stream.1.channels"], c.channels);
-    EXPECT_EQ(probe["streams.stream.2.codec_name"], "arib_caption");
-    EXPECT_EQ(probe["streams.stream.2.id"], "0x130");
-
-    // 90 frames of 1001/30000 s; audio in whole frames of 1024 or 1152 samples.
-    EXPECT_NEAR(std::atof(probe["streams.stream.0.duration"].c_str()), 3.003, 0.001);
-    EXPECT_NEAR(std::atof(probe["streams.stream.1.duration"].c_str()), 3.0, 0.03);
-
-    TsFile ts(readFile(file));
-    ASSERT_TRUE(ts.valid());
-    Pmt pmt;
-    ASSERT_TRUE(ts.pmt(0x1000, pmt));
-    ASSERT_EQ(pmt.streams.size(), 3u);
-    EXPECT_EQ(pmt.streams[1].streamType, c.streamType);
-
-    // Every stream decodes without a single complaint from libavcodec.
-    const auto decode = runCommand("ffmpeg -nostdin -v error -i '" + file + "' -f null -");
-    EXPECT_EQ(decode.exitCode, 0);
-    EXPECT_EQ(decode.err, "");
+void PrintTo(const ProbeCase& c, std::ostream* os) {
+    *os << c.name;
 }
 
-INSTANTIATE_TEST_SUITE_P(
-    Codecs, TsgenAudioCodecTest,
-    ::testing::Values(AudioCase{"Latm", "latm", "aac_latm", 0x11},
-                      AudioCase{"Adts", "adts", "aac", 0x0F}, AudioCase{"Mp2", "mp2", "mp2", 0x03},
-                      AudioCase{"Mp3", "mp3", "mp3", 0x03},
-                      AudioCase{"LatmConfigEvery8", "latm --latm-config-interval 8", "aac_latm",
-                                0x11},
-                      AudioCase{"Adts51", "adts --audio-channels 6", "aac", 0x0F, "48000", "6"},
-                      AudioCase{"Mp2HalfRate", "mp2 --audio-rate 24000", "mp2", 0x04, "24000"}),
-    [](const auto& info) { return std::string(info.param.name); });
+// Three seconds of 320x240 at 29.97 interlaced, with a caption, on the default PIDs.
+const std::string kArgs = "-d 3 --size 320x240 --caption 1:Ola --audio ";
+const std::string kProgramme =
+    "p.program_num=1 p.pmt_pid=4096 p.pcr_pid=273 p.nb_streams=3 0.codec_name=h264 0.id=0x111 "
+    "0.width=320 0.height=240 0.field_order=tt 0.r_frame_rate=30000/1001 0.duration=3.003000 "
+    "1.id=0x112 2.codec_name=arib_caption 2.id=0x130 ";
+const std::string kStereo48k = "1.sample_rate=48000 1.channels=2 ";
 
-TEST(TsgenProgrammeTest, PidsProgramAndPictureAreConfigurable) {
-    TempDir dir;
-    const std::string file = dir.path("out.ts");
-    const auto run = runTsgen(file,
-                              "-d 1 --size 352x288 --fps 25 --progressive --program 0x5A1 "
-                              "--tsid 0x2E1 --pmt-pid 0x101 --video-pid 0x211 --audio-pid 0x212 "
-                              "--caption-pid 0x216 --pcr-pid 0x100 --audio-rate 24000 "
-                              "--audio-channels 1");
-    ASSERT_EQ(run.exitCode, 0) << run.err;
-    auto probe = ffprobe(file);
-    EXPECT_EQ(probe["programs.program.0.program_num"], "1441");
-    EXPECT_EQ(probe["programs.program.0.pmt_pid"], "257");
-    EXPECT_EQ(probe["programs.program.0.pcr_pid"], "256");
-    EXPECT_EQ(probe["streams.stream.0.id"], "0x211");
-    EXPECT_EQ(probe["streams.stream.0.field_order"], "progressive");
-    EXPECT_EQ(probe["streams.stream.0.r_frame_rate"], "25/1");
-    EXPECT_EQ(probe["streams.stream.0.width"], "352");
-    EXPECT_EQ(probe["streams.stream.1.id"], "0x212");
-    EXPECT_EQ(probe["streams.stream.1.sample_rate"], "24000");
-    EXPECT_EQ(probe["streams.stream.1.channels"], "1");
-    EXPECT_EQ(probe["streams.stream.2.id"], "0x216");
+const ProbeCase kCases[] = {
+    {"Latm", kArgs + "latm", kProgramme + kStereo48k + "1.codec_name=aac_latm", 0x11, 3.0},
+    {"Adts", kArgs + "adts", kProgramme + kStereo48k + "1.codec_name=aac", 0x0F, 3.0},
+    {"Mp2", kArgs + "mp2", kProgramme + kStereo48k + "1.codec_name=mp2", 0x03, 3.0},
+    {"Mp3", kArgs + "mp3", kProgramme + kStereo48k + "1.codec_name=mp3", 0x03, 3.0},
+    {"LatmConfigEvery8", kArgs + "latm --latm-config-interval 8",
+     kProgramme + kStereo48k + "1.codec_name=aac_latm", 0x11, 3.0},
+    {"Adts51", kArgs + "adts --audio-channels 6",
+     kProgramme + "1.codec_name=aac 1.sample_rate=48000 1.channels=6", 0x0F, 3.0},
+    {"Mp2HalfRate", kArgs + "mp2 --audio-rate 24000",
+     kProgramme + "1.codec_name=mp2 1.sample_rate=24000 1.channels=2", 0x04, 3.0},
+    {"FullHdInterlacedByDefault", "-d 0.5",
+     "0.width=1920 0.height=1080 0.field_order=tt 1.codec_name=aac_latm", 0x11, 0.5},
+    {"Configurable",
+     "-d 1 --size 352x288 --fps 25 --progressive --program 0x5A1 --tsid 0x2E1 --pmt-pid 0x101 "
+     "--video-pid 0x211 --audio-pid 0x212 --caption-pid 0x216 --pcr-pid 0x100 "
+     "--audio-rate 24000 --audio-channels 1",
+     "p.program_num=1441 p.pmt_pid=257 p.pcr_pid=256 0.id=0x211 0.field_order=progressive "
+     "0.r_frame_rate=25/1 0.width=352 1.id=0x212 1.sample_rate=24000 1.channels=1 2.id=0x216",
+     0x11, 1.0},
+};
 
-    TsFile ts(readFile(file));
-    ASSERT_TRUE(ts.valid());
-    EXPECT_EQ(ts.pat(), (std::map<uint16_t, uint16_t>{{0x5A1, 0x101}}));
-    // The PCR PID of its own carries nothing but adaptation fields with a PCR.
-    const auto pcrPackets = ts.packetsOf(0x100);
+class TsgenProbeTest : public ::testing::TestWithParam<ProbeCase> {};
+
+TEST_P(TsgenProbeTest, FfprobeFindsTheProgrammeAndEveryStreamDecodesCleanly) {
+    const ProbeCase& c = GetParam();
+    const auto& gen = tsgen(c.args);
+    ASSERT_TRUE(gen.ok());
+    auto probe = ffprobe(gen.file);
+    expectProbe(probe, c.probe);
+    EXPECT_NEAR(std::atof(probe["1.duration"].c_str()), c.audioSeconds, 0.03);
+    const auto pmt = gen.ts.pmt(static_cast<uint16_t>(std::atoi(probe["p.pmt_pid"].c_str())));
+    ASSERT_EQ(pmt.size(), 3u);
+    EXPECT_EQ(pmt[1].streamType, c.audioType);
+    // Not a single complaint from libavcodec.
+    EXPECT_EQ(decodeErrors(gen.file), "");
+}
+
+INSTANTIATE_TEST_SUITE_P(Streams, TsgenProbeTest, ::testing::ValuesIn(kCases),
+                         [](const auto& info) { return std::string(info.param.name); });
+
+TEST(TsgenProgrammeTest, PcrPidOfItsOwnCarriesOnlyThePcr) {
+    const auto& gen = tsgen(kCases[8].args);
+    ASSERT_TRUE(gen.ok());
+    const auto pcrPackets = gen.ts.packetsOf(0x100);
     ASSERT_FALSE(pcrPackets.empty());
     for (const auto* p : pcrPackets) {
         EXPECT_EQ(p->adaptationControl, 2);
         EXPECT_TRUE(p->hasPcr);
     }
-    for (const auto* p : ts.packetsOf(0x211)) {
+    for (const auto* p : gen.ts.packetsOf(0x211)) {
         EXPECT_FALSE(p->hasPcr);
     }
 }
 
 TEST(TsgenProgrammeTest, PmtDeclaresIsdbTbComponentsAndCaptions) {
-    TempDir dir;
-    const std::string file = dir.path("out.ts");
-    ASSERT_EQ(runTsgen(file, "-d 1 --size 320x240").exitCode, 0);
-    TsFile ts(readFile(file));
-    Pmt pmt;
-    ASSERT_TRUE(ts.pmt(0x1000, pmt));
-    EXPECT_EQ(pmt.programNumber, 1);
-    ASSERT_EQ(pmt.streams.size(), 3u);
+    const auto& gen = tsgen("-d 1 --size 320x240");
+    ASSERT_TRUE(gen.ok());
+    const auto pmt = gen.ts.pmt();
+    ASSERT_EQ(pmt.size(), 3u);
     const struct {
         uint8_t type;
         uint16_t pid;
         uint8_t componentTag;
     } kExpected[] = {{0x1B, 0x111, 0x00}, {0x11, 0x112, 0x10}, {0x06, 0x130, 0x30}};
     for (size_t i = 0; i < 3; ++i) {
-        EXPECT_EQ(pmt.streams[i].streamType, kExpected[i].type);
-        EXPECT_EQ(pmt.streams[i].pid, kExpected[i].pid);
-        ASSERT_GE(pmt.streams[i].descriptors.size(), 1u);
-        EXPECT_EQ(pmt.streams[i].descriptors[0],
+        EXPECT_EQ(pmt[i].streamType, kExpected[i].type);
+        EXPECT_EQ(pmt[i].pid, kExpected[i].pid);
+        ASSERT_GE(pmt[i].descriptors.size(), 1u);
+        EXPECT_EQ(pmt[i].descriptors[0],
                   (std::vector<uint8_t>{0x52, 0x01, kExpected[i].componentTag}));
     }
     // Captions are declared by data_component_id 0x0008 (ARIB STD-B10).
-    ASSERT_EQ(pmt.streams[2].descriptors.size(), 2u);
-    EXPECT_EQ(pmt.streams[2].descriptors[1][0], 0xFD);
-    EXPECT_EQ(pmt.streams[2].descriptors[1][2], 0x00);
-    EXPECT_EQ(pmt.streams[2].descriptors[1][3], 0x08);
-}
-
-TEST(TsgenProgrammeTest, FullHdInterlacedIsTheDefault) {
-    TempDir dir;
-    const std::string file = dir.path("out.ts");
-    ASSERT_EQ(runTsgen(file, "-d 0.5").exitCode, 0);
-    auto probe = ffprobe(file);
-    EXPECT_EQ(probe["streams.stream.0.width"], "1920");
-    EXPECT_EQ(probe["streams.stream.0.height"], "1080");
-    EXPECT_EQ(probe["streams.stream.0.field_order"], "tt");
-    EXPECT_EQ(probe["streams.stream.1.codec_name"], "aac_latm");
+    ASSERT_EQ(pmt[2].descriptors.size(), 2u);
+    EXPECT_EQ(pmt[2].descriptors[1][0], 0xFD);
+    EXPECT_EQ((pmt[2].descriptors[1][2] << 8) | pmt[2].descriptors[1][3], 0x0008);
 }
 
 TEST(TsgenProgrammeTest, DecodedPicturesShowTheirFrameNumber) {
-    TempDir dir;
-    const std::string file = dir.path("out.ts");
-    ASSERT_EQ(runTsgen(file, "-d 3 --size 640x360 --audio none").exitCode, 0);
+    const auto& gen = tsgen("-d 3 --size 640x360 --audio none");
+    ASSERT_TRUE(gen.ok());
     // libavcodec decodes three pictures, in display order, as 8-bit luma.
     const auto decoded =
-        runCommand("ffmpeg -nostdin -v error -i '" + file +
+        runCommand("ffmpeg -nostdin -v error -i '" + gen.file +
                    "' -map 0:v -vf \"select='eq(n,0)+eq(n,37)+eq(n,89)'\" -vsync 0 -f rawvideo "
                    "-pix_fmt gray -");
     ASSERT_EQ(decoded.exitCode, 0) << decoded.err;
@@ -177,32 +132,16 @@ TEST(TsgenProgrammeTest, DecodedPicturesShowTheirFrameNumber) {
     }
 }
 
-class TsgenDeterminismTest : public ::testing::Test {
-protected:
-    TempDir mDir;
-    const std::string mArgs = "-d 2 --size 320x240 --caption 0.5:Ola ";
-};
-
-TEST_F(TsgenDeterminismTest, SameSeedGivesIdenticalBytes) {
-    ASSERT_EQ(runTsgen(mDir.path("a.ts"), mArgs + "--seed 7").exitCode, 0);
-    ASSERT_EQ(runTsgen(mDir.path("b.ts"), mArgs + "--seed 7").exitCode, 0);
-    const auto a = readFile(mDir.path("a.ts"));
-    ASSERT_FALSE(a.empty());
-    EXPECT_TRUE(a == readFile(mDir.path("b.ts")));
-}
-
-TEST_F(TsgenDeterminismTest, OtherSeedGivesOtherContent) {
-    ASSERT_EQ(runTsgen(mDir.path("a.ts"), mArgs + "--seed 7").exitCode, 0);
-    ASSERT_EQ(runTsgen(mDir.path("b.ts"), mArgs + "--seed 8").exitCode, 0);
-    EXPECT_FALSE(readFile(mDir.path("a.ts")) == readFile(mDir.path("b.ts")));
-}
-
-TEST_F(TsgenDeterminismTest, StandardOutputGetsTheSameBytesAsAFile) {
-    ASSERT_EQ(runTsgen(mDir.path("a.ts"), mArgs).exitCode, 0);
-    const auto piped = runCommand(std::string(TAVO_TSGEN_PATH) + " -o - " + mArgs + " > '" +
-                                  mDir.path("b.ts") + "'");
+TEST(TsgenDeterminismTest, SameSeedSameBytesOnFileAndStandardOutputOtherSeedOtherBytes) {
+    const std::string args = "-d 2 --size 320x240 --caption 0.5:Ola --seed ";
+    const auto& a = tsgen(args + "7");
+    const auto& other = tsgen(args + "8");
+    ASSERT_TRUE(a.ok());
+    ASSERT_TRUE(other.ok());
+    const auto piped = runCommand(std::string(TAVO_TSGEN_PATH) + " -o - " + args + "7");
     ASSERT_EQ(piped.exitCode, 0) << piped.err;
-    EXPECT_TRUE(readFile(mDir.path("a.ts")) == readFile(mDir.path("b.ts")));
+    EXPECT_TRUE(std::vector<uint8_t>(piped.out.begin(), piped.out.end()) == a.bytes);
+    EXPECT_FALSE(a.bytes == other.bytes);
 }
 
 }  // namespace

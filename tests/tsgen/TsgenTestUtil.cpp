@@ -3,56 +3,56 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include <array>
+#include <algorithm>
 #include <cstdio>
-#include <cstdlib>
 #include <filesystem>
 #include <fstream>
 #include <iterator>
+#include <memory>
 #include <sstream>
 
 namespace TavoPlayer::test {
 
+namespace {
+
+struct TempFolder {
+    TempFolder() {
+        char name[] = "/tmp/tsgen_test_XXXXXX";
+        path = mkdtemp(name) != nullptr ? name : "";
+    }
+    ~TempFolder() {
+        std::error_code ec;
+        if (!path.empty()) {
+            std::filesystem::remove_all(path, ec);
+        }
+    }
+    std::string path;
+};
+
+}  // namespace
+
+std::string tempPath(const std::string& name) {
+    static TempFolder folder;
+    return folder.path + "/" + name;
+}
+
 CommandResult runCommand(const std::string& command) {
+    static int count = 0;
+    const std::string errFile = tempPath("stderr" + std::to_string(++count));
     CommandResult result;
-    char errName[] = "/tmp/tsgen_test_err_XXXXXX";
-    const int errFd = mkstemp(errName);
-    if (errFd < 0) {
+    FILE* pipe = popen(("(" + command + ") 2>'" + errFile + "'").c_str(), "r");
+    if (pipe == nullptr) {
         return result;
     }
-    close(errFd);
-    const std::string full = "(" + command + ") 2>" + errName;
-    FILE* pipe = popen(full.c_str(), "r");
-    if (pipe != nullptr) {
-        std::array<char, 4096> buffer{};
-        size_t n = 0;
-        while ((n = fread(buffer.data(), 1, buffer.size(), pipe)) > 0) {
-            result.out.append(buffer.data(), n);
-        }
-        const int status = pclose(pipe);
-        result.exitCode = WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+    char buffer[4096];
+    for (size_t n = 0; (n = fread(buffer, 1, sizeof buffer, pipe)) > 0;) {
+        result.out.append(buffer, n);
     }
-    std::ifstream err(errName);
-    result.err.assign(std::istreambuf_iterator<char>(err), std::istreambuf_iterator<char>());
-    unlink(errName);
+    const int status = pclose(pipe);
+    result.exitCode = WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+    const auto err = readFile(errFile);
+    result.err.assign(err.begin(), err.end());
     return result;
-}
-
-TempDir::TempDir() {
-    char name[] = "/tmp/tsgen_test_XXXXXX";
-    const char* made = mkdtemp(name);
-    mPath = made ? made : "/tmp";
-}
-
-TempDir::~TempDir() {
-    std::error_code ec;
-    if (mPath != "/tmp") {
-        std::filesystem::remove_all(mPath, ec);
-    }
-}
-
-CommandResult runTsgen(const std::string& file, const std::string& args) {
-    return runCommand(std::string(TAVO_TSGEN_PATH) + " -o '" + file + "' " + args);
 }
 
 std::vector<uint8_t> readFile(const std::string& file) {
@@ -61,17 +61,14 @@ std::vector<uint8_t> readFile(const std::string& file) {
                                 std::istreambuf_iterator<char>());
 }
 
+std::string decodeErrors(const std::string& file) {
+    return runCommand("ffmpeg -nostdin -v error -i '" + file + "' -f null -").err;
+}
+
 TsFile::TsFile(const std::vector<uint8_t>& bytes, size_t packetSize) {
-    if (bytes.empty() || bytes.size() % packetSize != 0 || packetSize < 188) {
-        mValid = false;
-        return;
-    }
-    for (size_t off = 0; off < bytes.size(); off += packetSize) {
+    mValid = !bytes.empty() && bytes.size() % packetSize == 0 && packetSize >= 188;
+    for (size_t off = 0; mValid && off < bytes.size(); off += packetSize) {
         const uint8_t* p = bytes.data() + off;
-        if (p[0] != 0x47) {
-            mValid = false;
-            return;
-        }
         TsPacket t;
         t.position = off / packetSize;
         t.tei = (p[1] & 0x80) != 0;
@@ -80,29 +77,22 @@ TsFile::TsFile(const std::vector<uint8_t>& bytes, size_t packetSize) {
         t.scrambling = p[3] >> 6;
         t.adaptationControl = (p[3] >> 4) & 3;
         t.cc = p[3] & 0x0F;
-        size_t payloadStart = 4;
-        if (t.adaptationControl & 2) {
-            const uint8_t length = p[4];
-            if (length > 183) {
-                mValid = false;
-                return;
-            }
-            if (length > 0) {
-                t.discontinuity = (p[5] & 0x80) != 0;
-                t.randomAccess = (p[5] & 0x40) != 0;
-                t.hasPcr = (p[5] & 0x10) != 0;
-                if (t.hasPcr) {
-                    const uint64_t base = (uint64_t{p[6]} << 25) | (uint64_t{p[7]} << 17) |
-                                          (uint64_t{p[8]} << 9) | (uint64_t{p[9]} << 1) |
-                                          (p[10] >> 7);
-                    const uint32_t ext = ((p[10] & 1U) << 8) | p[11];
-                    t.pcr27 = static_cast<int64_t>(base * 300 + ext);
-                }
-            }
-            payloadStart = 5 + length;
+        const uint8_t length = (t.adaptationControl & 2) ? p[4] : 0;
+        if (p[0] != 0x47 || length > 183) {
+            mValid = false;
+            break;
+        }
+        if ((t.adaptationControl & 2) && length > 0) {
+            t.discontinuity = (p[5] & 0x80) != 0;
+            t.randomAccess = (p[5] & 0x40) != 0;
+            t.hasPcr = (p[5] & 0x10) != 0;
+            const uint64_t base = (uint64_t{p[6]} << 25) | (uint64_t{p[7]} << 17) |
+                                  (uint64_t{p[8]} << 9) | (uint64_t{p[9]} << 1) | (p[10] >> 7);
+            t.pcr27 =
+                t.hasPcr ? static_cast<int64_t>(base * 300 + (((p[10] & 1U) << 8) | p[11])) : 0;
         }
         if (t.adaptationControl & 1) {
-            t.payload.assign(p + payloadStart, p + 188);
+            t.payload.assign(p + ((t.adaptationControl & 2) ? 5 + length : 4), p + 188);
         }
         mPackets.push_back(std::move(t));
     }
@@ -125,33 +115,23 @@ int64_t readTimestamp(const uint8_t* q) {
            (int64_t{q[3]} << 7) | (q[4] >> 1);
 }
 
-bool finishPes(const std::vector<uint8_t>& bytes, uint64_t first, Pes& pes) {
-    if (bytes.size() < 9 || bytes[0] != 0 || bytes[1] != 0 || bytes[2] != 1) {
-        return false;
+// ISO/IEC 13818-1, 2.4.3.6: the PES header, its PTS/DTS and the bytes that
+// PES_packet_length bounds (0: all that follow).
+void finishPes(const std::vector<uint8_t>& b, uint64_t first, std::vector<Pes>& out) {
+    if (b.size() < 9 || b[0] != 0 || b[1] != 0 || b[2] != 1 || 9u + b[8] > b.size()) {
+        return;
     }
+    Pes pes;
     pes.firstPacket = first;
-    pes.streamId = bytes[3];
-    pes.lengthField = static_cast<uint16_t>((bytes[4] << 8) | bytes[5]);
-    const uint8_t flags = bytes[7] >> 6;
-    const size_t headerEnd = 9 + bytes[8];
-    if (headerEnd > bytes.size()) {
-        return false;
-    }
-    pes.hasPts = (flags & 2) != 0;
-    pes.hasDts = flags == 3;
-    if (pes.hasPts) {
-        pes.pts = readTimestamp(&bytes[9]);
-    }
-    if (pes.hasDts) {
-        pes.dts = readTimestamp(&bytes[14]);
-    }
-    size_t end = bytes.size();
-    if (pes.lengthField != 0 && 6u + pes.lengthField <= bytes.size()) {
-        end = 6u + pes.lengthField;
-    }
-    pes.payload.assign(bytes.begin() + static_cast<std::ptrdiff_t>(headerEnd),
-                       bytes.begin() + static_cast<std::ptrdiff_t>(end));
-    return true;
+    pes.streamId = b[3];
+    pes.hasPts = (b[7] & 0x80) != 0;
+    pes.hasDts = (b[7] >> 6) == 3;
+    pes.pts = pes.hasPts ? readTimestamp(&b[9]) : 0;
+    pes.dts = pes.hasDts ? readTimestamp(&b[14]) : 0;
+    const size_t length = (b[4] << 8) | b[5];
+    const size_t end = (length != 0 && 6 + length <= b.size()) ? 6 + length : b.size();
+    pes.payload.assign(b.begin() + 9 + b[8], b.begin() + static_cast<std::ptrdiff_t>(end));
+    out.push_back(std::move(pes));
 }
 
 }  // namespace
@@ -159,131 +139,129 @@ bool finishPes(const std::vector<uint8_t>& bytes, uint64_t first, Pes& pes) {
 std::vector<Pes> TsFile::pesOf(uint16_t pid) const {
     std::vector<Pes> out;
     std::vector<uint8_t> bytes;
-    uint64_t first = 0;
-    bool open = false;
-    for (const auto& p : mPackets) {
-        if (p.pid != pid || p.payload.empty()) {
-            continue;
-        }
-        if (p.pusi) {
-            Pes pes;
-            if (open && finishPes(bytes, first, pes)) {
-                out.push_back(std::move(pes));
+    const TsPacket* first = nullptr;
+    for (const auto* p : packetsOf(pid)) {
+        if (p->pusi && !p->payload.empty()) {
+            if (first != nullptr) {
+                finishPes(bytes, first->position, out);
             }
             bytes.clear();
-            first = p.position;
-            open = true;
+            first = p;
         }
-        if (open) {
-            bytes.insert(bytes.end(), p.payload.begin(), p.payload.end());
+        if (first != nullptr) {
+            bytes.insert(bytes.end(), p->payload.begin(), p->payload.end());
         }
     }
-    Pes pes;
-    if (open && finishPes(bytes, first, pes)) {
-        out.push_back(std::move(pes));
+    if (first != nullptr) {
+        finishPes(bytes, first->position, out);
     }
     return out;
 }
 
-namespace {
-
-bool firstSection(const std::vector<const TsPacket*>& packets, uint8_t tableId,
-                  std::vector<uint8_t>& section) {
-    for (const auto* p : packets) {
-        if (!p->pusi || p->payload.empty()) {
+std::vector<PmtStream> TsFile::pmt(uint16_t pmtPid) const {
+    std::vector<PmtStream> streams;
+    for (const auto* p : packetsOf(pmtPid)) {
+        // The first whole TS_program_map_section (ISO/IEC 13818-1, 2.4.4.8).
+        const size_t at = p->payload.empty() ? 0 : 1 + p->payload[0];
+        if (!p->pusi || at + 16 > p->payload.size() || p->payload[at] != 0x02) {
             continue;
         }
-        const size_t start = 1 + p->payload[0];
-        if (start + 3 > p->payload.size() || p->payload[start] != tableId) {
+        const std::vector<uint8_t> s(p->payload.begin() + static_cast<std::ptrdiff_t>(at),
+                                     p->payload.end());
+        const size_t end = 3 + (((s[1] & 0x0F) << 8) | s[2]) - 4;  // before CRC_32
+        if (end + 4 > s.size()) {
             continue;
         }
-        const size_t length = ((p->payload[start + 1] & 0x0F) << 8) | p->payload[start + 2];
-        if (start + 3 + length > p->payload.size()) {
-            continue;
+        for (size_t i = 12 + (((s[10] & 0x0F) << 8) | s[11]); i + 5 <= end;) {
+            PmtStream es{s[i], static_cast<uint16_t>(((s[i + 1] & 0x1F) << 8) | s[i + 2]), {}};
+            const size_t esEnd = std::min(end, i + 5 + (((s[i + 3] & 0x0F) << 8) | s[i + 4]));
+            for (size_t d = i + 5; d + 2 <= esEnd && d + 2 + s[d + 1] <= esEnd; d += 2 + s[d + 1]) {
+                es.descriptors.emplace_back(
+                    s.begin() + static_cast<std::ptrdiff_t>(d),
+                    s.begin() + static_cast<std::ptrdiff_t>(d + 2 + s[d + 1]));
+            }
+            streams.push_back(std::move(es));
+            i = esEnd;
         }
-        section.assign(p->payload.begin() + static_cast<std::ptrdiff_t>(start),
-                       p->payload.begin() + static_cast<std::ptrdiff_t>(start + 3 + length));
-        return true;
+        break;
     }
-    return false;
-}
-
-}  // namespace
-
-std::map<uint16_t, uint16_t> TsFile::pat() const {
-    std::map<uint16_t, uint16_t> programs;
-    std::vector<uint8_t> s;
-    if (!firstSection(packetsOf(0), 0x00, s) || s.size() < 12) {
-        return programs;
-    }
-    for (size_t i = 8; i + 4 <= s.size() - 4; i += 4) {
-        programs[static_cast<uint16_t>((s[i] << 8) | s[i + 1])] =
-            static_cast<uint16_t>(((s[i + 2] & 0x1F) << 8) | s[i + 3]);
-    }
-    return programs;
-}
-
-bool TsFile::pmt(uint16_t pmtPid, Pmt& pmt) const {
-    std::vector<uint8_t> s;
-    if (!firstSection(packetsOf(pmtPid), 0x02, s) || s.size() < 16) {
-        return false;
-    }
-    pmt.programNumber = static_cast<uint16_t>((s[3] << 8) | s[4]);
-    pmt.pcrPid = static_cast<uint16_t>(((s[8] & 0x1F) << 8) | s[9]);
-    const size_t infoLength = ((s[10] & 0x0F) << 8) | s[11];
-    size_t i = 12 + infoLength;
-    const size_t end = s.size() - 4;  // CRC_32
-    while (i + 5 <= end) {
-        PmtStream es;
-        es.streamType = s[i];
-        es.pid = static_cast<uint16_t>(((s[i + 1] & 0x1F) << 8) | s[i + 2]);
-        const size_t esInfo = ((s[i + 3] & 0x0F) << 8) | s[i + 4];
-        size_t d = i + 5;
-        while (d + 2 <= i + 5 + esInfo && d + 2 + s[d + 1] <= end) {
-            es.descriptors.emplace_back(s.begin() + static_cast<std::ptrdiff_t>(d),
-                                        s.begin() + static_cast<std::ptrdiff_t>(d + 2 + s[d + 1]));
-            d += 2 + s[d + 1];
-        }
-        pmt.streams.push_back(std::move(es));
-        i += 5 + esInfo;
-    }
-    return true;
+    return streams;
 }
 
 std::vector<size_t> TsFile::continuityErrors(uint16_t pid) const {
     std::vector<size_t> errors;
     const auto packets = packetsOf(pid);
     for (size_t i = 1; i < packets.size(); ++i) {
-        const uint8_t last = packets[i - 1]->cc;
         // Packets without payload keep the counter; packets with payload advance it.
-        const uint8_t expected =
-            (packets[i]->adaptationControl & 1) ? static_cast<uint8_t>((last + 1) & 0x0F) : last;
-        if (packets[i]->cc != expected) {
+        const uint8_t step = packets[i]->adaptationControl & 1;
+        if (packets[i]->cc != ((packets[i - 1]->cc + step) & 0x0F)) {
             errors.push_back(i);
         }
     }
     return errors;
 }
 
-std::map<std::string, std::string> ffprobe(const std::string& file, const std::string& extra) {
-    const auto r =
-        runCommand("ffprobe -v error -show_programs -show_streams -show_format -of flat " + extra +
-                   " '" + file + "'");
+std::vector<std::pair<uint64_t, int64_t>> pcrAnomalies(const TsFile& ts, int64_t muxRate) {
+    std::vector<std::pair<uint64_t, int64_t>> anomalies;
+    const TsPacket* previous = nullptr;
+    for (const auto& p : ts.packets()) {
+        if (p.hasPcr && previous != nullptr) {
+            const int64_t slots = static_cast<int64_t>(p.position - previous->position);
+            const int64_t excess = p.pcr27 - previous->pcr27 - slots * ticks27PerPacket(muxRate);
+            if (excess > 1 || excess < -1) {
+                anomalies.emplace_back(p.position, excess);
+            }
+        }
+        previous = p.hasPcr ? &p : previous;
+    }
+    return anomalies;
+}
+
+::testing::AssertionResult Generated::ok() const {
+    if (run.exitCode != 0 || !ts.valid()) {
+        return ::testing::AssertionFailure()
+               << "tsgen exit " << run.exitCode << ", " << bytes.size() << " bytes: " << run.err;
+    }
+    return ::testing::AssertionSuccess();
+}
+
+const Generated& tsgen(const std::string& args, size_t packetSize) {
+    static std::map<std::string, std::unique_ptr<Generated>> made;
+    auto& slot = made[args];
+    if (!slot) {
+        const std::string file = tempPath("gen" + std::to_string(made.size()) + ".ts");
+        auto run = runCommand(std::string(TAVO_TSGEN_PATH) + " -o '" + file + "' " + args);
+        auto bytes = readFile(file);
+        TsFile ts(bytes, packetSize);
+        slot.reset(new Generated{std::move(run), file, std::move(bytes), std::move(ts)});
+    }
+    return *slot;
+}
+
+std::map<std::string, std::string> ffprobe(const std::string& file) {
+    std::istringstream lines(
+        runCommand("ffprobe -v error -show_programs -show_streams -of flat '" + file + "'").out);
     std::map<std::string, std::string> values;
-    std::istringstream lines(r.out);
-    std::string line;
-    while (std::getline(lines, line)) {
+    for (std::string line; std::getline(lines, line);) {
         const auto eq = line.find('=');
+        std::string key = line.substr(0, eq), value = line.substr(eq + 1);
         if (eq == std::string::npos) {
             continue;
         }
-        std::string value = line.substr(eq + 1);
-        if (value.size() >= 2 && value.front() == '"' && value.back() == '"') {
-            value = value.substr(1, value.size() - 2);
-        }
-        values[line.substr(0, eq)] = value;
+        key = key.rfind("programs.program.0.", 0) == 0 ? "p." + key.substr(19) : key;
+        key = key.rfind("streams.stream.", 0) == 0 ? key.substr(15) : key;
+        const bool quoted = value.size() >= 2 && value.front() == '"' && value.back() == '"';
+        values[key] = quoted ? value.substr(1, value.size() - 2) : value;
     }
     return values;
+}
+
+void expectProbe(std::map<std::string, std::string> probe, const std::string& expected) {
+    std::istringstream items(expected);
+    for (std::string item; items >> item;) {
+        const auto eq = item.find('=');
+        EXPECT_EQ(probe[item.substr(0, eq)], item.substr(eq + 1)) << item.substr(0, eq);
+    }
 }
 
 std::vector<int> nalTypes(const std::vector<uint8_t>& es) {

@@ -2,6 +2,8 @@
 // tests' own, independent of tsgen's multiplexer.
 #pragma once
 
+#include <gtest/gtest.h>
+
 #include <cstdint>
 #include <map>
 #include <string>
@@ -11,29 +13,16 @@ namespace TavoPlayer::test {
 
 struct CommandResult {
     int exitCode = -1;
-    std::string out;  // standard output, when captured
-    std::string err;  // standard error
+    std::string out;  // standard output, unless redirected in the command
+    std::string err;
 };
 
-// Runs a shell command; standard output goes to `out` unless redirected in the command.
 CommandResult runCommand(const std::string& command);
-
-// A fresh temporary folder, removed with the object.
-class TempDir {
-public:
-    TempDir();
-    ~TempDir();
-    TempDir(const TempDir&) = delete;
-    TempDir& operator=(const TempDir&) = delete;
-    std::string path(const std::string& name) const { return mPath + "/" + name; }
-
-private:
-    std::string mPath;
-};
-
-// Runs tsgen with the arguments (already quoted for the shell) writing to `file`.
-CommandResult runTsgen(const std::string& file, const std::string& args);
+// A path in a temporary folder of this test process, removed when it exits.
+std::string tempPath(const std::string& name);
 std::vector<uint8_t> readFile(const std::string& file);
+// What libavcodec complains about while decoding every stream of `file`.
+std::string decodeErrors(const std::string& file);
 
 struct TsPacket {
     uint64_t position = 0;  // packet number in the file
@@ -53,7 +42,6 @@ struct TsPacket {
 struct Pes {
     uint64_t firstPacket = 0;  // position of the packet that started it
     uint8_t streamId = 0;
-    uint16_t lengthField = 0;
     bool hasPts = false;
     bool hasDts = false;
     int64_t pts = 0;
@@ -67,12 +55,6 @@ struct PmtStream {
     std::vector<std::vector<uint8_t>> descriptors;  // tag, length, body
 };
 
-struct Pmt {
-    uint16_t programNumber = 0;
-    uint16_t pcrPid = 0;
-    std::vector<PmtStream> streams;
-};
-
 // Reads 188-byte packets (or 204-byte ones, ignoring their last 16 bytes);
 // every packet must start with 0x47.
 class TsFile {
@@ -84,9 +66,8 @@ public:
     // Whole PES packets of a PID (a PES ends where the next one starts; the
     // last one at the end of the file).
     std::vector<Pes> pesOf(uint16_t pid) const;
-    // The first PAT's programmes (program_number -> PMT PID) and that PMT.
-    std::map<uint16_t, uint16_t> pat() const;
-    bool pmt(uint16_t pmtPid, Pmt& pmt) const;
+    // The elementary streams of the first PMT section on `pmtPid`.
+    std::vector<PmtStream> pmt(uint16_t pmtPid = 0x1000) const;
     // Positions (index among the PID's packets) where the continuity counter
     // does not follow ISO/IEC 13818-1, 2.4.3.3.
     std::vector<size_t> continuityErrors(uint16_t pid) const;
@@ -96,8 +77,30 @@ private:
     std::vector<TsPacket> mPackets;
 };
 
-// ffprobe's view of a file as "section.key=value" lines (flat format).
-std::map<std::string, std::string> ffprobe(const std::string& file, const std::string& extra = "");
+// Time of one packet slot at a constant transport rate, in 27 MHz ticks.
+constexpr int64_t ticks27PerPacket(int64_t muxRate) {
+    return 188 * 8 * 27000000LL / muxRate;
+}
+// PCR steps that differ from what the byte distance predicts at `muxRate`:
+// (packet position of the later PCR, excess in 27 MHz ticks).
+std::vector<std::pair<uint64_t, int64_t>> pcrAnomalies(const TsFile& ts, int64_t muxRate);
+
+// tsgen's output for `args`, made once per test process and shared by the
+// tests that ask for the same arguments.
+struct Generated {
+    CommandResult run;
+    std::string file;
+    std::vector<uint8_t> bytes;
+    TsFile ts;
+    ::testing::AssertionResult ok() const;
+};
+const Generated& tsgen(const std::string& args, size_t packetSize = 188);
+
+// ffprobe's flat view of a file, keys shortened: "p." for the first programme,
+// "N." for stream N (e.g. "p.pcr_pid", "1.codec_name").
+std::map<std::string, std::string> ffprobe(const std::string& file);
+// Checks that view against "key=value" items separated by spaces.
+void expectProbe(std::map<std::string, std::string> probe, const std::string& expected);
 
 // NAL unit types of an Annex B byte stream, in order.
 std::vector<int> nalTypes(const std::vector<uint8_t>& es);

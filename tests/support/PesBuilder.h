@@ -4,6 +4,7 @@
 
 #include <cstdint>
 #include <optional>
+#include <utility>
 #include <vector>
 
 namespace TavoPlayer::test {
@@ -12,29 +13,31 @@ class PesBuilder {
 public:
     explicit PesBuilder(uint8_t streamId = 0xE0) : mStreamId(streamId) {}
 
-    PesBuilder& streamId(uint8_t id);
-    PesBuilder& pts(uint64_t pts);
-    PesBuilder& dts(uint64_t dts);
+    PesBuilder& pts(uint64_t v) { return set(mPts, v); }
+    PesBuilder& dts(uint64_t v) { return set(mDts, v); }
     // Extra optional fields after PTS/DTS (ESCR, ES rate, ...): flag bits for
     // byte 7 and their bytes, in order.
-    PesBuilder& optionalFields(uint8_t flags7, std::vector<uint8_t> bytes);
-    PesBuilder& stuffing(uint8_t count);
+    PesBuilder& optionalFields(uint8_t flags7, std::vector<uint8_t> bytes) {
+        mExtraFlags = flags7;
+        return set(mExtraFields, std::move(bytes));
+    }
+    PesBuilder& stuffing(uint8_t v) { return set(mStuffing, v); }
     // Overrides byte 6 (default 0x80: start bits '10', nothing else set).
-    PesBuilder& byte6(uint8_t value);
+    PesBuilder& byte6(uint8_t v) { return set(mByte6, v); }
     // Overrides PES_header_data_length (default: the size of the fields written).
-    PesBuilder& headerDataLength(uint8_t length);
-    // Overrides PES_packet_length (default: the real length, or 0 above 65535).
-    PesBuilder& lengthField(uint16_t length);
+    PesBuilder& headerDataLength(uint8_t v) { return set(mHeaderDataLength, v); }
     // Leaves out the optional header, as for padding or private_stream_2.
-    PesBuilder& noOptionalHeader();
-    PesBuilder& payload(std::vector<uint8_t> bytes);
+    PesBuilder& noOptionalHeader() { return set(mOptionalHeader, false); }
+    PesBuilder& payload(std::vector<uint8_t> v) { return set(mPayload, std::move(v)); }
 
     std::vector<uint8_t> build() const;
 
-    // The five bytes of a 33-bit time stamp with its 4-bit prefix and marker bits.
-    static void writeTimeStamp(uint8_t* out, uint8_t prefix, uint64_t time);
-
 private:
+    template <typename F, typename V>
+    PesBuilder& set(F& field, V value) {
+        field = std::move(value);
+        return *this;
+    }
     uint8_t mStreamId;
     std::optional<uint64_t> mPts;
     std::optional<uint64_t> mDts;
@@ -43,7 +46,6 @@ private:
     uint8_t mStuffing = 0;
     uint8_t mByte6 = 0x80;
     std::optional<uint8_t> mHeaderDataLength;
-    std::optional<uint16_t> mLengthField;
     bool mOptionalHeader = true;
     std::vector<uint8_t> mPayload;
 };

@@ -1,7 +1,6 @@
 #include "TsPacketBuilder.h"
 
 #include <algorithm>
-#include <cstring>
 #include <stdexcept>
 
 namespace TavoPlayer::test {
@@ -19,85 +18,12 @@ void appendClock(std::vector<uint8_t>* out, uint64_t base, uint16_t extension) {
 
 }  // namespace
 
-TsPacketBuilder& TsPacketBuilder::pid(uint16_t pid) {
-    mPid = pid;
-    return *this;
-}
-TsPacketBuilder& TsPacketBuilder::unitStart(bool on) {
-    mUnitStart = on;
-    return *this;
-}
-TsPacketBuilder& TsPacketBuilder::continuity(uint8_t counter) {
-    mContinuity = counter & 0x0F;
-    return *this;
-}
-TsPacketBuilder& TsPacketBuilder::scrambling(uint8_t control) {
-    mScrambling = control & 3;
-    return *this;
-}
-TsPacketBuilder& TsPacketBuilder::transportError(bool on) {
-    mTransportError = on;
-    return *this;
-}
-TsPacketBuilder& TsPacketBuilder::priority(bool on) {
-    mPriority = on;
-    return *this;
-}
-TsPacketBuilder& TsPacketBuilder::syncByte(uint8_t byte) {
-    mSync = byte;
-    return *this;
-}
-TsPacketBuilder& TsPacketBuilder::adaptationControl(uint8_t control) {
-    mControl = control & 3;
-    return *this;
-}
-TsPacketBuilder& TsPacketBuilder::discontinuity(bool on) {
-    mDiscontinuity = on;
-    return *this;
-}
-TsPacketBuilder& TsPacketBuilder::randomAccess(bool on) {
-    mRandomAccess = on;
-    return *this;
-}
-TsPacketBuilder& TsPacketBuilder::pcr(uint64_t base, uint16_t extension) {
-    mPcr = {base, extension};
-    return *this;
-}
-TsPacketBuilder& TsPacketBuilder::opcr(uint64_t base, uint16_t extension) {
-    mOpcr = {base, extension};
-    return *this;
-}
-TsPacketBuilder& TsPacketBuilder::spliceCountdown(uint8_t countdown) {
-    mSplice = countdown;
-    return *this;
-}
-TsPacketBuilder& TsPacketBuilder::privateData(std::vector<uint8_t> bytes) {
-    mPrivate = std::move(bytes);
-    return *this;
-}
-TsPacketBuilder& TsPacketBuilder::extension(uint8_t length, uint8_t flags,
-                                            std::vector<uint8_t> body) {
-    std::vector<uint8_t> bytes{length, flags};
-    bytes.insert(bytes.end(), body.begin(), body.end());
-    mExtension = std::move(bytes);
-    return *this;
-}
-TsPacketBuilder& TsPacketBuilder::rawAfterHeader(std::vector<uint8_t> bytes) {
-    mRaw = std::move(bytes);
-    return *this;
-}
-TsPacketBuilder& TsPacketBuilder::payload(std::vector<uint8_t> bytes) {
-    mPayload = std::move(bytes);
-    return *this;
-}
-
 TsPacket TsPacketBuilder::build() const {
     TsPacket packet;
     packet.fill(0xFF);
 
     // Adaptation field body: flags byte and optional parts.
-    const bool anyField =
-        mDiscontinuity || mRandomAccess || mPcr || mOpcr || mSplice || mPrivate || mExtension;
+    const bool anyField = mDiscontinuity || mRandomAccess || mPcr || mOpcr || mSplice || mPrivate;
     std::vector<uint8_t> field;
     if (anyField) {
         uint8_t flags = 0;
@@ -113,8 +39,6 @@ TsPacket TsPacketBuilder::build() const {
             flags |= 0x04;
         if (mPrivate)
             flags |= 0x02;
-        if (mExtension)
-            flags |= 0x01;
         field.push_back(flags);
         if (mPcr)
             appendClock(&field, mPcr->first, mPcr->second);
@@ -126,8 +50,6 @@ TsPacket TsPacketBuilder::build() const {
             field.push_back(static_cast<uint8_t>(mPrivate->size()));
             field.insert(field.end(), mPrivate->begin(), mPrivate->end());
         }
-        if (mExtension)
-            field.insert(field.end(), mExtension->begin(), mExtension->end());
     }
     const size_t payloadSize = mPayload ? mPayload->size() : 0;
     const bool hasField = anyField || (mPayload && payloadSize < 184) || !mPayload;
@@ -183,6 +105,13 @@ std::vector<TsPacket> packetizePes(uint16_t pid, const std::vector<uint8_t>& pes
         offset += take;
     } while (offset < pes.size());
     return packets;
+}
+
+std::vector<uint8_t> ramp(size_t n, uint8_t first) {
+    std::vector<uint8_t> v(n);
+    for (size_t i = 0; i < n; ++i)
+        v[i] = static_cast<uint8_t>(first + i);
+    return v;
 }
 
 std::vector<uint8_t> concatPackets(const std::vector<TsPacket>& packets) {

@@ -5,6 +5,7 @@
 #include <array>
 #include <cstdint>
 #include <optional>
+#include <utility>
 #include <vector>
 
 namespace TavoPlayer::test {
@@ -12,37 +13,43 @@ namespace TavoPlayer::test {
 using TsPacket = std::array<uint8_t, 188>;
 
 class TsPacketBuilder {
+    using Bytes = std::vector<uint8_t>;
+    using Clock = std::pair<uint64_t, uint16_t>;
+
 public:
-    TsPacketBuilder& pid(uint16_t pid);
-    TsPacketBuilder& unitStart(bool on = true);
-    TsPacketBuilder& continuity(uint8_t counter);
-    TsPacketBuilder& scrambling(uint8_t control);
-    TsPacketBuilder& transportError(bool on = true);
-    TsPacketBuilder& priority(bool on = true);
-    TsPacketBuilder& syncByte(uint8_t byte);
+    TsPacketBuilder& pid(uint16_t v) { return set(mPid, v); }
+    TsPacketBuilder& unitStart(bool on = true) { return set(mUnitStart, on); }
+    TsPacketBuilder& continuity(uint8_t v) { return set(mContinuity, uint8_t(v & 0x0F)); }
+    TsPacketBuilder& scrambling(uint8_t v) { return set(mScrambling, uint8_t(v & 3)); }
+    TsPacketBuilder& transportError(bool on = true) { return set(mTransportError, on); }
+    TsPacketBuilder& priority(bool on = true) { return set(mPriority, on); }
+    TsPacketBuilder& syncByte(uint8_t v) { return set(mSync, v); }
     // Forces adaptation_field_control (else derived: 1 payload only, 2 field only,
     // 3 both).
-    TsPacketBuilder& adaptationControl(uint8_t control);
+    TsPacketBuilder& adaptationControl(uint8_t v) { return set(mControl, uint8_t(v & 3)); }
 
     // Adaptation-field contents, laid out by the standard.
-    TsPacketBuilder& discontinuity(bool on = true);
-    TsPacketBuilder& randomAccess(bool on = true);
-    TsPacketBuilder& pcr(uint64_t base, uint16_t extension = 0);
-    TsPacketBuilder& opcr(uint64_t base, uint16_t extension = 0);
-    TsPacketBuilder& spliceCountdown(uint8_t countdown);
-    TsPacketBuilder& privateData(std::vector<uint8_t> bytes);
-    // The adaptation_field_extension: length byte, flags byte, then `body` as given.
-    TsPacketBuilder& extension(uint8_t length, uint8_t flags, std::vector<uint8_t> body);
+    TsPacketBuilder& discontinuity(bool on = true) { return set(mDiscontinuity, on); }
+    TsPacketBuilder& randomAccess(bool on = true) { return set(mRandomAccess, on); }
+    TsPacketBuilder& pcr(uint64_t base, uint16_t ext = 0) { return set(mPcr, Clock{base, ext}); }
+    TsPacketBuilder& opcr(uint64_t base, uint16_t ext = 0) { return set(mOpcr, Clock{base, ext}); }
+    TsPacketBuilder& spliceCountdown(uint8_t v) { return set(mSplice, v); }
+    TsPacketBuilder& privateData(Bytes v) { return set(mPrivate, std::move(v)); }
     // Replaces everything after the header by these bytes (byte 4 onward), for
     // lengths and layouts the standard does not allow.
-    TsPacketBuilder& rawAfterHeader(std::vector<uint8_t> bytes);
+    TsPacketBuilder& rawAfterHeader(Bytes v) { return set(mRaw, std::move(v)); }
 
     // Payload; a short one is padded with adaptation-field stuffing, as a muxer does.
-    TsPacketBuilder& payload(std::vector<uint8_t> bytes);
+    TsPacketBuilder& payload(Bytes v) { return set(mPayload, std::move(v)); }
 
     TsPacket build() const;
 
 private:
+    template <typename F, typename V>
+    TsPacketBuilder& set(F& field, V value) {
+        field = std::move(value);
+        return *this;
+    }
     uint16_t mPid = 0x100;
     bool mUnitStart = false;
     uint8_t mContinuity = 0;
@@ -53,18 +60,20 @@ private:
     std::optional<uint8_t> mControl;
     bool mDiscontinuity = false;
     bool mRandomAccess = false;
-    std::optional<std::pair<uint64_t, uint16_t>> mPcr;
-    std::optional<std::pair<uint64_t, uint16_t>> mOpcr;
+    std::optional<Clock> mPcr;
+    std::optional<Clock> mOpcr;
     std::optional<uint8_t> mSplice;
-    std::optional<std::vector<uint8_t>> mPrivate;
-    std::optional<std::vector<uint8_t>> mExtension;
-    std::optional<std::vector<uint8_t>> mRaw;
-    std::optional<std::vector<uint8_t>> mPayload;
+    std::optional<Bytes> mPrivate;
+    std::optional<Bytes> mRaw;
+    std::optional<Bytes> mPayload;
 };
 
 // Cuts a whole PES packet into transport packets of one PID: unit start on the
 // first, counters from *counter on (left at the next value), stuffing on the last.
 std::vector<TsPacket> packetizePes(uint16_t pid, const std::vector<uint8_t>& pes, uint8_t* counter);
+
+// n bytes counting up from `first`: a payload whose every byte is known.
+std::vector<uint8_t> ramp(size_t n, uint8_t first = 0);
 
 // Packets laid end to end, as the receiver writes them into a ring.
 std::vector<uint8_t> concatPackets(const std::vector<TsPacket>& packets);

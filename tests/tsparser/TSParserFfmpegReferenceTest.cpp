@@ -10,7 +10,7 @@
 #include <thread>
 #include <vector>
 
-#include "TsParserTestUtil.h"
+#include "support/TsTestUtil.h"
 #include "support/TraceCapture.h"
 #include "tsparser/TSParser.h"
 

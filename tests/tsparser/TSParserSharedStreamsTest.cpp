@@ -8,7 +8,7 @@
 #include <string>
 #include <vector>
 
-#include "TsParserTestUtil.h"
+#include "support/TsTestUtil.h"
 #include "support/TraceCapture.h"
 #include "tsparser/TSParser.h"
 

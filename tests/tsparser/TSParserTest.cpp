@@ -2,45 +2,25 @@
 
 #include <gtest/gtest.h>
 
-#include <cstdio>
 #include <future>
+#include <ostream>
 #include <random>
 #include <string>
 #include <vector>
 
-#include "TsParserTestUtil.h"
 #include "platform/dtv/RecPlayerBinder.h"
 #include "support/PesBuilder.h"
 #include "support/TraceCapture.h"
 #include "support/TsPacketBuilder.h"
+#include "support/TsTestUtil.h"
 
 namespace TavoPlayer {
 namespace {
 
 using namespace std::chrono_literals;
-using test::concatPackets;
-using test::drainRecords;
-using test::makeRing;
-using test::packetizePes;
-using test::PesBuilder;
-using test::PesRecord;
-using test::readRecord;
-using test::RecordingErrorListener;
-using test::TraceCapture;
-using test::TsPacket;
-using test::TsPacketBuilder;
-using test::waitConsumed;
-using test::waitUntil;
-using test::writeAll;
+using namespace test;
 
 constexpr uint16_t kPid = 0x111;
-
-std::vector<uint8_t> ramp(size_t n, uint8_t first = 0) {
-    std::vector<uint8_t> v(n);
-    for (size_t i = 0; i < n; ++i)
-        v[i] = static_cast<uint8_t>(first + i * 7);
-    return v;
-}
 
 // A clock whose monotonic time advances 100 ms at every reading, so that every
 // setBasePCR far from the current base re-bases (and logs "Setting PCR").
@@ -57,12 +37,6 @@ android::sp<Synchronization> steppingClock() {
 // One parser wired to an input ring and one output ring, started by each test.
 class TSParserModuleTest : public ::testing::Test {
 protected:
-    void SetUp() override {
-        input = makeRing("VideoTS", 1 << 16);
-        output = makeRing("VideoPES", 1 << 16);
-        ASSERT_NE(input, nullptr);
-        ASSERT_NE(output, nullptr);
-    }
     void TearDown() override {
         if (parser != nullptr) {
             EXPECT_EQ(parser->stop(), 0u);
@@ -85,20 +59,19 @@ protected:
         ASSERT_TRUE(writeAll(*input, concatPackets(packets)));
         ASSERT_TRUE(waitConsumed(*input)) << "the parser did not consume its input";
     }
+    void feedPes(const std::vector<uint8_t>& bytes) { feed(pes(bytes)); }
     std::vector<TsPacket> pes(const std::vector<uint8_t>& bytes) {
         return packetizePes(kPid, bytes, &counter);
     }
 
     TraceCapture trace;
-    android::sp<RingBuffer> input;
-    android::sp<RingBuffer> output;
+    android::sp<RingBuffer> input = makeRing("VideoTS", 1 << 16);
+    android::sp<RingBuffer> output = makeRing("VideoPES", 1 << 16);
     android::sp<Synchronization> clock = steppingClock();
     android::sp<TSParser> parser;
     RecordingErrorListener errors;
     uint8_t counter = 0;
 };
-
-// --- assembly of one PES -------------------------------------------------------------
 
 TEST_F(TSParserModuleTest, PesAcrossTenPacketsIsWrittenAtTheEleventh) {
     startParser(TSParser::KIND_VIDEO);
@@ -110,7 +83,7 @@ TEST_F(TSParserModuleTest, PesAcrossTenPacketsIsWrittenAtTheEleventh) {
     feed(packets);
     EXPECT_EQ(output->usedSpace(), 0u) << "nothing may be written before the next unit start";
 
-    feed(pes(PesBuilder(0xE0).pts(5).payload(ramp(10)).build()));
+    feedPes(PesBuilder(0xE0).pts(5).payload(ramp(10)).build());
     auto record = readRecord(*output);
     ASSERT_TRUE(record.has_value());
     EXPECT_EQ(record->type, 0u);
@@ -126,104 +99,115 @@ TEST_F(TSParserModuleTest, PesAcrossTenPacketsIsWrittenAtTheEleventh) {
     EXPECT_FALSE(clock->isValid(Synchronization::Audio));
 }
 
-TEST_F(TSParserModuleTest, RecordsOfOddSizesAdvanceByMultiplesOfFour) {
+// Records of odd sizes advance the ring by multiples of four; a PES without time
+// stamps repeats the last ones seen.
+TEST_F(TSParserModuleTest, OddSizesAndMissingTimes) {
     startParser(TSParser::KIND_CLOSED_CAPTION);
     std::vector<std::vector<uint8_t>> units;
+    std::vector<uint64_t> pts;
+    std::vector<uint64_t> dts;
     for (size_t n : {1u, 2u, 3u, 183u, 185u, 367u, 1000u}) {
-        units.push_back(
-            PesBuilder(0xBD).pts(90 * n).payload(ramp(n, static_cast<uint8_t>(n))).build());
-        feed(pes(units.back()));
+        PesBuilder b(0xBD);
+        const bool timed = n % 3 != 0;
+        if (timed)
+            b.pts(90 * n).dts(45 * n);
+        pts.push_back(timed ? 90 * n : pts.back());
+        dts.push_back(timed ? 45 * n : dts.back());
+        units.push_back(b.payload(ramp(n, static_cast<uint8_t>(n))).build());
+        feedPes(units.back());
     }
     const auto records = drainRecords(*output);
     ASSERT_EQ(records.size(), units.size() - 1);
     for (size_t i = 0; i < records.size(); ++i) {
         EXPECT_EQ(records[i].pes, units[i]) << i;
-        EXPECT_EQ(records[i].pts, 90 * records[i].sizeES) << i;
+        EXPECT_EQ(records[i].pts, pts[i]) << i;
+        EXPECT_EQ(records[i].dts, dts[i]) << i;
         EXPECT_EQ(records[i].offsetES + records[i].sizeES, records[i].size) << i;
     }
     EXPECT_FALSE(clock->isValid(Synchronization::Video)) << "captions feed no clock";
 }
 
-TEST_F(TSParserModuleTest, PesWithoutTimesRepeatsThePreviousOnes) {
-    startParser(TSParser::KIND_VIDEO);
-    feed(pes(PesBuilder(0xE0).pts(9000).dts(6000).payload(ramp(300)).build()));
-    feed(pes(PesBuilder(0xE0).payload(ramp(200)).build()));
-    feed(pes(PesBuilder(0xE0).pts(12000).payload(ramp(100)).build()));
-    feed(pes(PesBuilder(0xE0).payload(ramp(1)).build()));
-    const auto records = drainRecords(*output);
-    ASSERT_EQ(records.size(), 3u);
-    EXPECT_EQ(records[1].pts, 9000u);
-    EXPECT_EQ(records[1].dts, 6000u);
-    EXPECT_EQ(records[2].pts, 12000u);
-    EXPECT_EQ(records[2].dts, 6000u);
+// --- what is dropped: a broken PES, then a whole one that must come out alone ---------
+
+struct DropCase {
+    const char* name;
+    int kind;
+    uint32_t outputSize;
+    std::function<std::vector<TsPacket>(uint8_t* counter)> broken;
+    std::vector<std::pair<const char*, size_t>> messages;  // count 0: at least once
+};
+void PrintTo(const DropCase& c, std::ostream* os) {
+    *os << c.name;
 }
 
-// --- what is dropped -----------------------------------------------------------------
+class TSParserDropTest : public TSParserModuleTest,
+                         public ::testing::WithParamInterface<DropCase> {};
 
-TEST_F(TSParserModuleTest, ContinuityErrorDropsThePes) {
-    startParser(TSParser::KIND_VIDEO);
-    auto broken = pes(PesBuilder(0xE0).pts(1000).payload(ramp(900)).build());
-    broken.erase(broken.begin() + 2);  // a lost packet in the middle
-    const auto kept = PesBuilder(0xE0).pts(2000).payload(ramp(500)).build();
-    feed(broken);
-    feed(pes(kept));
-    feed(pes(PesBuilder(0xE0).pts(3000).payload(ramp(10)).build()));
-    const auto records = drainRecords(*output);
-    ASSERT_EQ(records.size(), 1u);
-    EXPECT_EQ(records[0].pes, kept);
-    EXPECT_EQ(trace.count("continuity error! Discarding entire PES packet"), 1u) << trace.all();
-    EXPECT_EQ(trace.count("threadLoop - TS parser error; discarding entire PES packet."), 1u)
-        << trace.all();
-}
-
-TEST_F(TSParserModuleTest, OverlongAdaptationFieldDropsThePes) {
-    startParser(TSParser::KIND_VIDEO);
-    auto broken = pes(PesBuilder(0xE0).pts(1000).payload(ramp(900)).build());
-    ASSERT_EQ(broken.size(), 5u);
-    broken[2] = TsPacketBuilder()
-                    .pid(kPid)
-                    .continuity(2)
-                    .adaptationControl(3)
-                    .rawAfterHeader({200})
-                    .build();
-    const auto kept = PesBuilder(0xE0).pts(2000).payload(ramp(500)).build();
-    feed(broken);
-    feed(pes(kept));
-    feed(pes(PesBuilder(0xE0).pts(3000).payload(ramp(10)).build()));
-    const auto records = drainRecords(*output);
-    ASSERT_EQ(records.size(), 1u);
-    EXPECT_EQ(records[0].pes, kept) << "no bytes of the broken PES may precede it";
-    EXPECT_TRUE(trace.contains("parseHeader: Invalid adaptation field length: 200")) << trace.all();
-    EXPECT_EQ(trace.count("threadLoop - TS parser error; discarding entire PES packet."), 1u)
-        << trace.all();
-}
-
-TEST_F(TSParserModuleTest, PesWithoutStartCodeIsDropped) {
-    startParser(TSParser::KIND_AUDIO);
-    std::vector<uint8_t> garbage = ramp(400, 1);  // no 00 00 01
-    feed(packetizePes(kPid, garbage, &counter));
-    const auto kept = PesBuilder(0xC0).pts(4500).payload(ramp(700)).build();
-    feed(pes(kept));
-    feed(pes(PesBuilder(0xC0).pts(9000).payload(ramp(5)).build()));
-    const auto records = drainRecords(*output);
-    ASSERT_EQ(records.size(), 1u);
-    EXPECT_EQ(records[0].pes, kept);
-    EXPECT_EQ(trace.count("finishPES - PES parser error; discarding entire packet."), 1u)
-        << trace.all();
-}
-
-TEST_F(TSParserModuleTest, PesLargerThanTheOutputIsDroppedNotWaitedFor) {
-    output = makeRing("VideoPES", 4096);
-    startParser(TSParser::KIND_VIDEO);
-    feed(pes(PesBuilder(0xE0).pts(1).payload(ramp(5000)).build()));
-    const auto kept = PesBuilder(0xE0).pts(2).payload(ramp(1000)).build();
-    feed(pes(kept));
-    feed(pes(PesBuilder(0xE0).pts(3).payload(ramp(10)).build()));
+TEST_P(TSParserDropTest, BrokenPesIsDroppedAndTheNextKept) {
+    const DropCase& c = GetParam();
+    output = makeRing("PES", c.outputSize);
+    startParser(c.kind);
+    feed(c.broken(&counter));
+    const auto kept = PesBuilder(0xE0).pts(2000).payload(ramp(1000)).build();
+    feedPes(kept);
+    feedPes(PesBuilder(0xE0).pts(3000).payload(ramp(10)).build());
     const auto records = drainRecords(*output);
     ASSERT_EQ(records.size(), 1u) << trace.all();
-    EXPECT_EQ(records[0].pes, kept);
-    EXPECT_GE(trace.count("TS parser error; discarding entire PES packet."), 1u) << trace.all();
+    EXPECT_EQ(records[0].pes, kept) << "no bytes of the broken PES may precede it";
+    for (const auto& [text, count] : c.messages) {
+        if (count == 0) {
+            EXPECT_TRUE(trace.contains(text)) << text << "\n" << trace.all();
+        } else {
+            EXPECT_EQ(trace.count(text), count) << text << "\n" << trace.all();
+        }
+    }
 }
+
+constexpr const char* kDiscarded = "threadLoop - TS parser error; discarding entire PES packet.";
+
+INSTANTIATE_TEST_SUITE_P(
+    Faults, TSParserDropTest,
+    ::testing::Values(
+        DropCase{"LostPacket",
+                 TSParser::KIND_VIDEO,
+                 1 << 16,
+                 [](uint8_t* cc) {
+                     auto p = packetizePes(
+                         kPid, PesBuilder(0xE0).pts(1000).payload(ramp(900)).build(), cc);
+                     p.erase(p.begin() + 2);
+                     return p;
+                 },
+                 {{"continuity error! Discarding entire PES packet", 1}, {kDiscarded, 1}}},
+        DropCase{"OverlongAdaptationField",
+                 TSParser::KIND_VIDEO,
+                 1 << 16,
+                 [](uint8_t* cc) {
+                     auto p = packetizePes(
+                         kPid, PesBuilder(0xE0).pts(1000).payload(ramp(900)).build(), cc);
+                     p[2] = TsPacketBuilder()
+                                .pid(kPid)
+                                .continuity(2)
+                                .adaptationControl(3)
+                                .rawAfterHeader({200})
+                                .build();
+                     return p;
+                 },
+                 {{"parseHeader: Invalid adaptation field length: 200", 0}, {kDiscarded, 1}}},
+        DropCase{"NoStartCode",
+                 TSParser::KIND_AUDIO,
+                 1 << 16,
+                 [](uint8_t* cc) { return packetizePes(kPid, ramp(400, 1), cc); },
+                 {{"finishPES - PES parser error; discarding entire packet.", 1}}},
+        // Larger than the whole output ring: dropped, not waited for.
+        DropCase{"LargerThanTheOutput",
+                 TSParser::KIND_VIDEO,
+                 4096,
+                 [](uint8_t* cc) {
+                     return packetizePes(kPid, PesBuilder(0xE0).pts(1).payload(ramp(5000)).build(),
+                                         cc);
+                 },
+                 {{"TS parser error; discarding entire PES packet.", 0}}}),
+    [](const auto& info) { return std::string(info.param.name); });
 
 // Random bytes, lost sync and broken headers in the input never stop the thread;
 // once whole PES packets follow, they come out intact.
@@ -234,11 +218,11 @@ TEST_F(TSParserModuleTest, RandomInputThenCleanStream) {
         std::vector<uint8_t> junk(188 * 40);
         for (auto& b : junk)
             b = static_cast<uint8_t>(random());
-        // Every few packets, a real sync byte and unit start, so that the
+        // Every few packets a real sync byte and no transport error, so that the
         // adaptation and PES paths see random bytes too.
         for (size_t i = 0; i < junk.size(); i += 188 * 3) {
             junk[i] = 0x47;
-            junk[i + 1] &= 0x5F;  // no transport error
+            junk[i + 1] &= 0x5F;
         }
         ASSERT_TRUE(writeAll(*input, junk));
         ASSERT_TRUE(waitConsumed(*input));
@@ -246,7 +230,7 @@ TEST_F(TSParserModuleTest, RandomInputThenCleanStream) {
     std::vector<std::vector<uint8_t>> units;
     for (int i = 0; i < 4; ++i) {
         units.push_back(PesBuilder(0xE0).pts(1000 * i).payload(ramp(300 + i)).build());
-        feed(pes(units.back()));
+        feedPes(units.back());
     }
     auto records = drainRecords(*output);
     ASSERT_GE(records.size(), 2u);
@@ -273,15 +257,14 @@ TEST_F(TSParserModuleTest, PartialPacketIsConsumedWithTheBatch) {
 TEST_F(TSParserModuleTest, PcrParserFeedsTheLastPcrOncePerBatch) {
     startParser(TSParser::KIND_PCR, false);
     std::vector<TsPacket> batch;
-    for (uint8_t i = 0; i < 5; ++i) {
-        // 10 s apart: each would re-base the clock if it were fed on its own.
+    // 10 s apart: each would re-base the clock if it were fed on its own.
+    for (uint8_t i = 0; i < 5; ++i)
         batch.push_back(TsPacketBuilder()
                             .pid(0x100)
                             .continuity(i)
                             .unitStart()
                             .pcr(900000ull * (i + 1))
                             .build());
-    }
     feed(batch);
     EXPECT_EQ(trace.count("(Real PCR)"), 1u) << trace.all();
     EXPECT_EQ(trace.count("Setting PCR: 4500000 "), 1u) << trace.all();
@@ -298,9 +281,8 @@ TEST_F(TSParserModuleTest, AudioPtsIsNotifiedOnlyWithTheFlag) {
     parser->setNotifyFlag(true);
     ASSERT_EQ(parser->start(), 0u);
     const uint64_t before = RecPlayerBinder_GetAudioPTSNotificationCount();
-    feed(pes(PesBuilder(0xC0).pts(900000).payload(ramp(100)).build()));
-    feed(pes(PesBuilder(0xC0).pts(0x1FFFFFFFFull).payload(ramp(100)).build()));
-    feed(pes(PesBuilder(0xC0).pts(3).payload(ramp(100)).build()));
+    for (uint64_t pts : {900000ull, 0x1FFFFFFFFull, 3ull})
+        feedPes(PesBuilder(0xC0).pts(pts).payload(ramp(100)).build());
     EXPECT_EQ(RecPlayerBinder_GetAudioPTSNotificationCount(), before + 2);
     EXPECT_EQ(RecPlayerBinder_GetLastNotifiedAudioPTS(), 0x1FFFFFFFFull / 90);
     EXPECT_TRUE(clock->isValid(Synchronization::Audio));
@@ -309,8 +291,8 @@ TEST_F(TSParserModuleTest, AudioPtsIsNotifiedOnlyWithTheFlag) {
     ASSERT_EQ(parser->stop(), 0u);
     parser->setNotifyFlag(false);
     ASSERT_EQ(parser->start(), 0u);
-    feed(pes(PesBuilder(0xC0).pts(900).payload(ramp(100)).build()));
-    feed(pes(PesBuilder(0xC0).pts(1800).payload(ramp(100)).build()));
+    feedPes(PesBuilder(0xC0).pts(900).payload(ramp(100)).build());
+    feedPes(PesBuilder(0xC0).pts(1800).payload(ramp(100)).build());
     EXPECT_EQ(RecPlayerBinder_GetAudioPTSNotificationCount(), before + 2);
 }
 
@@ -324,8 +306,8 @@ TEST_F(TSParserModuleTest, CopiesReachEveryOutput) {
     parser->addOutput(third, nullptr);
     ASSERT_EQ(parser->start(), 0u);
     const auto unit = PesBuilder(0xE0).pts(77).dts(70).payload(ramp(999)).build();
-    feed(pes(unit));
-    feed(pes(PesBuilder(0xE0).pts(1).payload(ramp(3)).build()));
+    feedPes(unit);
+    feedPes(PesBuilder(0xE0).pts(1).payload(ramp(3)).build());
     for (auto* ring : {output.get(), second.get(), third.get()}) {
         auto r = readRecord(*ring);
         ASSERT_TRUE(r.has_value()) << ring->name();
@@ -340,18 +322,15 @@ TEST_F(TSParserModuleTest, CopyToOtherOutputsReportsAFullOne) {
     auto roomy = makeRing("roomy", 1 << 16);
     auto full = makeRing("full", 4096);
     std::vector<uint8_t> record(1001, 0x5A);
-    struct CopyCase {
+    const struct {
         const char* name;
         std::vector<android::sp<RingBuffer>> extra;
         bool expected;
-    };
-    const CopyCase cases[] = {
-        {"OnlyFirst", {}, true},
-        {"OneRoomy", {roomy}, true},
-        {"FullThenRoomy", {full, roomy}, false},
-    };
+    } cases[] = {{"OnlyFirst", {}, true},
+                 {"OneRoomy", {roomy}, true},
+                 {"FullThenRoomy", {full, roomy}, false}};
     ASSERT_TRUE(writeAll(*full, std::vector<uint8_t>(3500, 0)));
-    for (const CopyCase& c : cases) {
+    for (const auto& c : cases) {
         android::sp<TSParser> p = new TSParser(TSParser::KIND_VIDEO);
         p->addOutput(output, nullptr);
         for (const auto& ring : c.extra)
@@ -359,9 +338,7 @@ TEST_F(TSParserModuleTest, CopyToOtherOutputsReportsAFullOne) {
         const uint32_t roomyBefore = roomy->head();
         EXPECT_EQ(p->copyPEStoOtherOutputs(record.data(), 1001), c.expected) << c.name;
         EXPECT_EQ(output->head(), 0u) << "the first output is never copied to";
-        if (!c.extra.empty()) {
-            EXPECT_EQ(roomy->head(), roomyBefore + 1004) << c.name;
-        }
+        EXPECT_EQ(roomy->head(), roomyBefore + (c.extra.empty() ? 0 : 1004)) << c.name;
     }
     EXPECT_EQ(full->head(), 3500u);
 }
@@ -374,6 +351,9 @@ struct ScrambleCase {
     std::string packets;  // S scrambled, E transport error, C clear
     bool expectError;
 };
+void PrintTo(const ScrambleCase& c, std::ostream* os) {
+    *os << c.name;
+}
 
 class TSParserScramblingTest : public TSParserModuleTest,
                                public ::testing::WithParamInterface<ScrambleCase> {};
@@ -384,13 +364,13 @@ TEST_P(TSParserScramblingTest, TwelfthScrambledVideoPacketEndsTheThread) {
     std::vector<TsPacket> packets;
     uint8_t cc = 0;
     for (char k : c.packets) {
-        TsPacketBuilder b;
-        b.pid(kPid).continuity(cc++).payload(ramp(184));
-        if (k == 'S')
-            b.scrambling(2);
-        if (k == 'E')
-            b.transportError();
-        packets.push_back(b.build());
+        packets.push_back(TsPacketBuilder()
+                              .pid(kPid)
+                              .continuity(cc++)
+                              .scrambling(k == 'S' ? 2 : 0)
+                              .transportError(k == 'E')
+                              .payload(ramp(184))
+                              .build());
     }
     ASSERT_TRUE(writeAll(*input, concatPackets(packets)));
     if (c.expectError) {
@@ -398,15 +378,8 @@ TEST_P(TSParserScramblingTest, TwelfthScrambledVideoPacketEndsTheThread) {
         EXPECT_EQ(errors.codes(), std::vector<unsigned int>{ERROR_TSPARSER_SCRAMBLED});
         EXPECT_TRUE(trace.contains("threadLoop send error by scrambled ts pid = 0x111"))
             << trace.all();
-        // The thread has ended and released the output it held: a writer can lock it.
-        auto locked = std::async(std::launch::async, [&] {
-            const bool room = output->waitForSpace(4);
-            if (room)
-                output->abortWrite();
-            return room;
-        });
-        ASSERT_EQ(locked.wait_for(10s), std::future_status::ready);
-        EXPECT_TRUE(locked.get());
+        // The thread has ended and released the output it held.
+        EXPECT_TRUE(writerLockFree(*output));
     } else {
         ASSERT_TRUE(waitConsumed(*input));
         // Still running: another batch is taken.
@@ -432,7 +405,6 @@ INSTANTIATE_TEST_SUITE_P(
 class TSParserFullOutputTest : public TSParserModuleTest {
 protected:
     void SetUp() override {
-        TSParserModuleTest::SetUp();
         output = makeRing("VideoPES", 4096);
         startParser(TSParser::KIND_VIDEO);
         // Two records of 1540 bytes fit; the third cannot while they are unread.
@@ -467,31 +439,22 @@ TEST_F(TSParserFullOutputTest, WaitsForTheReaderThenGoesOn) {
 
 TEST_F(TSParserFullOutputTest, StopWakesTheBlockedThreadAndReleasesTheOutput) {
     auto stopped = std::async(std::launch::async, [&] { return parser->stop(); });
-    ASSERT_EQ(stopped.wait_for(10s), std::future_status::ready) << "stop did not return";
+    ASSERT_EQ(stopped.wait_for(kDeadline), std::future_status::ready) << "stop did not return";
     EXPECT_EQ(stopped.get(), 0u);
     // The record in assembly ends uncommitted; the two finished ones are intact.
     EXPECT_EQ(output->usedSpace(), 2u * 1540u);
-    auto lockable = std::async(std::launch::async, [&] {
-        const bool room = output->waitForSpace(4);
-        if (room)
-            output->abortWrite();
-        return room;
-    });
-    ASSERT_EQ(lockable.wait_for(10s), std::future_status::ready) << "writer lock still held";
-    EXPECT_TRUE(lockable.get());
+    EXPECT_TRUE(writerLockFree(*output));
     parser.clear();
 }
 
 // --- lifecycle -----------------------------------------------------------------------
 
-TEST_F(TSParserModuleTest, StartWithoutInputIsRefused) {
+TEST_F(TSParserModuleTest, StartIsRefusedWithoutInputOrRoomForARecord) {
     parser = new TSParser(TSParser::KIND_VIDEO);
     parser->addOutput(output, nullptr);
     EXPECT_EQ(parser->start(), ERROR_TSPARSER_NO_INPUT);
     EXPECT_TRUE(trace.contains("start - no input Ring Buffer set!")) << trace.all();
-}
 
-TEST_F(TSParserModuleTest, StartWithoutRoomForARecordIsRefused) {
     output = makeRing("VideoPES", 4096);
     ASSERT_TRUE(writeAll(*output, std::vector<uint8_t>(4096 - 36, 0)));
     create(TSParser::KIND_VIDEO);
@@ -501,14 +464,14 @@ TEST_F(TSParserModuleTest, StartWithoutRoomForARecordIsRefused) {
 
 TEST_F(TSParserModuleTest, RestartAfterStopStartsClean) {
     startParser(TSParser::KIND_VIDEO);
-    feed(pes(PesBuilder(0xE0).pts(1).payload(ramp(400)).build()));  // never finished
+    feedPes(PesBuilder(0xE0).pts(1).payload(ramp(400)).build());  // never finished
     ASSERT_EQ(parser->stop(), 0u);
     EXPECT_EQ(parser->stop(), 0u) << "a second stop is harmless";
     EXPECT_EQ(output->usedSpace(), 0u);
     ASSERT_EQ(parser->start(), 0u);
     const auto unit = PesBuilder(0xE0).pts(2).payload(ramp(250)).build();
-    feed(pes(unit));
-    feed(pes(PesBuilder(0xE0).pts(3).payload(ramp(2)).build()));
+    feedPes(unit);
+    feedPes(PesBuilder(0xE0).pts(3).payload(ramp(2)).build());
     const auto records = drainRecords(*output);
     ASSERT_EQ(records.size(), 1u);
     EXPECT_EQ(records[0].pes, unit);
@@ -516,21 +479,14 @@ TEST_F(TSParserModuleTest, RestartAfterStopStartsClean) {
 
 TEST_F(TSParserModuleTest, DumpPrintsTheAssemblyState) {
     startParser(TSParser::KIND_VIDEO);
-    feed(pes(PesBuilder(0xE0).pts(1).payload(ramp(300)).build()));  // 314 bytes in assembly
-    char* text = nullptr;
-    size_t length = 0;
-    FILE* f = open_memstream(&text, &length);
-    EXPECT_EQ(parser->dump(f, 1), 0u);
-    fclose(f);
-    const std::string dump(text, length);
-    free(text);
-    EXPECT_NE(dump.find("\t - Module Name: TS Parser\n"), std::string::npos) << dump;
-    EXPECT_NE(dump.find("\t\t - mpPESWriter: 0x"), std::string::npos) << dump;
-    EXPECT_NE(dump.find("\t\t - mpPESData: 0x"), std::string::npos) << dump;
-    EXPECT_NE(dump.find("\t\t - mPESSize: 314\n"), std::string::npos) << dump;
-    EXPECT_NE(dump.find("\t\t - mRBFreeSpace: " + std::to_string(65536 - 40 - 314) + "\n"),
-              std::string::npos)
-        << dump;
+    feedPes(PesBuilder(0xE0).pts(1).payload(ramp(300)).build());  // 314 bytes in assembly
+    const std::string dump = printed([&](FILE* f) { EXPECT_EQ(parser->dump(f, 1), 0u); });
+    for (const std::string& line :
+         {std::string("\t - Module Name: TS Parser\n"), std::string("\t\t - mpPESWriter: 0x"),
+          std::string("\t\t - mpPESData: 0x"), std::string("\t\t - mPESSize: 314\n"),
+          "\t\t - mRBFreeSpace: " + std::to_string(65536 - 40 - 314) + "\n"}) {
+        EXPECT_NE(dump.find(line), std::string::npos) << line << "\n" << dump;
+    }
     EXPECT_EQ(parser->dump(nullptr, 0), 0u);
 }
 

@@ -1,7 +1,6 @@
 #include <arpa/inet.h>
 #include <netinet/in.h>
 #include <sys/socket.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include <gtest/gtest.h>
@@ -17,22 +16,14 @@
 
 #include "platform/dtv/Demux.h"
 #include "platform/dtv/DemuxBinder.h"
-#include "platform/dtv/DemuxTestUtil.h"
 #include "support/TraceCapture.h"
+#include "support/TsTestUtil.h"
 
 namespace TavoPlayer {
 namespace {
 
 using namespace std::chrono_literals;
-using test::buildStream;
-using test::ScopedDemuxSource;
-using test::StreamPlan;
-using test::summary;
-using test::TempFile;
-using test::TraceCapture;
-using test::TsPacket;
-
-constexpr auto kDeadline = 20s;
+using namespace test;
 
 // Reads a filter until `packets` have arrived or the deadline passes.
 std::vector<TsPacket> readPackets(int handle, size_t packets,
@@ -48,13 +39,14 @@ std::vector<TsPacket> readPackets(int handle, size_t packets,
             continue;
         const int n = DemuxBinder_ReadData(handle, buffer.data(), static_cast<int>(buffer.size()));
         EXPECT_EQ(n % 188, 0);
-        for (int at = 0; at < n; at += 188) {
-            TsPacket p;
-            std::copy_n(buffer.begin() + at, 188, p.begin());
-            got.push_back(p);
-        }
+        const auto more = toPackets(std::vector<uint8_t>(buffer.begin(), buffer.begin() + n));
+        got.insert(got.end(), more.begin(), more.end());
     }
     return got;
+}
+
+bool sourceEnded() {
+    return waitUntil([] { return Demux::instance().sourceStats().ended; });
 }
 
 // Every test leaves the demux with no filter, so the next one opens its own source.
@@ -67,6 +59,7 @@ protected:
     }
     int start(uint16_t pid, int kind = kDemuxFilterPes) {
         const int handle = DemuxBinder_StartFiltering(pid, kind);
+        EXPECT_GE(handle, 0) << "PID " << pid;
         if (handle >= 0)
             handles.push_back(handle);
         return handle;
@@ -92,31 +85,20 @@ TEST(DemuxHandleSetTest, IsAValueOf132BytesWithOneBitPerHandle) {
     DemuxBinder_HandleSET(-1, &set);  // a failed filter's handle changes nothing
     DemuxBinder_HandleSET(1056, &set);
     EXPECT_EQ(std::memcmp(&copy, &set, sizeof set), 0);
-    EXPECT_FALSE(DemuxBinder_HandleISSET(-1, &set));
-    EXPECT_FALSE(DemuxBinder_HandleISSET(1, &set));
-    EXPECT_FALSE(DemuxBinder_HandleISSET(1056, &set));
+    for (int h : {-1, 1, 1056})
+        EXPECT_FALSE(DemuxBinder_HandleISSET(h, &set)) << h;
 }
 
 TEST_F(DemuxTest, FiltersGetEveryPacketOfTheirPidInOrderAndNoOther) {
-    StreamPlan plan;
-    plan.pids = {0x0, 0x100, 0x101, 0x130, 0x1FFF};
-    plan.rounds = 500;
-    plan.pcrPid = 0x100;
-    const std::vector<uint8_t> stream = buildStream(plan);
-    TempFile file(stream);
-    ScopedDemuxSource source("file:" + file.path() + "?pace=none");
-    auto expected = test::packetsByPid(stream);
-
+    const auto stream =
+        buildStream({.pids = {0x0, 0x100, 0x101, 0x130, 0x1FFF}, .rounds = 500, .pcrPid = 0x100});
+    FileSource source(stream);
+    auto expected = packetsByPid(stream);
     const int video = start(0x100, kDemuxFilterVideo);
     const int audio = start(0x101);
     const int captions = start(0x130);
     const int videoAgain = start(0x100, kDemuxFilterPcr);  // two filters on one PID
-    ASSERT_GE(video, 0);
-    ASSERT_GE(audio, 0);
-    ASSERT_GE(captions, 0);
-    ASSERT_GE(videoAgain, 0);
     EXPECT_EQ(std::set<int>({video, audio, captions, videoAgain}).size(), 4u);
-
     EXPECT_EQ(summary(readPackets(video, 500)), summary(expected[0x100]));
     EXPECT_EQ(summary(readPackets(audio, 500)), summary(expected[0x101]));
     EXPECT_EQ(summary(readPackets(captions, 500)), summary(expected[0x130]));
@@ -126,29 +108,19 @@ TEST_F(DemuxTest, FiltersGetEveryPacketOfTheirPidInOrderAndNoOther) {
 }
 
 TEST_F(DemuxTest, SelectReportsOnlyReadyHandlesAndTimesOutWithZero) {
-    StreamPlan plan;
-    plan.pids = {0x100};
-    plan.rounds = 3;
-    TempFile file(buildStream(plan));
-    ScopedDemuxSource source("file:" + file.path() + "?pace=none");
+    FileSource source(buildStream({.pids = {0x100}, .rounds = 3}));
     const int busy = start(0x100);
     const int idle = start(0x200);
-    ASSERT_GE(busy, 0);
-    ASSERT_GE(idle, 0);
-
     DemuxHandleSet set;
     DemuxBinder_HandleZERO(&set);
     DemuxBinder_HandleSET(busy, &set);
     DemuxBinder_HandleSET(idle, &set);
     DemuxBinder_HandleSET(1000, &set);  // not open: never ready
     // Packets flow from the first select on; wait until the whole file is in.
-    ASSERT_TRUE(test::waitUntil(
-        [&] {
-            DemuxHandleSet probe = set;
-            return DemuxBinder_Select(&probe, 30) > 0 &&
-                   Demux::instance().sourceStats().packets == 3;
-        },
-        kDeadline));
+    ASSERT_TRUE(waitUntil([&] {
+        DemuxHandleSet probe = set;
+        return DemuxBinder_Select(&probe, 30) > 0 && Demux::instance().sourceStats().packets == 3;
+    }));
     EXPECT_EQ(DemuxBinder_Select(&set, 30), 1);
     EXPECT_TRUE(DemuxBinder_HandleISSET(busy, &set));
     EXPECT_FALSE(DemuxBinder_HandleISSET(idle, &set));
@@ -169,73 +141,53 @@ TEST_F(DemuxTest, SelectReportsOnlyReadyHandlesAndTimesOutWithZero) {
     EXPECT_FALSE(DemuxBinder_HandleISSET(busy, &set));
 }
 
-TEST_F(DemuxTest, SelectWakesWhenDataArrives) {
-    test::StdinPipe pipe;
+TEST_F(DemuxTest, StdinSourceWakesSelectWhenDataArrivesAndEndsAtEndOfFile) {
+    StdinPipe pipe;
     ScopedDemuxSource source("stdin");
     const int handle = start(0x100);
-    ASSERT_GE(handle, 0);
-    StreamPlan plan;
-    plan.pids = {0x100};
-    plan.rounds = 10;
+    const auto stream = buildStream({.pids = {0x100, 0x101}, .rounds = 40});
     std::thread writer([&] {
         std::this_thread::sleep_for(100ms);
-        pipe.write(buildStream(plan));
+        pipe.write(std::vector<uint8_t>(stream.begin(), stream.begin() + 188 * 20));
     });
     DemuxHandleSet set;
     DemuxBinder_HandleZERO(&set);
     DemuxBinder_HandleSET(handle, &set);
-    // The time-out is far longer than the test; only the data can end this wait.
+    // The time-out is far longer than the deadline; only the data can end this wait.
     const auto before = std::chrono::steady_clock::now();
     EXPECT_EQ(DemuxBinder_Select(&set, 60'000), 1);
-    EXPECT_LT(std::chrono::steady_clock::now() - before, 30s);
+    EXPECT_LT(std::chrono::steady_clock::now() - before, kDeadline);
     writer.join();
     // The last packet waits for the sync byte of the next one (or the end of the
-    // stream), so that a packet cut short is never delivered.
-    EXPECT_EQ(readPackets(handle, 9).size(), 9u);
-}
-
-TEST_F(DemuxTest, StdinSourceEndsAtEndOfFile) {
-    test::StdinPipe pipe;
-    ScopedDemuxSource source("stdin");
-    const int handle = start(0x100);
-    ASSERT_GE(handle, 0);
-    StreamPlan plan;
-    plan.pids = {0x100, 0x101};
-    plan.rounds = 40;
-    const std::vector<uint8_t> stream = buildStream(plan);
-    pipe.write(stream);
+    // stream), so that a packet cut short is never delivered: 10 of 0x100 are whole.
+    EXPECT_EQ(readPackets(handle, 10).size(), 10u);
+    pipe.write(std::vector<uint8_t>(stream.begin() + 188 * 20, stream.end()));
     pipe.closeWriter();
-    EXPECT_EQ(readPackets(handle, 40), test::packetsByPid(stream)[0x100]);
-    EXPECT_TRUE(test::waitUntil([] { return Demux::instance().sourceStats().ended; }, kDeadline));
+    const auto expected = packetsByPid(stream)[0x100];
+    EXPECT_EQ(readPackets(handle, 30),
+              std::vector<TsPacket>(expected.begin() + 10, expected.end()));
+    EXPECT_TRUE(sourceEnded());
 }
 
 TEST_F(DemuxTest, SlowFilterDropsItsOldestPacketsWithoutHoldingBackTheOthers) {
     // One second at its PCR pace (a PCR every 10 ms): a reader keeps up easily.
-    StreamPlan plan;
-    plan.pids = {0x100, 0x101};
-    plan.rounds = 100;
-    plan.pcrPid = 0x101;
-    plan.pcrIntervalMs = 10;
-    const std::vector<uint8_t> stream = buildStream(plan);
-    TempFile file(stream);
-    ScopedDemuxSource source("file:" + file.path() + "?queue=16");
+    const auto stream =
+        buildStream({.pids = {0x100, 0x101}, .rounds = 100, .pcrPid = 0x101, .pcrIntervalMs = 10});
+    FileSource source(stream, "?queue=16");
     TraceCapture trace;
     const int slow = start(0x100);
     const int fast = start(0x101);
-    ASSERT_GE(slow, 0);
-    ASSERT_GE(fast, 0);
-    auto expected = test::packetsByPid(stream);
+    auto expected = packetsByPid(stream);
     // The fast one reads as it goes; it gets everything in order.
     EXPECT_EQ(summary(readPackets(fast, 100)), summary(expected[0x101]));
-    ASSERT_TRUE(test::waitUntil([] { return Demux::instance().sourceStats().ended; }, kDeadline));
+    ASSERT_TRUE(sourceEnded());
     Demux::FilterStats stats;
     ASSERT_TRUE(Demux::instance().filterStats(slow, &stats));
     EXPECT_EQ(stats.received, 100u);
     EXPECT_EQ(stats.dropped, 84u);
     EXPECT_EQ(stats.queued, 16u);
     // What is left is the newest sixteen, in order.
-    const std::vector<TsPacket> left = readPackets(slow, 16);
-    EXPECT_EQ(summary(left),
+    EXPECT_EQ(summary(readPackets(slow, 16)),
               summary(std::vector<TsPacket>(expected[0x100].end() - 16, expected[0x100].end())));
     EXPECT_TRUE(trace.contains("PID 256 is not read fast enough"));
     stop(slow);
@@ -244,99 +196,66 @@ TEST_F(DemuxTest, SlowFilterDropsItsOldestPacketsWithoutHoldingBackTheOthers) {
 }
 
 TEST_F(DemuxTest, UnpacedFileWaitsForASlowReaderInsteadOfDropping) {
-    StreamPlan plan;
-    plan.pids = {0x100};
-    plan.rounds = 200;
-    const std::vector<uint8_t> stream = buildStream(plan);
-    TempFile file(stream);
-    ScopedDemuxSource source("file:" + file.path() + "?pace=none&queue=16");
+    const auto stream = buildStream({.pids = {0x100}, .rounds = 200});
+    FileSource source(stream, "?pace=none&queue=16");
     const int handle = start(0x100);
-    ASSERT_GE(handle, 0);
     std::vector<TsPacket> got;
-    std::vector<uint8_t> buffer(188 * 3);
     while (got.size() < 200) {
         std::this_thread::sleep_for(1ms);  // a reader much slower than the file
         const auto more = readPackets(handle, 1);
         ASSERT_FALSE(more.empty());
         got.insert(got.end(), more.begin(), more.end());
     }
-    EXPECT_EQ(summary(got), summary(test::toPackets(stream)));
+    EXPECT_EQ(summary(got), summary(toPackets(stream)));
     Demux::FilterStats stats;
     ASSERT_TRUE(Demux::instance().filterStats(handle, &stats));
     EXPECT_EQ(stats.dropped, 0u);
 }
 
 TEST_F(DemuxTest, LoopingFileStartsAgainAtTheEnd) {
-    StreamPlan plan;
-    plan.pids = {0x100};
-    plan.rounds = 10;
-    const std::vector<uint8_t> stream = buildStream(plan);
-    TempFile file(stream);
-    ScopedDemuxSource source("file:" + file.path() + "?pace=none&loop=1");
-    const int handle = start(0x100);
-    ASSERT_GE(handle, 0);
-    const std::vector<TsPacket> got = readPackets(handle, 35);
+    const auto stream = buildStream({.pids = {0x100}, .rounds = 10});
+    FileSource source(stream, "?pace=none&loop=1");
+    const std::vector<TsPacket> got = readPackets(start(0x100), 35);
     ASSERT_GE(got.size(), 35u);
-    const std::vector<TsPacket> once = test::toPackets(stream);
-    for (size_t i = 0; i < got.size(); ++i) {
+    const std::vector<TsPacket> once = toPackets(stream);
+    for (size_t i = 0; i < got.size(); ++i)
         EXPECT_EQ(summary({got[i]}), summary({once[i % 10]})) << i;
-    }
 }
 
 TEST_F(DemuxTest, ANewSourceIsReadAfterTheLastFilterStops) {
-    StreamPlan first;
-    first.pids = {0x100};
-    first.rounds = 5;
-    StreamPlan second = first;
-    second.firstSequence = 1000;
-    const std::vector<uint8_t> a = buildStream(first);
-    const std::vector<uint8_t> b = buildStream(second);
-    TempFile fileA(a);
+    const auto a = buildStream({.pids = {0x100}, .rounds = 5});
+    const auto b = buildStream({.pids = {0x100}, .rounds = 5, .firstSequence = 1000});
     TempFile fileB(b);
-    ScopedDemuxSource source("file:" + fileA.path() + "?pace=none");
+    FileSource source(a);
     int handle = start(0x100);
-    ASSERT_GE(handle, 0);
-    EXPECT_EQ(summary(readPackets(handle, 5)), summary(test::toPackets(a)));
+    EXPECT_EQ(summary(readPackets(handle, 5)), summary(toPackets(a)));
     stop(handle);
     EXPECT_FALSE(Demux::instance().sourceStats().open);
-    source.set("file:" + fileB.path() + "?pace=none");
-    handle = start(0x100);
-    ASSERT_GE(handle, 0);
-    EXPECT_EQ(summary(readPackets(handle, 5)), summary(test::toPackets(b)));
+    source.source.set("file:" + fileB.path() + "?pace=none");
+    EXPECT_EQ(summary(readPackets(start(0x100), 5)), summary(toPackets(b)));
 }
 
-// --- pacing ---------------------------------------------------------------------
+// --- pacing: the behaviour under test is the release time itself -----------------
 
-double secondsToRead(const std::string& source, const std::vector<uint8_t>& stream,
+double secondsToRead(const std::string& options, const std::vector<uint8_t>& stream,
                      size_t packets) {
-    ScopedDemuxSource scoped(source);
+    FileSource source(stream, options);
     const int handle = DemuxBinder_StartFiltering(0x101, kDemuxFilterPes);
     EXPECT_GE(handle, 0);
     const auto before = std::chrono::steady_clock::now();
-    const size_t got = readPackets(handle, packets, 30s).size();
-    const double seconds =
-        std::chrono::duration<double>(std::chrono::steady_clock::now() - before).count();
-    EXPECT_EQ(got, packets);
+    EXPECT_EQ(readPackets(handle, packets, 30s).size(), packets);
     DemuxBinder_StopFiltering(handle);
-    (void)stream;
-    return seconds;
+    return std::chrono::duration<double>(std::chrono::steady_clock::now() - before).count();
 }
 
 TEST_F(DemuxTest, FileIsReleasedAtThePaceOfItsPcr) {
     // Three seconds of stream: a PCR every 40 ms on 0x100, 20 packets of 0x101
-    // between two PCRs (about 0.75 Mbit/s).
-    StreamPlan plan;
-    plan.pids = {0x100};
-    for (int i = 0; i < 20; ++i)
-        plan.pids.push_back(0x101);
-    plan.pcrPid = 0x100;
-    plan.pcrIntervalMs = 40;
-    plan.rounds = 76;  // 75 intervals: 3.0 s from the first PCR to the last
-    const std::vector<uint8_t> stream = buildStream(plan);
-    TempFile file(stream);
-    const size_t packets = 76 * 20;
-    const double paced = secondsToRead("file:" + file.path(), stream, packets);
-    const double unpaced = secondsToRead("file:" + file.path() + "?pace=none", stream, packets);
+    // between two PCRs (about 0.75 Mbit/s); 75 intervals from first PCR to last.
+    StreamPlan plan{.pids = std::vector<uint16_t>(21, 0x101), .rounds = 76, .pcrPid = 0x100};
+    plan.pids[0] = 0x100;
+    const auto stream = buildStream(plan);
+    const double paced = secondsToRead("", stream, 76 * 20);
+    const double unpaced = secondsToRead("?pace=none", stream, 76 * 20);
     EXPECT_GT(paced, 2.0);
     EXPECT_LT(paced, 6.0);
     EXPECT_LT(unpaced, paced / 4);
@@ -345,14 +264,9 @@ TEST_F(DemuxTest, FileIsReleasedAtThePaceOfItsPcr) {
 TEST_F(DemuxTest, PacedLoopCarriesOnAcrossTheRestart) {
     // One second of stream played twice must take about two seconds: the PCR going
     // back at the restart neither stalls the second pass nor sends it in a burst.
-    StreamPlan plan;
-    plan.pids = {0x100, 0x101, 0x101, 0x101};
-    plan.pcrPid = 0x100;
-    plan.pcrIntervalMs = 40;
-    plan.rounds = 26;
-    const std::vector<uint8_t> stream = buildStream(plan);
-    TempFile file(stream);
-    const double seconds = secondsToRead("file:" + file.path() + "?loop=1", stream, 26 * 3 * 2);
+    const auto stream =
+        buildStream({.pids = {0x100, 0x101, 0x101, 0x101}, .rounds = 26, .pcrPid = 0x100});
+    const double seconds = secondsToRead("?loop=1", stream, 26 * 3 * 2);
     EXPECT_GT(seconds, 1.4);
     EXPECT_LT(seconds, 5.0);
 }
@@ -360,75 +274,54 @@ TEST_F(DemuxTest, PacedLoopCarriesOnAcrossTheRestart) {
 // --- bad input ------------------------------------------------------------------
 
 TEST_F(DemuxTest, SourceThatCannotBeOpenedGivesANegativeHandleAndSaysWhy) {
-    const struct {
-        const char* source;
-        const char* message;
-    } cases[] = {
-        {"file:/nonexistent/tavo.ts", "cannot open TS file /nonexistent/tavo.ts"},
-        {"dvb:99", "cannot open DVB demux /nonexistent/dvb/adapter99/demux0"},
-        {"dvb:0.7?queue=64", "demux7"},
-        {"udp://300.1.1.1:1234", "cannot resolve UDP address 300.1.1.1"},
-        {"tcp://host:1", "unknown source"},
-        {"", "no demux source"},
-    };
-    setenv("TAVOPLAYER_DVB_ROOT", "/nonexistent/dvb", 1);
-    for (const auto& c : cases) {
-        TraceCapture trace;
-        ScopedDemuxSource source(c.source);
-        EXPECT_LT(DemuxBinder_StartFiltering(0x100, kDemuxFilterPes), 0) << c.source;
-        EXPECT_TRUE(trace.contains(c.message)) << c.source << "\n" << trace.all();
-        EXPECT_FALSE(Demux::instance().sourceStats().open) << c.source;
-    }
-    unsetenv("TAVOPLAYER_DVB_ROOT");
-    EXPECT_LT(DemuxBinder_StartFiltering(0x2000, kDemuxFilterPes), 0);
-    EXPECT_LT(DemuxBinder_StopFiltering(17), 0);
-}
-
-TEST_F(DemuxTest, DvbDeviceThatIsNoDemuxRefusesTheFilter) {
-    // A regular file where the demux device should be: it opens, but it does not
-    // take the filter ioctl, and the demux says so and hands out no handle.
+    // A regular file where a DVB demux device should be: it opens, but it does not
+    // take the filter ioctl.
     const std::filesystem::path root =
         std::filesystem::temp_directory_path() / ("tavo_dvb_" + std::to_string(getpid()));
     std::filesystem::create_directories(root / "adapter3");
     std::ofstream(root / "adapter3" / "demux1") << "not a device";
+    const struct {
+        const char* source;
+        std::string message;
+    } cases[] = {
+        {"file:/nonexistent/tavo.ts", "cannot open TS file /nonexistent/tavo.ts"},
+        {"dvb:99", "cannot open DVB demux " + root.string() + "/adapter99/demux0"},
+        {"dvb:0.7?queue=64", "demux7"},
+        {"dvb:3.1", "DMX_SET_PES_FILTER for PID 273"},
+        {"udp://300.1.1.1:1234", "cannot resolve UDP address 300.1.1.1"},
+        {"tcp://host:1", "unknown source"},
+        {"", "no demux source"},
+    };
     setenv("TAVOPLAYER_DVB_ROOT", root.c_str(), 1);
-    TraceCapture trace;
-    {
-        ScopedDemuxSource source("dvb:3.1");
-        EXPECT_LT(DemuxBinder_StartFiltering(0x111, kDemuxFilterVideo), 0);
+    for (const auto& c : cases) {
+        TraceCapture trace;
+        ScopedDemuxSource source(c.source);
+        EXPECT_LT(DemuxBinder_StartFiltering(0x111, kDemuxFilterVideo), 0) << c.source;
+        EXPECT_TRUE(trace.contains(c.message)) << c.source << "\n" << trace.all();
+        EXPECT_FALSE(Demux::instance().sourceStats().open) << c.source;
     }
     unsetenv("TAVOPLAYER_DVB_ROOT");
     std::filesystem::remove_all(root);
-    EXPECT_TRUE(trace.contains("DMX_SET_PES_FILTER for PID 273")) << trace.all();
-    EXPECT_FALSE(Demux::instance().sourceStats().open);
+    EXPECT_LT(DemuxBinder_StartFiltering(0x2000, kDemuxFilterPes), 0);
+    EXPECT_LT(DemuxBinder_StopFiltering(17), 0);
 }
 
 TEST_F(DemuxTest, GarbageBetweenPacketsIsSkippedAndTheRestDelivered) {
-    StreamPlan plan;
-    plan.pids = {0x100, 0x101};
-    plan.rounds = 50;
-    const std::vector<uint8_t> clean = buildStream(plan);
+    const auto clean = buildStream({.pids = {0x100, 0x101}, .rounds = 50});
     std::vector<uint8_t> dirty;
     std::mt19937 random(3);
     for (size_t i = 0; i < clean.size(); i += 188) {
         dirty.insert(dirty.end(), clean.begin() + i, clean.begin() + i + 188);
-        if (i / 188 % 10 == 9) {
-            for (int k = 0; k < 77; ++k)
-                dirty.push_back(static_cast<uint8_t>(random()));
-        }
+        for (int k = 0; i / 188 % 10 == 9 && k < 77; ++k)
+            dirty.push_back(static_cast<uint8_t>(random()));
     }
     dirty.resize(dirty.size() - 100);  // and a truncated last packet
-    TempFile file(dirty);
     TraceCapture trace;
-    ScopedDemuxSource source("file:" + file.path() + "?pace=none");
-    const int handle = start(0x100);
-    ASSERT_GE(handle, 0);
-    auto expected = test::packetsByPid(clean)[0x100];
-    const std::vector<TsPacket> got = readPackets(handle, 50, 3s);
+    FileSource source(dirty);
     // Only the truncated last packet (of 0x101, cut to 165 bytes with the garbage
     // after it) is lost; 0x100 comes through whole.
-    EXPECT_EQ(summary(got), summary(expected));
-    ASSERT_TRUE(test::waitUntil([] { return Demux::instance().sourceStats().ended; }, kDeadline));
+    EXPECT_EQ(summary(readPackets(start(0x100), 50, 3s)), summary(packetsByPid(clean)[0x100]));
+    ASSERT_TRUE(sourceEnded());
     EXPECT_GT(Demux::instance().sourceStats().bytesSkipped, 0u);
     EXPECT_TRUE(trace.contains("TS sync lost on file")) << trace.all();
     EXPECT_TRUE(trace.contains("ends with 165 bytes that are no whole TS packet")) << trace.all();
@@ -438,18 +331,14 @@ TEST_F(DemuxTest, GarbageBetweenPacketsIsSkippedAndTheRestDelivered) {
 
 class UdpSender {
 public:
-    // To `group` (127.0.0.1 by default) on `port`; a multicast group is sent to
-    // through the loopback interface.
+    // To `group` on `port`; a multicast group is sent to through the loopback interface.
     explicit UdpSender(int port, const char* group = "127.0.0.1")
         : mFd(socket(AF_INET, SOCK_DGRAM, 0)) {
         mTo.sin_family = AF_INET;
         mTo.sin_port = htons(static_cast<uint16_t>(port));
         inet_pton(AF_INET, group, &mTo.sin_addr);
-        in_addr loopback{};
-        loopback.s_addr = htonl(INADDR_LOOPBACK);
+        in_addr loopback{htonl(INADDR_LOOPBACK)};
         setsockopt(mFd, IPPROTO_IP, IP_MULTICAST_IF, &loopback, sizeof loopback);
-        const unsigned char loop = 1;
-        setsockopt(mFd, IPPROTO_IP, IP_MULTICAST_LOOP, &loop, sizeof loop);
     }
     ~UdpSender() { close(mFd); }
     void send(const uint8_t* data, size_t size) {
@@ -463,17 +352,12 @@ private:
 };
 
 TEST_F(DemuxTest, UdpDatagramsOfOneToSevenPacketsArriveIntact) {
-    const int port = test::freeUdpPort();
+    const int port = freeUdpPort();
     ScopedDemuxSource source("udp://127.0.0.1:" + std::to_string(port));
     TraceCapture trace;
     const int handle = start(0x100);
     const int other = start(0x101);
-    ASSERT_GE(handle, 0);
-    ASSERT_GE(other, 0);
-    StreamPlan plan;
-    plan.pids = {0x100, 0x101};
-    plan.rounds = 140;
-    const std::vector<uint8_t> stream = buildStream(plan);
+    const auto stream = buildStream({.pids = {0x100, 0x101}, .rounds = 140});
     UdpSender sender(port);
     size_t at = 0;
     for (size_t n = 1; at < stream.size(); n = n % 7 + 1) {
@@ -487,10 +371,7 @@ TEST_F(DemuxTest, UdpDatagramsOfOneToSevenPacketsArriveIntact) {
     }
     // Then a datagram that is not whole packets: its whole packets are kept, the
     // rest dropped and reported, and the next datagram is aligned as ever.
-    StreamPlan more = plan;
-    more.firstSequence = 140;
-    more.rounds = 4;
-    const std::vector<uint8_t> next = buildStream(more);  // 8 packets
+    const auto next = buildStream({.pids = {0x100, 0x101}, .rounds = 4, .firstSequence = 140});
     std::vector<uint8_t> bad(next.begin(), next.begin() + 4 * 188);
     bad.resize(bad.size() + 60, 0x47);
     sender.send(bad.data(), bad.size());
@@ -498,7 +379,7 @@ TEST_F(DemuxTest, UdpDatagramsOfOneToSevenPacketsArriveIntact) {
 
     std::vector<uint8_t> all = stream;
     all.insert(all.end(), next.begin(), next.end());
-    auto expected = test::packetsByPid(all);
+    auto expected = packetsByPid(all);
     EXPECT_EQ(summary(readPackets(handle, 144)), summary(expected[0x100]));
     // The very last packet waits for a sync byte after it that never comes.
     expected[0x101].pop_back();
@@ -508,19 +389,17 @@ TEST_F(DemuxTest, UdpDatagramsOfOneToSevenPacketsArriveIntact) {
 }
 
 TEST_F(DemuxTest, UdpMulticastGroupIsJoinedOnTheGivenInterface) {
-    const int port = test::freeUdpPort();
+    const int port = freeUdpPort();
     ScopedDemuxSource source("udp://239.255.42.42:" + std::to_string(port) + "?iface=127.0.0.1");
-    const int handle = start(0x100);
+    const int handle = DemuxBinder_StartFiltering(0x100, kDemuxFilterPes);
     if (handle < 0)
         GTEST_SKIP() << "this host cannot join a multicast group on loopback";
-    StreamPlan plan;
-    plan.pids = {0x100};
-    plan.rounds = 21;
-    const std::vector<uint8_t> stream = buildStream(plan);
+    handles.push_back(handle);
+    const auto stream = buildStream({.pids = {0x100}, .rounds = 21});
     UdpSender sender(port, "239.255.42.42");
     for (size_t at = 0; at < stream.size(); at += 7 * 188)
         sender.send(stream.data() + at, 7 * 188);
-    auto expected = test::toPackets(stream);
+    auto expected = toPackets(stream);
     expected.pop_back();  // waits for a sync byte after it
     EXPECT_EQ(summary(readPackets(handle, 20)), summary(expected));
 }

@@ -4,7 +4,7 @@
 
 #include <random>
 
-#include "platform/dtv/DemuxTestUtil.h"
+#include "support/TsTestUtil.h"
 
 namespace TavoPlayer {
 namespace {

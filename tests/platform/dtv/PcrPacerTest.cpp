@@ -2,7 +2,7 @@
 
 #include <gtest/gtest.h>
 
-#include "platform/dtv/DemuxTestUtil.h"
+#include "support/TsTestUtil.h"
 #include "support/TsPacketBuilder.h"
 
 namespace TavoPlayer {

@@ -1,4 +1,4 @@
-#include "platform/dtv/DemuxTestUtil.h"
+#include "support/TsTestUtil.h"
 
 #include <arpa/inet.h>
 #include <fcntl.h>
@@ -6,31 +6,155 @@
 #include <sys/socket.h>
 #include <unistd.h>
 
-#include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <filesystem>
 #include <fstream>
+#include <future>
+#include <iterator>
 #include <stdexcept>
 
 namespace TavoPlayer::test {
-
 namespace {
+
 constexpr const char* kSourceEnv = "TAVOPLAYER_PROP_tavoplayer_demux_source";
 
 size_t payloadOffset(const uint8_t* packet) {
     const uint8_t control = (packet[3] >> 4) & 3;
     if (control == 1)
         return 4;
-    if (control == 3)
-        return 5u + packet[4];
-    return 188;
+    return control == 3 ? 5u + packet[4] : 188;
 }
+
+void writeFd(int fd, const std::vector<uint8_t>& bytes) {
+    for (size_t done = 0; done < bytes.size();) {
+        const ssize_t n = ::write(fd, bytes.data() + done, bytes.size() - done);
+        if (n <= 0)
+            throw std::runtime_error("write failed");
+        done += static_cast<size_t>(n);
+    }
+}
+
 }  // namespace
+
+android::sp<RingBuffer> makeRing(const std::string& name, uint32_t sizeBytes) {
+    android::sp<RingBuffer> ring = new RingBuffer();
+    if (ring->configureWithSize(name, sizeBytes) != 0)
+        throw std::runtime_error("ring configure failed");
+    return ring;
+}
+
+bool waitUntil(const std::function<bool()>& condition, std::chrono::milliseconds deadline) {
+    const auto end = std::chrono::steady_clock::now() + deadline;
+    while (!condition()) {
+        if (std::chrono::steady_clock::now() >= end)
+            return false;
+        std::this_thread::sleep_for(std::chrono::milliseconds(2));
+    }
+    return true;
+}
+
+bool writeAll(RingBuffer& ring, const std::vector<uint8_t>& bytes) {
+    const auto size = static_cast<uint32_t>(bytes.size());
+    if (!waitUntil([&] { return ring.waitForSpace(RingBuffer::roundUp4(size)); }))
+        return false;
+    memcpy(ring.writePointer(), bytes.data(), bytes.size());
+    ring.commitWrite(size);
+    return true;
+}
+
+bool waitConsumed(RingBuffer& ring) {
+    return waitUntil([&] { return ring.usedSpace() == 0; });
+}
+
+bool writerLockFree(RingBuffer& ring) {
+    auto locked = std::async(std::launch::async, [&] {
+        const bool room = ring.waitForSpace(4);
+        if (room)
+            ring.abortWrite();
+        return room;
+    });
+    return locked.wait_for(kDeadline) == std::future_status::ready && locked.get();
+}
+
+std::optional<PesRecord> readRecord(RingBuffer& ring, std::chrono::milliseconds deadline) {
+    if (!waitUntil([&] { return ring.waitForData(40); }, deadline))
+        return std::nullopt;
+    const uint8_t* at = ring.readPointer();
+    PesRecord r{};
+    memcpy(&r.type, at + 8, 4);
+    memcpy(&r.size, at + 12, 4);
+    memcpy(&r.pts, at + 16, 8);
+    memcpy(&r.dts, at + 24, 8);
+    memcpy(&r.offsetES, at + 32, 4);
+    memcpy(&r.sizeES, at + 36, 4);
+    if (r.size < 40 || r.size > ring.usedSpace()) {
+        ring.abortRead();
+        return std::nullopt;
+    }
+    r.pes.assign(at + 40, at + r.size);
+    ring.consume(r.size);
+    return r;
+}
+
+std::vector<PesRecord> drainRecords(RingBuffer& ring) {
+    std::vector<PesRecord> records;
+    while (ring.usedSpace() >= 40) {
+        auto r = readRecord(ring, std::chrono::milliseconds(0));
+        if (!r)
+            break;
+        records.push_back(std::move(*r));
+    }
+    return records;
+}
+
+void RecordingErrorListener::onError(unsigned int code, const Module*) const {
+    std::lock_guard<std::mutex> lock(mMutex);
+    mCodes.push_back(code);
+    mCondition.notify_all();
+}
+
+bool RecordingErrorListener::waitForError(std::chrono::milliseconds deadline) const {
+    std::unique_lock<std::mutex> lock(mMutex);
+    return mCondition.wait_for(lock, deadline, [this] { return !mCodes.empty(); });
+}
+
+std::vector<unsigned int> RecordingErrorListener::codes() const {
+    std::lock_guard<std::mutex> lock(mMutex);
+    return mCodes;
+}
+
+std::string runCommand(const std::string& command, bool* ok) {
+    std::string out;
+    FILE* pipe = popen(command.c_str(), "r");
+    *ok = pipe != nullptr;
+    if (pipe == nullptr)
+        return out;
+    char buffer[65536];
+    for (size_t n; (n = fread(buffer, 1, sizeof buffer, pipe)) > 0;)
+        out.append(buffer, n);
+    *ok = pclose(pipe) == 0;
+    return out;
+}
+
+std::vector<uint8_t> fileBytes(const std::string& path) {
+    std::ifstream in(path, std::ios::binary);
+    return {std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>()};
+}
+
+std::string printed(const std::function<void(FILE*)>& write) {
+    char* text = nullptr;
+    size_t length = 0;
+    FILE* f = open_memstream(&text, &length);
+    write(f);
+    fclose(f);
+    std::string out(text, length);
+    free(text);
+    return out;
+}
 
 std::vector<uint8_t> buildStream(const StreamPlan& plan) {
     std::vector<uint8_t> out;
-    out.reserve(plan.rounds * plan.pids.size() * 188);
     std::map<uint16_t, uint32_t> sequence;
     for (size_t round = 0; round < plan.rounds; ++round) {
         for (uint16_t pid : plan.pids) {
@@ -43,17 +167,13 @@ std::vector<uint8_t> buildStream(const StreamPlan& plan) {
             builder.pid(pid).continuity(static_cast<uint8_t>(seq & 0xF));
             size_t room = 184;
             if (plan.pcrPid == pid) {
-                const uint64_t base = plan.firstPcrBase + round * plan.pcrIntervalMs * 90ull;
-                builder.pcr(base, 0);
+                builder.pcr(plan.firstPcrBase + round * plan.pcrIntervalMs * 90ull, 0);
                 room = 184 - 8;
             }
-            // A payload that is not exactly the room left is padded by stuffing.
-            while (payload.size() < room) {
+            // The pattern keeps some 0x47 bytes inside payloads, as real streams have.
+            while (payload.size() < room)
                 payload.push_back(static_cast<uint8_t>(pid * 7 + seq * 13 + payload.size()));
-            }
-            // 0x47 inside payloads is what real streams have; keep some.
-            builder.payload(payload);
-            const TsPacket packet = builder.build();
+            const TsPacket packet = builder.payload(payload).build();
             out.insert(out.end(), packet.begin(), packet.end());
         }
     }
@@ -74,10 +194,25 @@ uint16_t pidOf(const uint8_t* packet) {
 
 std::vector<TsPacket> toPackets(const std::vector<uint8_t>& bytes) {
     std::vector<TsPacket> packets(bytes.size() / 188);
-    for (size_t i = 0; i < packets.size(); ++i) {
+    for (size_t i = 0; i < packets.size(); ++i)
         std::memcpy(packets[i].data(), bytes.data() + i * 188, 188);
-    }
     return packets;
+}
+
+std::map<uint16_t, std::vector<TsPacket>> packetsByPid(const std::vector<uint8_t>& bytes) {
+    std::map<uint16_t, std::vector<TsPacket>> result;
+    for (const TsPacket& packet : toPackets(bytes))
+        result[pidOf(packet.data())].push_back(packet);
+    return result;
+}
+
+std::vector<uint8_t> bytesOfPid(const std::vector<uint8_t>& ts, uint16_t pid) {
+    std::vector<uint8_t> out;
+    for (size_t at = 0; at + 188 <= ts.size(); at += 188) {
+        if (ts[at] == 0x47 && pidOf(ts.data() + at) == pid)
+            out.insert(out.end(), ts.begin() + at, ts.begin() + at + 188);
+    }
+    return out;
 }
 
 std::vector<std::string> summary(const std::vector<TsPacket>& packets) {
@@ -94,31 +229,15 @@ std::vector<std::string> summary(const std::vector<TsPacket>& packets) {
     return lines;
 }
 
-std::map<uint16_t, std::vector<TsPacket>> packetsByPid(const std::vector<uint8_t>& bytes) {
-    std::map<uint16_t, std::vector<TsPacket>> result;
-    for (const TsPacket& packet : toPackets(bytes))
-        result[pidOf(packet.data())].push_back(packet);
-    return result;
-}
-
 TempFile::TempFile(const std::vector<uint8_t>& bytes, const std::string& suffix) {
     const char* dir = getenv("TMPDIR");
-    std::string pattern =
-        std::string(dir != nullptr ? dir : "/tmp") + "/tavo_demux_XXXXXX" + suffix;
-    std::vector<char> name(pattern.begin(), pattern.end());
-    name.push_back('\0');
+    std::string name = std::string(dir != nullptr ? dir : "/tmp") + "/tavo_ts_XXXXXX" + suffix;
     const int fd = mkstemps(name.data(), static_cast<int>(suffix.size()));
     if (fd < 0)
         throw std::runtime_error("mkstemps failed");
-    size_t done = 0;
-    while (done < bytes.size()) {
-        const ssize_t n = ::write(fd, bytes.data() + done, bytes.size() - done);
-        if (n <= 0)
-            break;
-        done += static_cast<size_t>(n);
-    }
+    mPath = name;
+    writeFd(fd, bytes);
     close(fd);
-    mPath = name.data();
 }
 
 TempFile::~TempFile() {
@@ -149,8 +268,7 @@ StdinPipe::StdinPipe() {
     int fds[2];
     if (pipe2(fds, O_CLOEXEC) != 0)
         throw std::runtime_error("pipe failed");
-    // Large enough for the tests' writes to never block on a reader that is not
-    // reading yet.
+    // Large enough that the tests' writes never block on a reader not reading yet.
     fcntl(fds[1], F_SETPIPE_SZ, 1 << 20);
     mSavedStdin = dup(STDIN_FILENO);
     dup2(fds[0], STDIN_FILENO);
@@ -165,13 +283,7 @@ StdinPipe::~StdinPipe() {
 }
 
 void StdinPipe::write(const std::vector<uint8_t>& bytes) {
-    size_t done = 0;
-    while (done < bytes.size()) {
-        const ssize_t n = ::write(mWriteFd, bytes.data() + done, bytes.size() - done);
-        if (n <= 0)
-            throw std::runtime_error("pipe write failed");
-        done += static_cast<size_t>(n);
-    }
+    writeFd(mWriteFd, bytes);
 }
 
 void StdinPipe::closeWriter() {
@@ -184,13 +296,8 @@ RingDrain::RingDrain(android::sp<RingBuffer> ring)
     : mRing(std::move(ring)), mThread([this] { run(); }) {}
 
 RingDrain::~RingDrain() {
-    stop();
-}
-
-void RingDrain::stop() {
     mStop = true;
-    if (mThread.joinable())
-        mThread.join();
+    mThread.join();
 }
 
 void RingDrain::run() {
@@ -198,14 +305,11 @@ void RingDrain::run() {
         if (!mRing->waitForData(188))
             continue;
         const uint32_t used = mRing->usedSpace() / 188 * 188;
-        const uint8_t* data = mRing->readPointer();
         {
             std::lock_guard<std::mutex> lock(mLock);
-            for (uint32_t offset = 0; offset < used; offset += 188) {
-                TsPacket packet;
-                std::memcpy(packet.data(), data + offset, 188);
-                mPackets.push_back(packet);
-            }
+            const std::vector<TsPacket> more =
+                toPackets(std::vector<uint8_t>(mRing->readPointer(), mRing->readPointer() + used));
+            mPackets.insert(mPackets.end(), more.begin(), more.end());
         }
         mChanged.notify_all();
         mRing->consume(used);
@@ -227,23 +331,6 @@ size_t RingDrain::count() const {
     return mPackets.size();
 }
 
-android::sp<RingBuffer> makeRing(const std::string& name, unsigned int log2Size) {
-    android::sp<RingBuffer> ring = new RingBuffer();
-    if (ring->configure(name, log2Size) != 0)
-        throw std::runtime_error("ring configure failed");
-    return ring;
-}
-
-bool waitUntil(const std::function<bool()>& condition, std::chrono::milliseconds deadline) {
-    const auto end = std::chrono::steady_clock::now() + deadline;
-    while (!condition()) {
-        if (std::chrono::steady_clock::now() >= end)
-            return false;
-        std::this_thread::sleep_for(std::chrono::milliseconds(2));
-    }
-    return true;
-}
-
 size_t threadsNamed(const std::string& name) {
     size_t count = 0;
     for (const auto& task : std::filesystem::directory_iterator("/proc/self/task")) {
@@ -260,7 +347,6 @@ int freeUdpPort() {
     sockaddr_in address{};
     address.sin_family = AF_INET;
     address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-    address.sin_port = 0;
     bind(fd, reinterpret_cast<sockaddr*>(&address), sizeof address);
     socklen_t length = sizeof address;
     getsockname(fd, reinterpret_cast<sockaddr*>(&address), &length);

@@ -19,9 +19,11 @@ extern "C" {
 namespace TavoPlayer {
 namespace {
 
+using test::Bytes;
+using test::concat;
 using test::ExtractedUnit;
 using test::PesChunk;
-using Bytes = std::vector<uint8_t>;
+using test::PrintTo;
 
 // An independent bit-string builder for RBSPs: u(n), ue(v), se(v) (ITU-T H.264, 7.2, 9.1).
 class Rbsp {
@@ -76,14 +78,6 @@ Bytes nal(uint8_t header, const Bytes& rbsp, bool longStartCode = true) {
         }
         out.push_back(b);
         zeros = b == 0 ? zeros + 1 : 0;
-    }
-    return out;
-}
-
-Bytes cat(std::initializer_list<Bytes> parts) {
-    Bytes out;
-    for (const Bytes& p : parts) {
-        out.insert(out.end(), p.begin(), p.end());
     }
     return out;
 }
@@ -244,6 +238,7 @@ protected:
     }
     android::sp<RingBuffer> mRing;
     android::sp<H264MediaExtractor> mExtractor;
+    Bytes mOut = Bytes(1 << 16);
 };
 
 // --- Exp-Golomb and emulation prevention ------------------------------------------------
@@ -324,12 +319,6 @@ struct SpsCase {
     uint32_t height;
 };
 
-SpsParams with(std::function<void(SpsParams&)> change) {
-    SpsParams p;
-    change(p);
-    return p;
-}
-
 class H264SpsTest : public H264Fixture, public ::testing::WithParamInterface<SpsCase> {};
 
 TEST_P(H264SpsTest, DecodesFieldsOrFailsWithItsMessage) {
@@ -349,72 +338,35 @@ TEST_P(H264SpsTest, DecodesFieldsOrFailsWithItsMessage) {
     }
 }
 
-INSTANTIATE_TEST_SUITE_P(
-    Fields, H264SpsTest,
-    ::testing::Values(
-        SpsCase{"Crop1088To1080", with([](SpsParams& p) { p.cropBottom = 4; }), 0, nullptr, 1920,
-                1080},
-        SpsCase{"InterlacedCrop", with([](SpsParams& p) {
-                    p.frameMbsOnly = false;
-                    p.heightMapUnits = 34;
-                    p.cropBottom = 2;
-                }),
-                0, nullptr, 1920, 1080},
-        SpsCase{"Baseline", with([](SpsParams& p) {
-                    p.profile = 66;
-                    p.widthMbs = 40;
-                    p.heightMapUnits = 30;
-                }),
-                0, nullptr, 640, 480},
-        SpsCase{"ScalingLists", with([](SpsParams& p) { p.scalingLists = true; }), 0, nullptr, 1920,
-                1088},
-        SpsCase{"PocType1", with([](SpsParams& p) {
-                    p.pocType = 1;
-                    p.pocCycle = 3;
-                }),
-                0, nullptr, 1920, 1088},
-        SpsCase{"PocType2", with([](SpsParams& p) { p.pocType = 2; }), 0, nullptr, 1920, 1088},
-        SpsCase{"Aspect17Passes", with([](SpsParams& p) { p.aspectIdc = 17; }), 0, nullptr, 0, 0},
-        SpsCase{"Aspect255", with([](SpsParams& p) { p.aspectIdc = 255; }), 0, nullptr, 0, 0},
-        SpsCase{"Aspect18Fails", with([](SpsParams& p) { p.aspectIdc = 18; }), 1,
-                "decodeVUI: Illegal Aspect Ratio: 18", 0, 0},
-        SpsCase{"NoVui", with([](SpsParams& p) { p.vui = false; }), 1,
-                "decodeSPS: VUI is not present", 1920, 1088},
-        SpsCase{"ZeroTimeScale", with([](SpsParams& p) { p.timeScale = 0; }), 1,
-                "decodeVUI: Illegal TimeScale or Number of Ticks (0, 1001)", 0, 0},
-        SpsCase{"SpsId32", with([](SpsParams& p) { p.spsId = 32; }), 1,
-                "decodeSPS: SPS number (32) is out of range", 0, 0},
-        SpsCase{"Chroma4", with([](SpsParams& p) { p.chromaFormat = 4; }), 1,
-                "decodeSPS: Chroma Format IDC 4 is not valid", 0, 0},
-        SpsCase{"BitDepthsDiffer", with([](SpsParams& p) { p.bitDepthChromaMinus8 = 2; }), 1,
-                "decodeSPS: Illegal bit depth values (8, 10)", 0, 0},
-        SpsCase{"BitDepth15", with([](SpsParams& p) {
-                    p.bitDepthLumaMinus8 = 7;
-                    p.bitDepthChromaMinus8 = 7;
-                }),
-                1, "decodeSPS: Illegal bit depth values (15, 15)", 0, 0},
-        SpsCase{"MaxFrameNum17", with([](SpsParams& p) { p.log2MaxFrameNumMinus4 = 13; }), 1,
-                "decodeSPS; Max frame num invalid range out of range (4-16): 17", 0, 0},
-        SpsCase{"PocLsb17", with([](SpsParams& p) { p.log2MaxPocLsbMinus4 = 13; }), 1,
-                "decodeSPS: log2MaxPocLSB (17) is out of range", 0, 0},
-        SpsCase{"PocCycle256", with([](SpsParams& p) {
-                    p.pocType = 1;
-                    p.pocCycle = 256;
-                }),
-                1, "decodeSPS: Poc Cycle Length out of bounds: 256", 0, 0},
-        SpsCase{"PocType3", with([](SpsParams& p) { p.pocType = 3; }), 1,
-                "decodeSPS: illegal POC type 3", 0, 0},
-        SpsCase{"RefFrames17", with([](SpsParams& p) { p.refFrames = 17; }), 1,
-                "decodeSPS: Reference frames invalid: 17", 0, 0}),
+// clang-format off
+INSTANTIATE_TEST_SUITE_P(Fields, H264SpsTest, ::testing::Values(
+    SpsCase{"Crop1088To1080", {.cropBottom = 4}, 0, nullptr, 1920, 1080},
+    SpsCase{"InterlacedCrop", {.heightMapUnits = 34, .frameMbsOnly = false, .cropBottom = 2}, 0, nullptr, 1920, 1080},
+    SpsCase{"Baseline", {.profile = 66, .widthMbs = 40, .heightMapUnits = 30}, 0, nullptr, 640, 480},
+    SpsCase{"ScalingLists", {.scalingLists = true}, 0, nullptr, 1920, 1088},
+    SpsCase{"PocType1", {.pocType = 1, .pocCycle = 3}, 0, nullptr, 1920, 1088},
+    SpsCase{"PocType2", {.pocType = 2}, 0, nullptr, 1920, 1088},
+    SpsCase{"Aspect17Passes", {.aspectIdc = 17}, 0, nullptr, 0, 0},
+    SpsCase{"Aspect255", {.aspectIdc = 255}, 0, nullptr, 0, 0},
+    SpsCase{"Aspect18Fails", {.aspectIdc = 18}, 1, "decodeVUI: Illegal Aspect Ratio: 18", 0, 0},
+    SpsCase{"NoVui", {.vui = false}, 1, "decodeSPS: VUI is not present", 1920, 1088},
+    SpsCase{"ZeroTimeScale", {.timeScale = 0}, 1, "decodeVUI: Illegal TimeScale or Number of Ticks (0, 1001)", 0, 0},
+    SpsCase{"SpsId32", {.spsId = 32}, 1, "decodeSPS: SPS number (32) is out of range", 0, 0},
+    SpsCase{"Chroma4", {.chromaFormat = 4}, 1, "decodeSPS: Chroma Format IDC 4 is not valid", 0, 0},
+    SpsCase{"BitDepthsDiffer", {.bitDepthChromaMinus8 = 2}, 1, "decodeSPS: Illegal bit depth values (8, 10)", 0, 0},
+    SpsCase{"BitDepth15", {.bitDepthLumaMinus8 = 7, .bitDepthChromaMinus8 = 7}, 1, "decodeSPS: Illegal bit depth values (15, 15)", 0, 0},
+    SpsCase{"MaxFrameNum17", {.log2MaxFrameNumMinus4 = 13}, 1, "decodeSPS; Max frame num invalid range out of range (4-16): 17", 0, 0},
+    SpsCase{"PocLsb17", {.log2MaxPocLsbMinus4 = 13}, 1, "decodeSPS: log2MaxPocLSB (17) is out of range", 0, 0},
+    SpsCase{"PocCycle256", {.pocType = 1, .pocCycle = 256}, 1, "decodeSPS: Poc Cycle Length out of bounds: 256", 0, 0},
+    SpsCase{"PocType3", {.pocType = 3}, 1, "decodeSPS: illegal POC type 3", 0, 0},
+    SpsCase{"RefFrames17", {.refFrames = 17}, 1, "decodeSPS: Reference frames invalid: 17", 0, 0}),
     [](const auto& info) { return std::string(info.param.name); });
+// clang-format on
 
 class H264SpsRobustnessTest : public H264Fixture {};
 
 TEST_F(H264SpsRobustnessTest, EveryTruncationFailsWithoutReadingPastTheEnd) {
-    SpsParams p;
-    p.nalHrd = true;
-    p.picStructPresent = true;
-    p.scalingLists = true;
+    SpsParams p{.scalingLists = true, .nalHrd = true, .picStructPresent = true};
     const Bytes full = spsRbsp(p);
     ASSERT_EQ(mExtractor->decodeSPS(const_cast<uint8_t*>(full.data()), full.size(), false), 0u);
     // Cut before the last byte that holds a field (the last byte is only trailing bits).
@@ -427,9 +379,7 @@ TEST_F(H264SpsRobustnessTest, EveryTruncationFailsWithoutReadingPastTheEnd) {
 }
 
 TEST_F(H264SpsRobustnessTest, BitFlipsNeverReadOutsideTheUnit) {
-    SpsParams p;
-    p.nalHrd = true;
-    p.picStructPresent = true;
+    SpsParams p{.nalHrd = true, .picStructPresent = true};
     const Bytes full = spsRbsp(p);
     std::mt19937 random(1234);
     unsigned failures = 0;
@@ -445,9 +395,7 @@ TEST_F(H264SpsRobustnessTest, BitFlipsNeverReadOutsideTheUnit) {
 }
 
 TEST_F(H264SpsRobustnessTest, FifthHrdFieldShiftsTheLaterFields) {
-    SpsParams p;
-    p.nalHrd = true;
-    p.picStructPresent = true;
+    SpsParams p{.nalHrd = true, .picStructPresent = true};
     p.hrdFields[0] = 23;
     p.hrdFields[1] = 17;
     p.hrdFields[2] = 5;
@@ -482,9 +430,7 @@ protected:
 };
 
 TEST_F(H264SeiTest, PicTimingWithHrdDelaysAndClockTimestamp) {
-    SpsParams p;
-    p.nalHrd = true;
-    p.picStructPresent = true;
+    SpsParams p{.nalHrd = true, .picStructPresent = true};
     p.hrdFields[1] = 9;  // delays of 10 bits
     p.hrdFields[4] = 0;  // no time offset
     decodeSps(p);
@@ -503,8 +449,7 @@ TEST_F(H264SeiTest, PicTimingWithHrdDelaysAndClockTimestamp) {
 }
 
 TEST_F(H264SeiTest, InvalidPicStructIsRefused) {
-    SpsParams p;
-    p.picStructPresent = true;
+    SpsParams p{.picStructPresent = true};
     decodeSps(p);
     test::TraceCapture trace;
     Bytes sei = {1, 1, 0x9F, 0x80};  // pic_struct 9
@@ -514,44 +459,28 @@ TEST_F(H264SeiTest, InvalidPicStructIsRefused) {
     EXPECT_EQ(trace.count("decodeSEI: Error decoding SEI"), 1u);
 }
 
-TEST_F(H264SeiTest, LongOtherMessageIsSkippedModulo256Bits) {
-    SpsParams p;
-    p.picStructPresent = true;
-    decodeSps(p);
-    // A 40-byte user-data message whose bytes 8.. look like a picture-timing message
-    // (pic_struct 4): the skip of 320 bits wraps to 64, so that is what is read next.
-    Bytes payload(40, 0x55);
-    payload[8] = 1;
-    payload[9] = 1;
-    payload[10] = 0x40;  // pic_struct 4, clock flags 0 0
-    Bytes sei = {5, 40};
-    sei.insert(sei.end(), payload.begin(), payload.end());
-    sei.push_back(0x80);
-    decodeSei(nal(0x06, sei, false));
-    EXPECT_TRUE(mExtractor->isPicTimingSeen());
-    EXPECT_EQ(mExtractor->getPicStruct(), 4);
-}
-
-TEST_F(H264SeiTest, ShortOtherMessageIsSkippedWhole) {
-    SpsParams p;
-    p.picStructPresent = true;
-    decodeSps(p);
-    Bytes payload(31, 0x55);
-    payload[8] = 1;
-    payload[9] = 1;
-    payload[10] = 0x40;
-    Bytes sei = {5, 31};
-    sei.insert(sei.end(), payload.begin(), payload.end());
-    sei.insert(sei.end(), {1, 1, 0x20, 0x80});  // the real picture timing: pic_struct 2
-    decodeSei(nal(0x06, sei, false));
-    EXPECT_TRUE(mExtractor->isPicTimingSeen());
-    EXPECT_EQ(mExtractor->getPicStruct(), 2);
+// Another message's payload is skipped by its size in bits modulo 256: a 40-byte
+// user-data message (320 bits) wraps to 64, so what its bytes 8.. hold (a picture
+// timing with pic_struct 4) is read next; a 31-byte one is skipped whole and the real
+// picture timing after it (pic_struct 2) is read.
+TEST_F(H264SeiTest, OtherMessageIsSkippedModulo256Bits) {
+    for (uint8_t size : {40, 31}) {
+        SetUp();
+        decodeSps({.picStructPresent = true});
+        Bytes sei = {5, size};
+        sei.resize(2 + size, 0x55);
+        sei[10] = 1;
+        sei[11] = 1;
+        sei[12] = 0x40;  // pic_struct 4, clock flags 0 0
+        sei.insert(sei.end(), {1, 1, 0x20, 0x80});
+        decodeSei(nal(0x06, sei, false));
+        EXPECT_TRUE(mExtractor->isPicTimingSeen());
+        EXPECT_EQ(mExtractor->getPicStruct(), size == 40 ? 4 : 2) << int(size);
+    }
 }
 
 TEST_F(H264SeiTest, TruncatedSeiStaysInsideItsBytes) {
-    SpsParams p;
-    p.picStructPresent = true;
-    p.nalHrd = true;
+    SpsParams p{.nalHrd = true, .picStructPresent = true};
     decodeSps(p);
     const Bytes sei = {0xFF, 0xFF, 0x02, 0xFF, 0x30, 0x01, 0x02, 0x03, 0x04, 0x05};
     for (size_t size = 4; size <= sei.size(); ++size) {
@@ -577,11 +506,10 @@ class H264FrameRateTest : public H264SeiTest, public ::testing::WithParamInterfa
 
 TEST_P(H264FrameRateTest, DurationInTicks) {
     const RateCase& c = GetParam();
-    SpsParams p;
-    p.numUnitsInTick = c.units;
-    p.timeScale = c.scale;
-    p.fixedFrameRate = c.fixed;
-    p.picStructPresent = c.picStructPresent;
+    SpsParams p{.numUnitsInTick = c.units,
+                .timeScale = c.scale,
+                .fixedFrameRate = c.fixed,
+                .picStructPresent = c.picStructPresent};
     decodeSps(p);
     if (c.picStructPresent) {
         decodeSei(picTimingSei(c.picStruct));
@@ -615,33 +543,33 @@ TEST_F(H264SeiTest, NoTimingIsInvalid) {
 class H264AccessUnitTest : public H264Fixture {};
 
 TEST_F(H264AccessUnitTest, DelimiterSplitsRecordIntoTwoUnits) {
-    SpsParams p;
-    p.picStructPresent = true;
+    SpsParams p{.picStructPresent = true};
     const Bytes first =
-        cat({aud(), nal(0x67, spsRbsp(p)), pps(), picTimingSei(0), slice(0x65, 0, true)});
-    const Bytes second = cat({aud(), slice(0x41, 0, true)});
-    const Bytes es = cat({first, second});
+        concat({aud(), nal(0x67, spsRbsp(p)), pps(), picTimingSei(0), slice(0x65, 0, true)});
+    const Bytes second = concat({aud(), slice(0x41, 0, true)});
+    const Bytes es = concat({first, second});
     ASSERT_TRUE(test::writePesRecord(*mRing, es, 90000));
-    std::vector<uint8_t> out(1 << 16);
+    std::vector<ExtractedUnit> units;
+    ASSERT_EQ(test::pullUnit(*mExtractor, mOut, &units), 0u);
+    EXPECT_EQ(mRing->tail(), 0u);  // the record is still in use
+    // The first unit has the leading zero of its 4-byte start code.
+    EXPECT_EQ(units,
+              (std::vector<ExtractedUnit>{
+                  {first, 90000, H264MediaExtractor::kFlagIdr | H264MediaExtractor::kFlagSps}}));
     unsigned long length = 0;
     long long pts = 0;
-    unsigned char flags = 0xFF;
-    ASSERT_EQ(mExtractor->getDecodableUnit(out.data(), out.size(), &length, &pts, &flags), 0u);
-    EXPECT_EQ(Bytes(out.begin(), out.begin() + length), first);  // the leading zero included
-    EXPECT_EQ(flags, H264MediaExtractor::kFlagIdr | H264MediaExtractor::kFlagSps);
-    EXPECT_EQ(pts, 90000);
-    EXPECT_EQ(mRing->tail(), 0u);  // the record is still in use
-    ASSERT_EQ(mExtractor->getDecodableUnit(out.data(), out.size(), &length, &pts, &flags), 0u);
-    EXPECT_EQ(Bytes(out.begin(), out.begin() + length), second);
-    EXPECT_EQ(flags, 0);
-    EXPECT_EQ(pts, 90000 + 1501);
+    unsigned char flags = 0xFF;  // must be written, not left as it was
+    ASSERT_EQ(mExtractor->getDecodableUnit(mOut.data(), mOut.size(), &length, &pts, &flags), 0u);
+    EXPECT_EQ(
+        (ExtractedUnit{Bytes(mOut.begin(), mOut.begin() + static_cast<long>(length)), pts, flags}),
+        (ExtractedUnit{second, 90000 + 1501, 0}));
     EXPECT_EQ(mRing->tail(), RingBuffer::roundUp4(40 + 14 + es.size()));
 }
 
 TEST_F(H264AccessUnitTest, NothingIsOutputBeforeTheFirstSps) {
     SpsParams p;
-    const Bytes withoutSps = cat({aud(), slice(0x41, 0)});
-    const Bytes withSps = cat({aud(), nal(0x67, spsRbsp(p)), slice(0x65, 0)});
+    const Bytes withoutSps = concat({aud(), slice(0x41, 0)});
+    const Bytes withSps = concat({aud(), nal(0x67, spsRbsp(p)), slice(0x65, 0)});
     const auto units = run({{withoutSps, 100}, {withoutSps, 200}, {withSps, 300}});
     ASSERT_EQ(units.size(), 1u);
     EXPECT_EQ(units[0].bytes, withSps);
@@ -650,10 +578,10 @@ TEST_F(H264AccessUnitTest, NothingIsOutputBeforeTheFirstSps) {
 
 TEST_F(H264AccessUnitTest, SpsWithoutVuiDelimitsOnlyByRecord) {
     test::TraceCapture trace;
-    SpsParams p;
-    p.vui = false;
-    const Bytes first = cat({aud(), nal(0x67, spsRbsp(p)), slice(0x65, 0), aud(), slice(0x41, 0)});
-    const Bytes next = cat({slice(0x41, 0), aud(), slice(0x41, 0)});
+    SpsParams p{.vui = false};
+    const Bytes first =
+        concat({aud(), nal(0x67, spsRbsp(p)), slice(0x65, 0), aud(), slice(0x41, 0)});
+    const Bytes next = concat({slice(0x41, 0), aud(), slice(0x41, 0)});
     const auto units = run({{first, 1000}, {next, 4000}});
     ASSERT_EQ(units.size(), 2u);
     EXPECT_EQ(units[0].bytes, first);  // the whole record: slices never delimit
@@ -669,11 +597,11 @@ TEST_F(H264AccessUnitTest, SpsWithoutVuiDelimitsOnlyByRecord) {
 }
 
 TEST_F(H264AccessUnitTest, PicStructStreamWaitsForPictureTiming) {
-    SpsParams p;
-    p.picStructPresent = true;
+    SpsParams p{.picStructPresent = true};
     // No picture-timing SEI yet: slices are ignored, so the second AUD does not end the AU.
-    const Bytes first = cat({aud(), nal(0x67, spsRbsp(p)), slice(0x65, 0), aud(), slice(0x41, 0)});
-    const Bytes next = cat({aud(), picTimingSei(0), slice(0x41, 0), aud(), slice(0x41, 0)});
+    const Bytes first =
+        concat({aud(), nal(0x67, spsRbsp(p)), slice(0x65, 0), aud(), slice(0x41, 0)});
+    const Bytes next = concat({aud(), picTimingSei(0), slice(0x41, 0), aud(), slice(0x41, 0)});
     const auto units = run({{first, 0}, {next, 9000}});
     ASSERT_EQ(units.size(), 3u);
     EXPECT_EQ(units[0].bytes, first);
@@ -684,16 +612,13 @@ TEST_F(H264AccessUnitTest, PicStructStreamWaitsForPictureTiming) {
 TEST_F(H264AccessUnitTest, InterlacedStreamOfFramePicturesIsStampedEvery1501Ticks) {
     // 29.97 Hz, num_units_in_tick 1001, time_scale 60000, fixed rate, pic_struct 0:
     // 1001 x 90000 / 60000 = 1501 ticks per unit (a tick is one field period).
-    SpsParams p;
-    p.frameMbsOnly = false;
-    p.heightMapUnits = 34;
-    p.cropBottom = 2;
-    p.picStructPresent = true;
-    const Bytes unit1 = cat({aud(), nal(0x67, spsRbsp(p)), pps(), picTimingSei(0),
-                             slice(0x65, 0, true, 0), slice(0x65, 30, false, 0)});
-    const Bytes unit2 = cat({aud(), picTimingSei(0), slice(0x41, 0, true, 0)});
-    const Bytes unit3 = cat({aud(), picTimingSei(0), slice(0x41, 0, true, 0)});
-    const auto units = run({{cat({unit1, unit2, unit3}), 5000}});
+    SpsParams p{
+        .heightMapUnits = 34, .frameMbsOnly = false, .cropBottom = 2, .picStructPresent = true};
+    const Bytes unit1 = concat({aud(), nal(0x67, spsRbsp(p)), pps(), picTimingSei(0),
+                                slice(0x65, 0, true, 0), slice(0x65, 30, false, 0)});
+    const Bytes unit2 = concat({aud(), picTimingSei(0), slice(0x41, 0, true, 0)});
+    const Bytes unit3 = concat({aud(), picTimingSei(0), slice(0x41, 0, true, 0)});
+    const auto units = run({{concat({unit1, unit2, unit3}), 5000}});
     ASSERT_EQ(units.size(), 3u);
     EXPECT_EQ(units[0].bytes, unit1);
     EXPECT_EQ(units[1].bytes, unit2);
@@ -709,15 +634,13 @@ TEST_F(H264AccessUnitTest, FieldPairsInOneRecordAreCutAtEveryFirstMbZero) {
     // second field ends the unit that the AUD opened; what follows it up to the next
     // delimiter is cut by the same rule. Field pictures without pic_struct count two
     // ticks each: 3003.
-    SpsParams p;
-    p.frameMbsOnly = false;
-    p.heightMapUnits = 34;
-    const Bytes head = cat({aud(), nal(0x67, spsRbsp(p)), pps(), slice(0x65, 0, true, 1)});
+    SpsParams p{.heightMapUnits = 34, .frameMbsOnly = false};
+    const Bytes head = concat({aud(), nal(0x67, spsRbsp(p)), pps(), slice(0x65, 0, true, 1)});
     const Bytes field2 = slice(0x41, 0, true, 1);
     const Bytes aud2 = aud();
     const Bytes field3 = slice(0x41, 0, true, 1);
     const Bytes field4 = slice(0x41, 0, true, 1);
-    const auto units = run({{cat({head, field2, aud2, field3, field4}), 0}});
+    const auto units = run({{concat({head, field2, aud2, field3, field4}), 0}});
     ASSERT_EQ(units.size(), 3u);
     EXPECT_EQ(units[0].bytes, head);
     EXPECT_EQ(units[1].bytes, aud2);    // field 2 only marks the first slice of its call
@@ -730,7 +653,7 @@ TEST_F(H264AccessUnitTest, WorkaroundAfterThirtyOneRecordsWithoutStart) {
     test::TraceCapture trace;
     SpsParams p;
     std::vector<PesChunk> chunks;
-    chunks.push_back({cat({nal(0x67, spsRbsp(p)), pps(), slice(0x65, 0)}), 0});
+    chunks.push_back({concat({nal(0x67, spsRbsp(p)), pps(), slice(0x65, 0)}), 0});
     for (int i = 1; i <= 40; ++i) {
         chunks.push_back({slice(0x41, 0, true), static_cast<uint64_t>(i) * 3000});
     }
@@ -749,26 +672,27 @@ TEST_F(H264AccessUnitTest, WorkaroundAfterThirtyOneRecordsWithoutStart) {
 TEST_F(H264AccessUnitTest, WorkaroundDelimitsEverySliceStartingAPicture) {
     SpsParams p;
     std::vector<PesChunk> chunks;
-    chunks.push_back({cat({nal(0x67, spsRbsp(p)), pps(), slice(0x65, 0)}), 0});
+    chunks.push_back({concat({nal(0x67, spsRbsp(p)), pps(), slice(0x65, 0)}), 0});
     for (int i = 1; i <= 31; ++i) {
         chunks.push_back({slice(0x41, 0, true), 0});
     }
     // Two pictures in one record, the second in two slices.
-    chunks.push_back({cat({slice(0x41, 0, true), slice(0x41, 0, true), slice(0x41, 60)}), 70000});
+    chunks.push_back(
+        {concat({slice(0x41, 0, true), slice(0x41, 0, true), slice(0x41, 60)}), 70000});
     const auto units = run(chunks);
     ASSERT_EQ(units.size(), 3u);
     EXPECT_EQ(units[1].bytes, slice(0x41, 0, true));
     EXPECT_EQ(units[1].pts, 70000);
-    EXPECT_EQ(units[2].bytes, cat({slice(0x41, 0, true), slice(0x41, 60)}));
+    EXPECT_EQ(units[2].bytes, concat({slice(0x41, 0, true), slice(0x41, 60)}));
     EXPECT_EQ(units[2].pts, 70000 + 1501);
 }
 
 TEST_F(H264AccessUnitTest, UnitLargerThanOutputIsDroppedSilently) {
     SpsParams p;
-    const Bytes big = cat({aud(), nal(0x67, spsRbsp(p)), slice(0x65, 0, true, -1, 400)});
-    const Bytes small = cat({aud(), slice(0x41, 0, true)});
+    const Bytes big = concat({aud(), nal(0x67, spsRbsp(p)), slice(0x65, 0, true, -1, 400)});
+    const Bytes small = concat({aud(), slice(0x41, 0, true)});
     test::TraceCapture trace;
-    const auto units = run({{cat({big, small}), 100}}, 300);
+    const auto units = run({{concat({big, small}), 100}}, 300);
     ASSERT_EQ(units.size(), 1u);
     EXPECT_EQ(units[0].bytes, small);
     EXPECT_EQ(units[0].pts, 100);  // a dropped unit does not advance the time
@@ -777,26 +701,23 @@ TEST_F(H264AccessUnitTest, UnitLargerThanOutputIsDroppedSilently) {
 
 TEST_F(H264AccessUnitTest, ResetGivesTheRecordBackAndDecodesTheSpsAgain) {
     SpsParams p;
-    const Bytes first = cat({aud(), nal(0x67, spsRbsp(p)), slice(0x65, 0)});
-    const Bytes es = cat({first, aud(), slice(0x41, 0)});
+    const Bytes first = concat({aud(), nal(0x67, spsRbsp(p)), slice(0x65, 0)});
+    const Bytes es = concat({first, aud(), slice(0x41, 0)});
     ASSERT_TRUE(test::writePesRecord(*mRing, es, 700));
-    std::vector<uint8_t> out(1 << 16);
-    unsigned long length = 0;
-    long long pts = 0;
-    unsigned char flags = 0;
-    ASSERT_EQ(mExtractor->getDecodableUnit(out.data(), out.size(), &length, &pts, &flags), 0u);
-    EXPECT_EQ(flags, H264MediaExtractor::kFlagIdr | H264MediaExtractor::kFlagSps);
+    std::vector<ExtractedUnit> units;
+    ASSERT_EQ(test::pullUnit(*mExtractor, mOut, &units), 0u);
     mExtractor->reset();
     EXPECT_FALSE(mExtractor->isFrameDurationKnown());
-    ASSERT_EQ(mExtractor->getDecodableUnit(out.data(), out.size(), &length, &pts, &flags), 0u);
-    EXPECT_EQ(Bytes(out.begin(), out.begin() + length), first);  // from the record's start
-    EXPECT_EQ(flags, H264MediaExtractor::kFlagIdr | H264MediaExtractor::kFlagSps);
-    EXPECT_EQ(pts, 700);
+    ASSERT_EQ(test::pullUnit(*mExtractor, mOut, &units), 0u);
+    // Both times from the record's start, with the SPS decoded again.
+    const ExtractedUnit expected{first, 700,
+                                 H264MediaExtractor::kFlagIdr | H264MediaExtractor::kFlagSps};
+    EXPECT_EQ(units, (std::vector<ExtractedUnit>{expected, expected}));
 }
 
 TEST_F(H264AccessUnitTest, ScanStepsOverLeadingOnesAndEndsUnitsAtTheNextStartCode) {
     const Bytes sei = nal(0x06, {0x05, 0x00}, false);
-    Bytes payload = cat({Bytes{0x01, 0x01}, aud(), sei, slice(0x41, 3)});
+    Bytes payload = concat({Bytes{0x01, 0x01}, aud(), sei, slice(0x41, 3)});
     mExtractor->setPayloadForTest(payload.data(), payload.size());
     H264MediaExtractor::NALUnitType type;
     unsigned int length = 0;
@@ -813,9 +734,9 @@ TEST_F(H264AccessUnitTest, ScanStepsOverLeadingOnesAndEndsUnitsAtTheNextStartCod
 
 TEST_F(H264AccessUnitTest, StatedEsSizeBeyondTheRecordIsBoundedByTheRecord) {
     SpsParams p;
-    const Bytes first = cat({aud(), nal(0x67, spsRbsp(p)), slice(0x65, 0)});
+    const Bytes first = concat({aud(), nal(0x67, spsRbsp(p)), slice(0x65, 0)});
     ASSERT_TRUE(test::writeRawRecord(*mRing, 40 + first.size(), 40, 1 << 20, 1234, first));
-    const Bytes second = cat({aud(), slice(0x41, 0)});
+    const Bytes second = concat({aud(), slice(0x41, 0)});
     const auto units = run({{second, 5678}});
     ASSERT_EQ(units.size(), 2u);
     EXPECT_EQ(units[0].bytes, first);
@@ -825,34 +746,8 @@ TEST_F(H264AccessUnitTest, StatedEsSizeBeyondTheRecordIsBoundedByTheRecord) {
 
 // --- real encoder output against libavcodec's H.264 parser --------------------------
 
-struct ReferenceUnit {
-    Bytes bytes;
-    bool key = false;
-};
-
-std::vector<ReferenceUnit> ffmpegAccessUnits(const Bytes& es) {
-    std::vector<ReferenceUnit> units;
-    AVCodecParserContext* parser = av_parser_init(AV_CODEC_ID_H264);
-    AVCodecContext* context = avcodec_alloc_context3(nullptr);
-    const uint8_t* data = es.data();
-    int left = static_cast<int>(es.size());
-    while (true) {
-        uint8_t* out = nullptr;
-        int outSize = 0;
-        const int used = av_parser_parse2(parser, context, &out, &outSize, data, left,
-                                          AV_NOPTS_VALUE, AV_NOPTS_VALUE, 0);
-        if (outSize > 0) {
-            units.push_back({Bytes(out, out + outSize), parser->key_frame == 1});
-        }
-        if (left == 0 && outSize == 0) {
-            break;
-        }
-        data += used;
-        left -= used;
-    }
-    avcodec_free_context(&context);
-    av_parser_close(parser);
-    return units;
+std::vector<test::ParsedUnit> ffmpegAccessUnits(const Bytes& es) {
+    return test::ffmpegParse(es, AV_CODEC_ID_H264);
 }
 
 Bytes encode(const std::string& x264Params, const std::string& extra, int frames) {
@@ -889,11 +784,11 @@ TEST_P(H264RealStreamTest, SameAccessUnitsAsFfmpegParser) {
     ASSERT_EQ(reference.size(), 45u);
 
     // One access unit per PES.
-    std::vector<PesChunk> perUnit;
-    for (size_t i = 0; i < reference.size(); ++i) {
-        perUnit.push_back({reference[i].bytes, 10000 + i * 3003});
+    std::vector<Bytes> referenceBytes;
+    for (const auto& unit : reference) {
+        referenceBytes.push_back(unit.bytes);
     }
-    auto units = run(perUnit);
+    auto units = run(test::groupCuts(referenceBytes, 1, 10000, 3003));
     ASSERT_EQ(units.size(), reference.size());
     for (size_t i = 0; i < units.size(); ++i) {
         ASSERT_EQ(units[i].bytes, reference[i].bytes) << "unit " << i;
@@ -909,15 +804,7 @@ TEST_P(H264RealStreamTest, SameAccessUnitsAsFfmpegParser) {
     // Several access units per PES: the same units, stamped from each PES's PTS on.
     for (size_t group : {size_t{3}, size_t{7}}) {
         SetUp();
-        std::vector<PesChunk> grouped;
-        for (size_t i = 0; i < reference.size(); ++i) {
-            if (i % group == 0) {
-                grouped.push_back({{}, 500 + i * 3003});
-            }
-            grouped.back().es.insert(grouped.back().es.end(), reference[i].bytes.begin(),
-                                     reference[i].bytes.end());
-        }
-        units = run(grouped);
+        units = run(test::groupCuts(referenceBytes, group, 500, 3003));
         ASSERT_EQ(units.size(), reference.size()) << "group " << group;
         for (size_t i = 0; i < units.size(); ++i) {
             ASSERT_EQ(units[i].bytes, reference[i].bytes) << "group " << group << " unit " << i;
@@ -955,15 +842,11 @@ protected:
             return false;
         }
         mChunks = test::pesFromTs(ts, 0x111);
-        Bytes es;
-        for (const auto& chunk : mChunks) {
-            es.insert(es.end(), chunk.es.begin(), chunk.es.end());
-        }
-        mReference = ffmpegAccessUnits(es);
+        mReference = ffmpegAccessUnits(test::joinEs(mChunks));
         return true;
     }
     std::vector<PesChunk> mChunks;
-    std::vector<ReferenceUnit> mReference;
+    std::vector<test::ParsedUnit> mReference;
 };
 
 TEST_F(H264TsgenTest, Interlaced1080StreamOfOneUnitPerPes) {
@@ -1072,9 +955,9 @@ class H264GoldenTest : public H264Fixture, public ::testing::WithParamInterface<
 
 TEST_P(H264GoldenTest, UnitsMatchTheCheckedInDump) {
     const SampleCase& c = GetParam();
-    const std::string path = std::string(TAVO_SHARED_STREAMS_DIR) + "/" + c.file;
-    if (!std::filesystem::exists(path)) {
-        GTEST_SKIP() << "sample stream folder absent: " << path;
+    const std::string path = test::sampleStream(c.file);
+    if (path.empty()) {
+        GTEST_SKIP() << "sample stream absent from " << TAVO_SHARED_STREAMS_DIR;
     }
     const auto chunks = test::pesFromTs(test::readFile(path), c.pid, c.packetSize);
     ASSERT_FALSE(chunks.empty());
@@ -1083,10 +966,7 @@ TEST_P(H264GoldenTest, UnitsMatchTheCheckedInDump) {
 
     // Independent check: every unit is one that libavcodec's parser cuts from the same
     // elementary stream (these muxers start each PES with an access unit).
-    Bytes es;
-    for (const auto& chunk : chunks) {
-        es.insert(es.end(), chunk.es.begin(), chunk.es.end());
-    }
+    const Bytes es = test::joinEs(chunks);
     // Keyed by size and hash of the bytes.
     auto key = [](const Bytes& b) {
         return std::make_pair(b.size(), test::fnv1a64(b.data(), b.size()));
@@ -1103,9 +983,9 @@ TEST_P(H264GoldenTest, UnitsMatchTheCheckedInDump) {
 
 TEST_P(H264GoldenTest, SameUnitsThroughTheTsParserModule) {
     const SampleCase& c = GetParam();
-    const std::string path = std::string(TAVO_SHARED_STREAMS_DIR) + "/" + c.file;
-    if (!std::filesystem::exists(path)) {
-        GTEST_SKIP() << "sample stream folder absent: " << path;
+    const std::string path = test::sampleStream(c.file);
+    if (path.empty()) {
+        GTEST_SKIP() << "sample stream absent from " << TAVO_SHARED_STREAMS_DIR;
     }
     const Bytes ts = test::readFile(path);
     auto chunks = test::pesFromTs(ts, c.pid, c.packetSize);

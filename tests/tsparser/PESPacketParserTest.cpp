@@ -2,24 +2,20 @@
 
 #include <gtest/gtest.h>
 
+#include <ostream>
 #include <string>
 #include <vector>
 
 #include "support/PesBuilder.h"
+#include "support/TsPacketBuilder.h"
 #include "support/TraceCapture.h"
 
 namespace TavoPlayer {
 namespace {
 
 using test::PesBuilder;
+using test::ramp;
 using test::TraceCapture;
-
-std::vector<uint8_t> ramp(size_t n, uint8_t first = 0) {
-    std::vector<uint8_t> v(n);
-    for (size_t i = 0; i < n; ++i)
-        v[i] = static_cast<uint8_t>(first + i);
-    return v;
-}
 
 // --- where the elementary stream starts, by stream id and header ---------------------
 
@@ -30,6 +26,9 @@ struct LayoutCase {
     bool optionalHeaderParsed;
     const char* message;  // expected log fragment, or null
 };
+void PrintTo(const LayoutCase& c, std::ostream* os) {
+    *os << c.name;
+}
 
 class PESPacketParserLayoutTest : public ::testing::TestWithParam<LayoutCase> {};
 
@@ -142,25 +141,14 @@ TEST(PESPacketParserTimeTest, TimesOfEarlierPacketsAreKept) {
 // --- the remaining optional fields ----------------------------------------------------
 
 TEST(PESPacketParserFieldsTest, EscrEsRateCopyInfoAndCrc) {
+    // ISO/IEC 13818-1, 2.4.3.7: ESCR 0x123456789 extension 0x1A5 with its reserved and
+    // marker bits; ES_rate 0x2ABCDE between markers; DSM trick mode 0x55 (skipped);
+    // additional copy info 0x42 after its marker; previous PES CRC 0xBEEF.
+    const std::vector<uint8_t> fields{0x26, 0x34, 0x57, 0x3C, 0x4F, 0x4B, 0xD5,
+                                      0x79, 0xBD, 0x55, 0xC2, 0xBE, 0xEF};
     const uint64_t escr = 0x123456789ull;
     const uint16_t escrExt = 0x1A5;
     const uint32_t rate = 0x2ABCDE;
-    // ISO/IEC 13818-1, 2.4.3.7: ESCR with reserved bits, markers; ES_rate with markers.
-    std::vector<uint8_t> fields{
-        static_cast<uint8_t>(((escr >> 27) & 0x38) | 0x04 | ((escr >> 28) & 0x03)),
-        static_cast<uint8_t>(escr >> 20),
-        static_cast<uint8_t>(((escr >> 12) & 0xF8) | 0x04 | ((escr >> 13) & 0x03)),
-        static_cast<uint8_t>(escr >> 5),
-        static_cast<uint8_t>(((escr << 3) & 0xF8) | 0x04 | ((escrExt >> 7) & 0x03)),
-        static_cast<uint8_t>(((escrExt << 1) & 0xFE) | 1),
-        static_cast<uint8_t>(0x80 | ((rate >> 15) & 0x7F)),
-        static_cast<uint8_t>(rate >> 7),
-        static_cast<uint8_t>((rate << 1) | 1),
-        0x55,  // DSM trick mode: skipped
-        0xC2,  // additional copy info 0x42
-        0xBE,
-        0xEF,  // previous PES CRC
-    };
     // Flags: ESCR 0x20, ES rate 0x10, trick mode 0x08, copy info 0x04, CRC 0x02.
     const auto pes =
         PesBuilder(0xC0).pts(900).optionalFields(0x3E, fields).payload(ramp(4)).build();

@@ -4,12 +4,12 @@
 // broken, because nothing in these files is.
 #include <gtest/gtest.h>
 
-#include <fstream>
+#include <ostream>
 #include <string>
 #include <vector>
 
-#include "support/TsTestUtil.h"
 #include "support/TraceCapture.h"
+#include "support/TsTestUtil.h"
 #include "tsparser/TSParser.h"
 
 namespace TavoPlayer {
@@ -23,23 +23,18 @@ struct StreamCase {
     uint8_t streamId;   // expected in every record
     size_t unitStarts;  // PES starts on the PID (counted independently with a script)
 };
+void PrintTo(const StreamCase& c, std::ostream* os) {
+    *os << c.name;
+}
 
 class TSParserSharedStreamsTest : public ::testing::TestWithParam<StreamCase> {};
 
 TEST_P(TSParserSharedStreamsTest, EveryClosedPesIsOneConsistentRecord) {
     const StreamCase& c = GetParam();
-    const std::string path = std::string(TAVO_SHARED_STREAMS_DIR) + "/" + c.file;
-    std::ifstream file(path, std::ios::binary);
-    if (!file)
+    const auto ts = test::fileBytes(std::string(TAVO_SHARED_STREAMS_DIR) + "/" + c.file);
+    if (ts.empty())
         GTEST_SKIP() << "shared sample streams not found at " << TAVO_SHARED_STREAMS_DIR;
-    const std::vector<uint8_t> ts((std::istreambuf_iterator<char>(file)),
-                                  std::istreambuf_iterator<char>());
-    std::vector<uint8_t> packets;
-    for (size_t at = 0; at + 188 <= ts.size(); at += 188) {
-        if (ts[at] == 0x47 && (((ts[at + 1] & 0x1F) << 8) | ts[at + 2]) == c.pid) {
-            packets.insert(packets.end(), ts.begin() + at, ts.begin() + at + 188);
-        }
-    }
+    const std::vector<uint8_t> packets = test::bytesOfPid(ts, c.pid);
 
     test::TraceCapture trace;
     auto input = test::makeRing("TS", 1 << 22);

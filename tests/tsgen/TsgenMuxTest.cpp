@@ -1,5 +1,6 @@
 // Transport-level properties of one generated stream, read with the tests' own
-// packet reader: clock references, tables, PES timing and contents.
+// packet reader: clock references, tables, PES timing and contents. The
+// access unit delimiters are checked beside the fault that removes them.
 
 #include <gtest/gtest.h>
 
@@ -62,8 +63,6 @@ TEST_F(TsgenMuxTest, VideoPesCarryOneAccessUnitWithDelimiterAndTimes) {
         ASSERT_TRUE(p.hasPts);
         EXPECT_LE(p.hasDts ? p.dts : p.pts, p.pts);
         const auto nals = nalTypes(p.payload);
-        ASSERT_FALSE(nals.empty());
-        EXPECT_EQ(nals[0], 9) << "PES " << i;  // access unit delimiter first
         auto has = [&](int type) { return std::count(nals.begin(), nals.end(), type) > 0; };
         // Fixed GOPs of 15: an IDR with its parameter sets, flagged as a random
         // access point in the adaptation field.
@@ -111,33 +110,30 @@ TEST_F(TsgenMuxTest, AudioPesFollowOneAnotherByOneFrame) {
 }
 
 TEST_F(TsgenMuxTest, CaptionStatementsCarryTheTextAtTheirTimes) {
-    std::vector<std::pair<int64_t, std::vector<uint8_t>>> statements;  // PTS, statement body
-    size_t management = 0;
+    // The data groups' layout is checked byte by byte with the caption writer;
+    // here the PES carry them whole and consistent, at their times.
+    const auto management = tsgen::CaptionWriter::managementPayload();
+    std::vector<std::pair<int64_t, std::vector<uint8_t>>> statements;
+    size_t managementCount = 0;
     for (const auto& p : mTs.pesOf(0x130)) {
         EXPECT_EQ(p.streamId, 0xBD);
+        // PES data header of 3 bytes, then one data group: 5 header bytes, its
+        // data_group_size, and a CRC_16 that leaves no remainder (ARIB STD-B24).
         ASSERT_GE(p.payload.size(), 10u);
-        EXPECT_EQ(p.payload[0], 0x80);  // data_identifier
-        const uint8_t* group = p.payload.data() + 3 + (p.payload[2] & 0x0F);
-        const size_t groupSize = (group[3] << 8) | group[4];
-        ASSERT_EQ(p.payload.data() + p.payload.size(), group + 5 + groupSize + 2);
-        EXPECT_EQ(tsgen::CaptionWriter::crc16(group, 5 + groupSize + 2), 0);
-        management += (group[0] >> 2) == 0 ? 1 : 0;
-        if ((group[0] >> 2) != 0) {
-            EXPECT_EQ(group[0] >> 2, 1);
-            const uint8_t* d = group + 5;
-            EXPECT_EQ(d[0] >> 6, 0);  // TMD free: shown at the PTS
-            EXPECT_EQ(d[4], 0x1F);    // unit separator
-            EXPECT_EQ(d[5], 0x20);    // statement body
-            statements.emplace_back(
-                p.pts, std::vector<uint8_t>(d + 9, d + 9 + ((d[6] << 16) | (d[7] << 8) | d[8])));
+        EXPECT_EQ(p.payload.size(), 3 + 5 + ((p.payload[6] << 8) | p.payload[7]) + 2u);
+        EXPECT_EQ(tsgen::CaptionWriter::crc16(p.payload.data() + 3, p.payload.size() - 3), 0);
+        managementCount += p.payload == management ? 1 : 0;
+        if (p.payload != management) {
+            statements.emplace_back(p.pts, p.payload);
         }
     }
     // Management data every second from the start, before the statements.
-    EXPECT_EQ(management, 3u);
+    EXPECT_EQ(managementCount, 3u);
     // "Olá" in the Latin set, \n as APR (0x0D); \f as CS (0x0C).
     const std::vector<std::pair<int64_t, std::vector<uint8_t>>> expected = {
-        {kStartPts + 90000, {'O', 'l', 0xE1, 0x0D, 'm', 'u', 'n', 'd', 'o'}},
-        {kStartPts + 225000, {0x0C}}};
+        {kStartPts + 90000,
+         tsgen::CaptionWriter::statementPayload(hex("4F 6C E1 0D 6D 75 6E 64 6F"))},
+        {kStartPts + 225000, tsgen::CaptionWriter::statementPayload({0x0C})}};
     EXPECT_EQ(statements, expected);
 }
 

@@ -3,7 +3,6 @@
 
 #include <gtest/gtest.h>
 
-#include <sstream>
 #include <string>
 #include <vector>
 
@@ -12,19 +11,12 @@
 #include "CaptionWriter.h"
 #include "H264SpsEditor.h"
 #include "TsMuxer.h"
+#include "TsgenTestUtil.h"
 
 namespace TavoPlayer::tsgen {
 namespace {
 
-// "56 E0 11" -> {0x56, 0xE0, 0x11}
-std::vector<uint8_t> hex(const std::string& text) {
-    std::istringstream in(text);
-    std::vector<uint8_t> out;
-    for (unsigned byte = 0; in >> std::hex >> byte;) {
-        out.push_back(static_cast<uint8_t>(byte));
-    }
-    return out;
-}
+using test::hex;
 
 uint16_t crc16(const std::vector<uint8_t>& bytes, size_t from = 0) {
     return CaptionWriter::crc16(bytes.data() + from, bytes.size() - from);
@@ -117,22 +109,20 @@ TEST(CaptionWriterTest, TextBecomesLatinCaptionCodesOrIsRefusedWithAReason) {
     const struct {
         const char* text;
         const char* codesOrError;  // hex codes, or the reason for refusing
-    } kCases[] = {
-        {"Ola", "4F 6C 61"},
-        {"Olá ç", "4F 6C E1 20 E7"},
-        // ISO 8859-15 positions of the letters that ISO 8859-1 lacks.
-        {"€ŠšŽžŒœŸ", "A4 A6 A8 B4 B8 BC BD BE"},
-        {"a\\x1D\\x21b", "61 1D 21 62"},  // SS3 + music note
-        {"\\f\\n\\\\", "0C 0D 5C"},
-        {"\\x1", "two hex digits"},
-        {"\\xg0", "two hex digits"},
-        {"a\\", "lone backslash"},
-        {"\\q", "unknown escape"},
-        {"中", "no Latin caption code"},
-        {"\xC3", "not valid UTF-8"},
-        {"\xC3(", "not valid UTF-8"},
-        {"\x80", "not valid UTF-8"},
-    };
+    } kCases[] = {{"Ola", "4F 6C 61"},
+                  {"Olá ç", "4F 6C E1 20 E7"},
+                  // ISO 8859-15 positions of the letters that ISO 8859-1 lacks.
+                  {"€ŠšŽžŒœŸ", "A4 A6 A8 B4 B8 BC BD BE"},
+                  {"a\\x1D\\x21b", "61 1D 21 62"},  // SS3 + music note
+                  {"\\f\\n\\\\", "0C 0D 5C"},
+                  {"\\x1", "two hex digits"},
+                  {"\\xg0", "two hex digits"},
+                  {"a\\", "lone backslash"},
+                  {"\\q", "unknown escape"},
+                  {"中", "no Latin caption code"},
+                  {"\xC3", "not valid UTF-8"},
+                  {"\xC3(", "not valid UTF-8"},
+                  {"\x80", "not valid UTF-8"}};
     for (const auto& c : kCases) {
         std::vector<uint8_t> codes;
         std::string error;

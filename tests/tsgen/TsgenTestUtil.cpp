@@ -4,7 +4,7 @@
 #include <unistd.h>
 
 #include <algorithm>
-#include <cstdio>
+#include <cstdlib>
 #include <filesystem>
 #include <fstream>
 #include <iterator>
@@ -13,46 +13,38 @@
 
 namespace TavoPlayer::test {
 
-namespace {
-
-struct TempFolder {
-    TempFolder() {
-        char name[] = "/tmp/tsgen_test_XXXXXX";
-        path = mkdtemp(name) != nullptr ? name : "";
-    }
-    ~TempFolder() {
-        std::error_code ec;
-        if (!path.empty()) {
-            std::filesystem::remove_all(path, ec);
-        }
-    }
-    std::string path;
-};
-
-}  // namespace
-
 std::string tempPath(const std::string& name) {
-    static TempFolder folder;
+    static struct Folder {
+        Folder() { std::filesystem::create_directories(path); }
+        ~Folder() { std::filesystem::remove_all(path, ec); }
+        std::string path = "/tmp/tsgen_test_" + std::to_string(getpid());
+        std::error_code ec;
+    } folder;
     return folder.path + "/" + name;
 }
 
 CommandResult runCommand(const std::string& command) {
     static int count = 0;
-    const std::string errFile = tempPath("stderr" + std::to_string(++count));
-    CommandResult result;
-    FILE* pipe = popen(("(" + command + ") 2>'" + errFile + "'").c_str(), "r");
-    if (pipe == nullptr) {
-        return result;
+    const std::string out = tempPath("out" + std::to_string(++count)), err = out + ".err";
+    const int status = std::system(("(" + command + ") >'" + out + "' 2>'" + err + "'").c_str());
+    const auto outBytes = readFile(out), errBytes = readFile(err);
+    return {WIFEXITED(status) ? WEXITSTATUS(status) : -1,
+            {outBytes.begin(), outBytes.end()},
+            {errBytes.begin(), errBytes.end()}};
+}
+
+std::vector<uint8_t> hex(const std::string& text) {
+    std::istringstream in(text);
+    std::vector<uint8_t> out;
+    for (unsigned byte = 0; in >> std::hex >> byte;) {
+        out.push_back(static_cast<uint8_t>(byte));
     }
-    char buffer[4096];
-    for (size_t n = 0; (n = fread(buffer, 1, sizeof buffer, pipe)) > 0;) {
-        result.out.append(buffer, n);
-    }
-    const int status = pclose(pipe);
-    result.exitCode = WIFEXITED(status) ? WEXITSTATUS(status) : -1;
-    const auto err = readFile(errFile);
-    result.err.assign(err.begin(), err.end());
-    return result;
+    return out;
+}
+
+bool contains(const std::vector<uint8_t>& bytes, const std::string& hexBytes) {
+    const auto part = hex(hexBytes);
+    return std::search(bytes.begin(), bytes.end(), part.begin(), part.end()) != bytes.end();
 }
 
 std::vector<uint8_t> readFile(const std::string& file) {
@@ -156,36 +148,6 @@ std::vector<Pes> TsFile::pesOf(uint16_t pid) const {
         finishPes(bytes, first->position, out);
     }
     return out;
-}
-
-std::vector<PmtStream> TsFile::pmt(uint16_t pmtPid) const {
-    std::vector<PmtStream> streams;
-    for (const auto* p : packetsOf(pmtPid)) {
-        // The first whole TS_program_map_section (ISO/IEC 13818-1, 2.4.4.8).
-        const size_t at = p->payload.empty() ? 0 : 1 + p->payload[0];
-        if (!p->pusi || at + 16 > p->payload.size() || p->payload[at] != 0x02) {
-            continue;
-        }
-        const std::vector<uint8_t> s(p->payload.begin() + static_cast<std::ptrdiff_t>(at),
-                                     p->payload.end());
-        const size_t end = 3 + (((s[1] & 0x0F) << 8) | s[2]) - 4;  // before CRC_32
-        if (end + 4 > s.size()) {
-            continue;
-        }
-        for (size_t i = 12 + (((s[10] & 0x0F) << 8) | s[11]); i + 5 <= end;) {
-            PmtStream es{s[i], static_cast<uint16_t>(((s[i + 1] & 0x1F) << 8) | s[i + 2]), {}};
-            const size_t esEnd = std::min(end, i + 5 + (((s[i + 3] & 0x0F) << 8) | s[i + 4]));
-            for (size_t d = i + 5; d + 2 <= esEnd && d + 2 + s[d + 1] <= esEnd; d += 2 + s[d + 1]) {
-                es.descriptors.emplace_back(
-                    s.begin() + static_cast<std::ptrdiff_t>(d),
-                    s.begin() + static_cast<std::ptrdiff_t>(d + 2 + s[d + 1]));
-            }
-            streams.push_back(std::move(es));
-            i = esEnd;
-        }
-        break;
-    }
-    return streams;
 }
 
 std::vector<size_t> TsFile::continuityErrors(uint16_t pid) const {

@@ -21,6 +21,9 @@ CommandResult runCommand(const std::string& command);
 // A path in a temporary folder of this test process, removed when it exits.
 std::string tempPath(const std::string& name);
 std::vector<uint8_t> readFile(const std::string& file);
+// "56 E0 11" -> {0x56, 0xE0, 0x11}; stops at the first word that is not hex.
+std::vector<uint8_t> hex(const std::string& text);
+bool contains(const std::vector<uint8_t>& bytes, const std::string& hexBytes);
 // What libavcodec complains about while decoding every stream of `file`.
 std::string decodeErrors(const std::string& file);
 
@@ -49,12 +52,6 @@ struct Pes {
     std::vector<uint8_t> payload;  // elementary stream bytes
 };
 
-struct PmtStream {
-    uint8_t streamType = 0;
-    uint16_t pid = 0;
-    std::vector<std::vector<uint8_t>> descriptors;  // tag, length, body
-};
-
 // Reads 188-byte packets (or 204-byte ones, ignoring their last 16 bytes);
 // every packet must start with 0x47.
 class TsFile {
@@ -66,8 +63,6 @@ public:
     // Whole PES packets of a PID (a PES ends where the next one starts; the
     // last one at the end of the file).
     std::vector<Pes> pesOf(uint16_t pid) const;
-    // The elementary streams of the first PMT section on `pmtPid`.
-    std::vector<PmtStream> pmt(uint16_t pmtPid = 0x1000) const;
     // Positions (index among the PID's packets) where the continuity counter
     // does not follow ISO/IEC 13818-1, 2.4.3.3.
     std::vector<size_t> continuityErrors(uint16_t pid) const;

@@ -66,11 +66,14 @@ class AACExtractorTest : public ::testing::Test {
 protected:
     void SetUp() override { mRing = test::makeRing(20); }
 
+    void writeChunks(const std::vector<PesChunk>& records) {
+        for (const auto& record : records) {
+            ASSERT_TRUE(test::writePesRecord(*mRing, record.es, record.pts, 0xC0));
+        }
+    }
     void writeRecords(const std::vector<std::vector<uint8_t>>& records, uint64_t firstPts,
                       uint64_t step) {
-        for (size_t i = 0; i < records.size(); ++i) {
-            ASSERT_TRUE(test::writePesRecord(*mRing, records[i], firstPts + i * step, 0xC0));
-        }
+        writeChunks(test::groupCuts(records, 1, firstPts, step));
     }
 
     // Drains a new extractor opened as `layer` over the ring.
@@ -88,29 +91,50 @@ protected:
 
 // ---- configuration first ----------------------------------------------------------
 
-class AACConfigFirstTest : public AACExtractorTest,
-                           public ::testing::WithParamInterface<Framing> {};
+class AACFramingTest : public AACExtractorTest, public ::testing::WithParamInterface<Framing> {
+protected:
+    std::vector<ExtractedUnit> unitsOf(const std::vector<PesChunk>& records) {
+        mRing->reset();
+        writeChunks(records);
+        return extract(GetParam());
+    }
+};
 
-TEST_P(AACConfigFirstTest, ConfigurationReplacesTheFirstUnitThenAudioFollows) {
-    const Stream s = makeStream(GetParam(), 8);
-    writeRecords(s.frames, 9000, kTicksPerFrame48k);
-    const auto units = extract(layerOf(GetParam()));
-
-    // The last frame waits for the header of a next one.
-    ASSERT_EQ(s.units.size() - 1, units.size());
-    EXPECT_EQ(AACMediaExtractor::FLAG_CODEC_CONFIG, units[0].flags);
-    EXPECT_EQ(kLcStereo48kAsc, units[0].bytes);
-    for (size_t i = 1; i < units.size(); ++i) {
-        EXPECT_EQ(0, units[i].flags) << i;
-        EXPECT_EQ(s.units[i], units[i].bytes) << i;
+// The configuration takes the first unit's place, then every unit follows but the
+// last, which waits for the header of a next one; the same however the PES are cut.
+TEST_P(AACFramingTest, ConfigurationFirstThenTheSameUnitsHoweverThePesAreCut) {
+    const Stream s = makeStream(GetParam(), 40);
+    const auto onePerPes = unitsOf(test::groupCuts(s.frames, 1, 9000, kTicksPerFrame48k));
+    ASSERT_EQ(s.units.size() - 1, onePerPes.size());
+    EXPECT_EQ(AACMediaExtractor::FLAG_CODEC_CONFIG, onePerPes[0].flags);
+    EXPECT_EQ(kLcStereo48kAsc, onePerPes[0].bytes);
+    for (size_t i = 1; i < onePerPes.size(); ++i) {
+        EXPECT_EQ(0, onePerPes[i].flags) << i;
+        EXPECT_EQ(s.units[i], onePerPes[i].bytes) << i;
     }
     // The unit after the configuration is the second of the first record's stream.
-    EXPECT_EQ(9000 + static_cast<long long>(kTicksPerFrame48k), units[1].pts);
+    EXPECT_EQ(9000 + static_cast<long long>(kTicksPerFrame48k), onePerPes[1].pts);
     EXPECT_EQ(1u, mTrace.count("getDecodableUnit: found aac codec config"));
     EXPECT_EQ(0u, mRing->usedSpace()) << "every record consumed";
+
+    const auto bytes = test::bytesOf(onePerPes);
+    const auto es = test::joinEs(test::groupCuts(s.frames, 1, 0, 0));
+    for (size_t cut : {97, 13}) {
+        EXPECT_EQ(bytes, test::bytesOf(unitsOf(test::fixedCuts(es, cut, 0, 0)))) << cut;
+    }
+    EXPECT_EQ(bytes, test::bytesOf(unitsOf(test::groupCuts(s.frames, 3, 0, 0))));
 }
 
-TEST_P(AACConfigFirstTest, ResetSendsTheConfigurationAgainBeforeAudio) {
+// One line per unit (PTS, flags, size, hash) against a checked-in dump. Run with
+// TAVO_UPDATE_GOLDEN=1 to rewrite the dumps after an intended change.
+TEST_P(AACFramingTest, MatchesGoldenDump) {
+    const Stream s = makeStream(GetParam(), 24);
+    const auto units = unitsOf(test::groupCuts(s.frames, 2, 90000, kTicksPerFrame48k));
+    const std::string name = std::string("aac_") + (GetParam() == Framing::Loas ? "loas" : "adts");
+    EXPECT_EQ(test::compareGolden(name + "_two_per_pes.txt", test::goldenDump(units)), "");
+}
+
+TEST_P(AACFramingTest, ResetSendsTheConfigurationAgainBeforeAudio) {
     const Stream s = makeStream(GetParam(), 10);
     writeRecords(s.frames, 0, kTicksPerFrame48k);
     mExtractor = new AACMediaExtractor(mRing, layerOf(GetParam()));
@@ -134,8 +158,7 @@ TEST_P(AACConfigFirstTest, ResetSendsTheConfigurationAgainBeforeAudio) {
     EXPECT_EQ(0u, mRing->usedSpace());
 }
 
-INSTANTIATE_TEST_SUITE_P(Framings, AACConfigFirstTest,
-                         ::testing::Values(Framing::Loas, Framing::Adts),
+INSTANTIATE_TEST_SUITE_P(Framings, AACFramingTest, ::testing::Values(Framing::Loas, Framing::Adts),
                          [](const auto& info) { return nameOf(info.param); });
 
 // ---- the switch between LOAS and ADTS --------------------------------------------
@@ -176,10 +199,7 @@ TEST_P(AACSwitchTest, SwitchesAfterTheCountedErrorsAndThenDeliversConfigAndAudio
     EXPECT_EQ(AACMediaExtractor::FLAG_CODEC_CONFIG, units[0].flags);
     EXPECT_EQ(kLcStereo48kAsc, units[0].bytes);
     // The first record after the switch gives the configuration, all later ones audio.
-    std::vector<std::vector<uint8_t>> audio;
-    for (size_t i = 1; i < units.size(); ++i) {
-        audio.push_back(units[i].bytes);
-    }
+    const auto audio = test::bytesOf({units.begin() + 1, units.end()});
     const size_t firstAudio = c.recordsBeforeSwitch + 1;
     ASSERT_EQ(total - firstAudio - 1, audio.size()) << mTrace.all();
     for (size_t i = 0; i < audio.size(); ++i) {
@@ -191,22 +211,18 @@ TEST_P(AACSwitchTest, SwitchesAfterTheCountedErrorsAndThenDeliversConfigAndAudio
     EXPECT_EQ(lookAlikes, mTrace.count(c.suspectMessage));
 }
 
-INSTANTIATE_TEST_SUITE_P(
-    Framings, AACSwitchTest,
-    ::testing::Values(
-        // One ADTS-looking record is enough once 26 errors are counted.
-        SwitchCase{"AdtsOpenedAsLoas", Framing::Adts, Framing::Loas, 1, 26, "ADTS supect count"},
-        SwitchCase{"AdtsOpenedAsLoasOneLookAlike", Framing::Adts, Framing::Loas, 30, 26,
-                   "ADTS supect count"},
-        SwitchCase{"AdtsOpenedAsLoasNoLookAlike", Framing::Adts, Framing::Loas, 0, 50,
-                   "ADTS supect count"},
-        // Ten LOAS-looking records are needed when decoding ADTS.
-        SwitchCase{"LoasOpenedAsAdts", Framing::Loas, Framing::Adts, 1, 26, "LOAS supect count"},
-        SwitchCase{"LoasOpenedAsAdtsEveryThird", Framing::Loas, Framing::Adts, 3, 28,
-                   "LOAS supect count"},
-        SwitchCase{"LoasOpenedAsAdtsNoLookAlike", Framing::Loas, Framing::Adts, 0, 50,
-                   "LOAS supect count"}),
+// clang-format off
+INSTANTIATE_TEST_SUITE_P(Framings, AACSwitchTest, ::testing::Values(
+    // One ADTS-looking record is enough once 26 errors are counted.
+    SwitchCase{"AdtsOpenedAsLoas", Framing::Adts, Framing::Loas, 1, 26, "ADTS supect count"},
+    SwitchCase{"AdtsOpenedAsLoasOneLookAlike", Framing::Adts, Framing::Loas, 30, 26, "ADTS supect count"},
+    SwitchCase{"AdtsOpenedAsLoasNoLookAlike", Framing::Adts, Framing::Loas, 0, 50, "ADTS supect count"},
+    // Ten LOAS-looking records are needed when decoding ADTS.
+    SwitchCase{"LoasOpenedAsAdts", Framing::Loas, Framing::Adts, 1, 26, "LOAS supect count"},
+    SwitchCase{"LoasOpenedAsAdtsEveryThird", Framing::Loas, Framing::Adts, 3, 28, "LOAS supect count"},
+    SwitchCase{"LoasOpenedAsAdtsNoLookAlike", Framing::Loas, Framing::Adts, 0, 50, "LOAS supect count"}),
     [](const auto& info) { return info.param.name; });
+// clang-format on
 
 // After the first configuration nothing switches any more, whatever comes.
 TEST_F(AACExtractorTest, NoSwitchAfterTheFirstConfiguration) {
@@ -223,28 +239,19 @@ TEST_F(AACExtractorTest, NoSwitchAfterTheFirstConfiguration) {
 // ---- PTS ------------------------------------------------------------------------------
 
 TEST_F(AACExtractorTest, UnitEndingInTheNextRecordKeepsTheEarlierPts) {
+    // Record A: frames 0, 1 and half of 2; record B: the rest, at an unrelated PTS.
     const Stream s = makeStream(Framing::Loas, 5);
-    std::vector<uint8_t> a;
-    for (int i = 0; i < 2; ++i) {
-        a.insert(a.end(), s.frames[i].begin(), s.frames[i].end());
-    }
-    const size_t half = s.frames[2].size() / 2;
-    a.insert(a.end(), s.frames[2].begin(), s.frames[2].begin() + static_cast<long>(half));
-    std::vector<uint8_t> b(s.frames[2].begin() + static_cast<long>(half), s.frames[2].end());
-    b.insert(b.end(), s.frames[3].begin(), s.frames[3].end());
-    b.insert(b.end(), s.frames[4].begin(), s.frames[4].end());
-    constexpr uint64_t kPtsA = 100000;
-    constexpr uint64_t kPtsB = 777777;  // deliberately unrelated to kPtsA
-    ASSERT_TRUE(test::writePesRecord(*mRing, a, kPtsA, 0xC0));
-    ASSERT_TRUE(test::writePesRecord(*mRing, b, kPtsB, 0xC0));
+    const size_t cut = s.frames[0].size() + s.frames[1].size() + s.frames[2].size() / 2;
+    constexpr long long kPtsA = 100000;
+    constexpr long long kPtsB = 777777;
+    writeChunks(
+        test::cutAt(test::joinEs(test::groupCuts(s.frames, 1, 0, 0)), {0, cut}, {kPtsA, kPtsB}));
     const auto units = extract(AACMediaExtractor::TRANSPORT_LAYER_LOAS);
     ASSERT_EQ(4u, units.size());
-    EXPECT_EQ(s.units[1], units[1].bytes);
-    EXPECT_EQ(static_cast<long long>(kPtsA + kTicksPerFrame48k), units[1].pts);
-    EXPECT_EQ(s.units[2], units[2].bytes);
-    EXPECT_EQ(static_cast<long long>(kPtsA + 2 * kTicksPerFrame48k), units[2].pts);
-    EXPECT_EQ(s.units[3], units[3].bytes);
-    EXPECT_EQ(static_cast<long long>(kPtsB), units[3].pts);
+    EXPECT_EQ((std::vector<ExtractedUnit>{{s.units[1], kPtsA + kTicksPerFrame48k, 0},
+                                          {s.units[2], kPtsA + 2 * kTicksPerFrame48k, 0},
+                                          {s.units[3], kPtsB, 0}}),
+              std::vector<ExtractedUnit>(units.begin() + 1, units.end()));
 }
 
 // One frame per PES: each unit carries its own record's PTS although every frame is
@@ -262,10 +269,9 @@ TEST_F(AACExtractorTest, OneFramePerPesGivesEachUnitItsRecordsPts) {
 
 TEST_F(AACExtractorTest, FrameDurationFollowsTheReportedConfiguration) {
     // HE-AAC, core 24 kHz: 1024 core samples last 3840 ticks.
-    LoasOptions o;
-    o.asc.hierarchicalExtension = 5;
-    o.asc.samplingFrequencyIndex = 6;
-    o.asc.extensionSamplingFrequencyIndex = 3;
+    const LoasOptions o{.asc = {.samplingFrequencyIndex = 6,
+                                .hierarchicalExtension = 5,
+                                .extensionSamplingFrequencyIndex = 3}};
     std::vector<uint8_t> record;
     for (uint32_t i = 0; i < 4; ++i) {
         const auto f = loasFrame(o, {patternPayload(50, i)});
@@ -278,50 +284,6 @@ TEST_F(AACExtractorTest, FrameDurationFollowsTheReportedConfiguration) {
     EXPECT_EQ(5000 + 3840, units[1].pts);
     EXPECT_EQ(5000 + 2 * 3840, units[2].pts);
 }
-
-// ---- re-segmentation and golden dumps ----------------------------------------------
-
-class AACResegmentTest : public AACExtractorTest, public ::testing::WithParamInterface<Framing> {
-protected:
-    std::vector<ExtractedUnit> unitsOf(const std::vector<PesChunk>& records) {
-        mRing->reset();
-        for (const auto& record : records) {
-            EXPECT_TRUE(test::writePesRecord(*mRing, record.es, record.pts, 0xC0));
-        }
-        return extract(GetParam());
-    }
-};
-
-TEST_P(AACResegmentTest, SameUnitsHoweverThePesAreCut) {
-    const Stream s = makeStream(GetParam(), 40);
-    const auto onePerPes = test::bytesOf(unitsOf(test::groupCuts(s.frames, 1, 0, 0)));
-    ASSERT_EQ(s.units.size() - 1, onePerPes.size());
-    EXPECT_EQ(kLcStereo48kAsc, onePerPes[0]);
-    for (size_t i = 1; i < onePerPes.size(); ++i) {
-        EXPECT_EQ(s.units[i], onePerPes[i]);
-    }
-    const auto es = test::joinEs(test::groupCuts(s.frames, 1, 0, 0));
-    for (size_t cut : {97, 13}) {
-        EXPECT_EQ(onePerPes, test::bytesOf(unitsOf(test::fixedCuts(es, cut, 0, 0)))) << cut;
-    }
-    EXPECT_EQ(onePerPes, test::bytesOf(unitsOf(test::groupCuts(s.frames, 3, 0, 0))));
-}
-
-// One line per unit (PTS, flags, size, hash) against a checked-in dump. Run with
-// TAVO_UPDATE_GOLDEN=1 to rewrite the dumps after an intended change.
-TEST_P(AACResegmentTest, MatchesGoldenDump) {
-    const Stream s = makeStream(GetParam(), 24);
-    const auto units = unitsOf(test::groupCuts(s.frames, 2, 90000, kTicksPerFrame48k));
-    EXPECT_EQ(
-        test::compareGolden(std::string("aac_") + (GetParam() == Framing::Loas ? "loas" : "adts") +
-                                "_two_per_pes.txt",
-                            test::goldenDump(units)),
-        "");
-}
-
-INSTANTIATE_TEST_SUITE_P(Framings, AACResegmentTest,
-                         ::testing::Values(Framing::Loas, Framing::Adts),
-                         [](const auto& info) { return nameOf(info.param); });
 
 // ---- a writer thread on the other side ----------------------------------------------
 
@@ -378,10 +340,7 @@ TEST_F(AACExtractorTest, CorruptFramesAreDroppedAndTheStreamGoesOn) {
     records[9][3] = 0xFF;                      // mux element garbage
     writeRecords(records, 0, kTicksPerFrame48k);
     const auto units = extract(AACMediaExtractor::TRANSPORT_LAYER_LOAS);
-    std::vector<std::vector<uint8_t>> audio;
-    for (size_t i = 1; i < units.size(); ++i) {
-        audio.push_back(units[i].bytes);
-    }
+    const auto audio = test::bytesOf({units.begin() + 1, units.end()});
     // Every intact frame after the configuration comes out, in order.
     std::vector<std::vector<uint8_t>> intact;
     for (size_t i = 1; i + 1 < s.units.size(); ++i) {

@@ -24,21 +24,17 @@ struct AscCase {
     uint32_t extSf;
     std::vector<uint8_t> expected;  // all 10 bytes
 };
+void PrintTo(const AscCase& c, std::ostream* os) {
+    *os << c.name;
+}
 
 std::vector<AscCase> ascCases() {
+    // clang-format off
     return {
         // 00010 0011 0010 -> 11 90
         {"LcAt48kStereo", 2, 3, 48000, 2, -1, 0, 0, {0x11, 0x90, 0, 0, 0, 0, 0, 0, 0, 0}},
         // 00101 0110 0010 0011 00010 -> 2B 11 88
-        {"HeAacCore24kExtension48k",
-         2,
-         6,
-         24000,
-         2,
-         5,
-         3,
-         48000,
-         {0x2B, 0x11, 0x88, 0, 0, 0, 0, 0, 0, 0}},
+        {"HeAacCore24kExtension48k", 2, 6, 24000, 2, 5, 3, 48000, {0x2B, 0x11, 0x88, 0, 0, 0, 0, 0, 0, 0}},
         // 00010 0100 0001 -> 12 08 (the ExoPlayer ADTS sample: 44.1 kHz mono)
         {"LcAt44kMono", 2, 4, 44100, 1, -1, 0, 0, {0x12, 0x08, 0, 0, 0, 0, 0, 0, 0, 0}},
         // 5.1 at 48 kHz: 00010 0011 0110 -> 11 B0
@@ -49,16 +45,9 @@ std::vector<AscCase> ascCases() {
         {"EscapedObjectType", 42, 3, 48000, 2, -1, 0, 0, {0xF9, 0x46, 0x40, 0, 0, 0, 0, 0, 0, 0}},
         // Index 15 carries the frequency in 24 bits: 00010 1111 0x00BB80 0010
         // -> 00010111 10000000 01011101 11000000 00010... = 17 80 5D C0 10
-        {"ExplicitFrequency",
-         2,
-         15,
-         48000,
-         2,
-         -1,
-         0,
-         0,
-         {0x17, 0x80, 0x5D, 0xC0, 0x10, 0, 0, 0, 0, 0}},
+        {"ExplicitFrequency", 2, 15, 48000, 2, -1, 0, 0, {0x17, 0x80, 0x5D, 0xC0, 0x10, 0, 0, 0, 0, 0}},
     };
+    // clang-format on
 }
 
 class ASCParserBytesTest : public ::testing::TestWithParam<AscCase> {};

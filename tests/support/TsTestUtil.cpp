@@ -82,12 +82,7 @@ std::optional<PesRecord> readRecord(RingBuffer& ring, std::chrono::milliseconds 
         return std::nullopt;
     const uint8_t* at = ring.readPointer();
     PesRecord r{};
-    memcpy(&r.type, at + 8, 4);
-    memcpy(&r.size, at + 12, 4);
-    memcpy(&r.pts, at + 16, 8);
-    memcpy(&r.dts, at + 24, 8);
-    memcpy(&r.offsetES, at + 32, 4);
-    memcpy(&r.sizeES, at + 36, 4);
+    memcpy(static_cast<PesRecordHeader*>(&r), at, sizeof(PesRecordHeader));
     if (r.size < 40 || r.size > ring.usedSpace()) {
         ring.abortRead();
         return std::nullopt;
@@ -106,22 +101,6 @@ std::vector<PesRecord> drainRecords(RingBuffer& ring) {
         records.push_back(std::move(*r));
     }
     return records;
-}
-
-void RecordingErrorListener::onError(unsigned int code, const Module*) const {
-    std::lock_guard<std::mutex> lock(mMutex);
-    mCodes.push_back(code);
-    mCondition.notify_all();
-}
-
-bool RecordingErrorListener::waitForError(std::chrono::milliseconds deadline) const {
-    std::unique_lock<std::mutex> lock(mMutex);
-    return mCondition.wait_for(lock, deadline, [this] { return !mCodes.empty(); });
-}
-
-std::vector<unsigned int> RecordingErrorListener::codes() const {
-    std::lock_guard<std::mutex> lock(mMutex);
-    return mCodes;
 }
 
 std::string runCommand(const std::string& command, bool* ok) {

@@ -18,8 +18,6 @@
 
 #include <utils/StrongPointer.h>
 
-#include "common/ErrorListener.h"
-#include "common/Module.h"
 #include "common/RingBuffer.h"
 #include "support/TsPacketBuilder.h"
 
@@ -40,14 +38,19 @@ bool waitConsumed(RingBuffer& ring);
 // True when a writer can take the ring's writer lock: whoever held it released it.
 bool writerLockFree(RingBuffer& ring);
 
-// A PESData record as read from a ring, field by field at its documented offsets.
-struct PesRecord {
+// A PESData record as read from a ring: its 40-byte header as laid out there (the
+// first 8 bytes are the record's own bookkeeping), then the PES bytes.
+struct PesRecordHeader {
+    uint64_t reserved;
     uint32_t type;
     uint32_t size;
     uint64_t pts;
     uint64_t dts;
     uint32_t offsetES;
     uint32_t sizeES;
+};
+static_assert(sizeof(PesRecordHeader) == 40);
+struct PesRecord : PesRecordHeader {
     std::vector<uint8_t> pes;  // bytes 40 .. size
 
     std::vector<uint8_t> es() const {
@@ -61,18 +64,6 @@ std::optional<PesRecord> readRecord(RingBuffer& ring,
                                     std::chrono::milliseconds deadline = kDeadline);
 // Every record readable now, consumed.
 std::vector<PesRecord> drainRecords(RingBuffer& ring);
-
-class RecordingErrorListener : public ErrorListener {
-public:
-    void onError(unsigned int code, const Module* module) const override;
-    bool waitForError(std::chrono::milliseconds deadline = kDeadline) const;
-    std::vector<unsigned int> codes() const;
-
-private:
-    mutable std::mutex mMutex;
-    mutable std::condition_variable mCondition;
-    mutable std::vector<unsigned int> mCodes;
-};
 
 // Runs a shell command and returns its standard output; `ok` tells whether it
 // exited with status 0.

@@ -52,20 +52,15 @@ bool writePesRecord(RingBuffer& ring, const uint8_t* es, size_t esSize, uint64_t
     uint8_t* pes = at + PESData::kHeaderSize;
     const uint32_t packetLength = pesSize > 6 + 0xFFFF ? 0 : pesSize - 6;
     const uint64_t p = record->mPTS;
-    const uint8_t header[kPesHeader] = {0x00,
-                                        0x00,
-                                        0x01,
-                                        streamId,
-                                        static_cast<uint8_t>(packetLength >> 8),
-                                        static_cast<uint8_t>(packetLength),
-                                        0x80,
-                                        0x80,
-                                        0x05,
-                                        static_cast<uint8_t>(0x21 | ((p >> 29) & 0x0E)),
-                                        static_cast<uint8_t>(p >> 22),
-                                        static_cast<uint8_t>(((p >> 14) & 0xFE) | 1),
-                                        static_cast<uint8_t>(p >> 7),
-                                        static_cast<uint8_t>(((p << 1) & 0xFE) | 1)};
+    // clang-format off
+    const uint8_t header[kPesHeader] = {
+        0x00, 0x00, 0x01, streamId,
+        static_cast<uint8_t>(packetLength >> 8), static_cast<uint8_t>(packetLength),
+        0x80, 0x80, 0x05,
+        static_cast<uint8_t>(0x21 | ((p >> 29) & 0x0E)), static_cast<uint8_t>(p >> 22),
+        static_cast<uint8_t>(((p >> 14) & 0xFE) | 1), static_cast<uint8_t>(p >> 7),
+        static_cast<uint8_t>(((p << 1) & 0xFE) | 1)};
+    // clang-format on
     std::memcpy(pes, header, kPesHeader);
     if (esSize > 0) {
         std::memcpy(pes + kPesHeader, es, esSize);
@@ -144,6 +139,20 @@ std::vector<Bytes> bytesOf(const std::vector<ExtractedUnit>& units) {
         out.push_back(unit.bytes);
     }
     return out;
+}
+
+std::string firstDifference(const std::vector<ExtractedUnit>& got,
+                            const std::vector<ExtractedUnit>& want) {
+    const auto [g, w] = std::mismatch(got.begin(), got.end(), want.begin(), want.end());
+    if (g == got.end() && w == want.end()) {
+        return {};
+    }
+    const auto describe = [](auto it, const auto& units) {
+        return it == units.end() ? std::string("<none>") : goldenDump({*it});
+    };
+    return "unit " + std::to_string(g - got.begin()) + " of " + std::to_string(got.size()) +
+           " (want " + std::to_string(want.size()) + "): got " + describe(g, got) + " want " +
+           describe(w, want);
 }
 
 unsigned int pullUnit(MediaExtractor& extractor, Bytes& out, std::vector<ExtractedUnit>* units) {
@@ -368,6 +377,7 @@ std::string compareGolden(const std::string& name, const std::string& dump) {
     if (expected == dump) {
         return {};
     }
+    // They differ somewhere: name the first line that does (or the end of either).
     std::istringstream want(expected);
     std::istringstream got(dump);
     std::string wantLine;
@@ -375,16 +385,12 @@ std::string compareGolden(const std::string& name, const std::string& dump) {
     for (size_t line = 1;; ++line) {
         const bool haveWant = static_cast<bool>(std::getline(want, wantLine));
         const bool haveGot = static_cast<bool>(std::getline(got, gotLine));
-        if (!haveWant && !haveGot) {
-            break;
-        }
         if (!haveWant || !haveGot || wantLine != gotLine) {
             return path + " line " + std::to_string(line) + ": expected \"" +
                    (haveWant ? wantLine : "<end>") + "\", got \"" + (haveGot ? gotLine : "<end>") +
                    "\"";
         }
     }
-    return "differs from " + path;
 }
 
 std::string sampleStream(const std::string& name) {

@@ -78,6 +78,10 @@ struct ExtractedUnit {
 };
 std::vector<Bytes> bytesOf(const std::vector<ExtractedUnit>& units);
 
+// Empty when `got` equals `want`, else which unit first differs and how.
+std::string firstDifference(const std::vector<ExtractedUnit>& got,
+                            const std::vector<ExtractedUnit>& want);
+
 // One getDecodableUnit call into `out`; a delivered unit is appended to *units.
 unsigned int pullUnit(MediaExtractor& extractor, Bytes& out, std::vector<ExtractedUnit>* units);
 

@@ -31,7 +31,7 @@ struct SinglePacketCase {
     uint32_t result;
     int payloadOffset;  // -1: not checked (no payload reported)
     uint32_t payloadLength;
-    const char* message;  // expected log fragment, or null
+    const char* message = nullptr;  // expected log fragment
 };
 void PrintTo(const SinglePacketCase& c, std::ostream* os) {
     *os << c.name;
@@ -60,41 +60,28 @@ TEST_P(TSPacketParserSinglePacketTest, ResultPayloadAndMessage) {
     }
 }
 
-INSTANTIATE_TEST_SUITE_P(
-    Codes, TSPacketParserSinglePacketTest,
-    ::testing::Values(
-        SinglePacketCase{"LostSync",
-                         TsPacketBuilder().syncByte(0x46).unitStart().payload({1}).build(), 65, -1,
-                         0, "parseHeader - sync byte not found!"},
-        SinglePacketCase{"TransportError",
-                         TsPacketBuilder().transportError().unitStart().payload({1}).build(), 129,
-                         -1, 0, "Transport error indicator is true - discarding packet."},
-        SinglePacketCase{
-            "AdaptationLength184",
-            TsPacketBuilder().unitStart().adaptationControl(2).rawAfterHeader({184}).build(), 255,
-            -1, 0, "parseHeader: Invalid adaptation field length: 184"},
-        SinglePacketCase{
-            "AdaptationLength255",
-            TsPacketBuilder().unitStart().adaptationControl(3).rawAfterHeader({255, 0xFF}).build(),
-            255, -1, 0, "Invalid adaptation field length: 255"},
-        SinglePacketCase{
-            "ControlZero",
-            TsPacketBuilder().unitStart().adaptationControl(0).payload(ramp(184, 0)).build(), 1, -1,
-            0, nullptr},
-        SinglePacketCase{"NoUnitStartYet", TsPacketBuilder().payload(ramp(184, 0)).build(), 8, -1,
-                         0, nullptr},
-        SinglePacketCase{"FirstStartPayloadOnly",
-                         TsPacketBuilder().unitStart().payload(ramp(184, 0)).build(), 2, 4, 184,
-                         nullptr},
-        SinglePacketCase{"FirstStartWithAdaptation",
-                         TsPacketBuilder().unitStart().randomAccess().payload(ramp(100, 0)).build(),
-                         2, 88, 100, nullptr},
-        SinglePacketCase{"FirstStartAdaptationOnly",
-                         TsPacketBuilder().unitStart().pcr(1234).build(), 2, 0, 0, nullptr},
-        SinglePacketCase{"OneStuffingByte",
-                         TsPacketBuilder().unitStart().payload(ramp(183, 0)).build(), 2, 5, 183,
-                         nullptr}),
-    [](const auto& info) { return std::string(info.param.name); });
+TsPacketBuilder start() {
+    return TsPacketBuilder().unitStart();
+}
+
+const SinglePacketCase kSinglePackets[] = {
+    {"LostSync", start().syncByte(0x46).payload({1}).build(), 65, -1, 0,
+     "parseHeader - sync byte not found!"},
+    {"TransportError", start().transportError().payload({1}).build(), 129, -1, 0,
+     "Transport error indicator is true - discarding packet."},
+    {"AdaptationLength184", start().adaptationControl(2).rawAfterHeader({184}).build(), 255, -1, 0,
+     "parseHeader: Invalid adaptation field length: 184"},
+    {"AdaptationLength255", start().adaptationControl(3).rawAfterHeader({255, 0xFF}).build(), 255,
+     -1, 0, "Invalid adaptation field length: 255"},
+    {"ControlZero", start().adaptationControl(0).payload(ramp(184)).build(), 1, -1, 0, nullptr},
+    {"NoUnitStartYet", TsPacketBuilder().payload(ramp(184)).build(), 8, -1, 0, nullptr},
+    {"FirstStartPayloadOnly", start().payload(ramp(184)).build(), 2, 4, 184, nullptr},
+    {"FirstStartWithAdaptation", start().randomAccess().payload(ramp(100)).build(), 2, 88, 100},
+    {"FirstStartAdaptationOnly", start().pcr(1234).build(), 2, 0, 0, nullptr},
+    {"OneStuffingByte", start().payload(ramp(183)).build(), 2, 5, 183, nullptr},
+};
+INSTANTIATE_TEST_SUITE_P(Codes, TSPacketParserSinglePacketTest, ::testing::ValuesIn(kSinglePackets),
+                         [](const auto& info) { return std::string(info.param.name); });
 
 TEST(TSPacketParserNullTest, NullParametersAreErrors) {
     TraceCapture trace;
@@ -119,8 +106,8 @@ struct Step {
 
 struct SequenceCase {
     const char* name;
-    std::vector<Step> steps;
     size_t continuityErrors;
+    std::vector<Step> steps;
     const char* message = nullptr;  // expected in full, or null
 };
 void PrintTo(const SequenceCase& c, std::ostream* os) {
@@ -156,45 +143,27 @@ TEST_P(TSPacketParserSequenceTest, ResultsFollowTheCounter) {
     }
 }
 
-INSTANTIATE_TEST_SUITE_P(
-    Counters, TSPacketParserSequenceTest,
-    ::testing::Values(
-        SequenceCase{"WrapFifteenToZero",
-                     {{14, true, 1, kPayload}, {15, false, 1, kPayload}, {0, false, 1, kPayload}},
-                     0},
-        SequenceCase{"RepeatedCounterIsError",
-                     {{14, true, 1, kPayload}, {14, false, 1, kError}, {15, false, 1, kSkip}},
-                     1,
-                     "parse - [PID = 273] continuity error! Discarding entire PES packet "
-                     "(expected 0x0F, received 0x0E)"},
-        SequenceCase{"GapIsErrorThenSkipUntilStart",
-                     {{3, true, 1, kPayload},
-                      {5, false, 1, kError},
-                      {6, false, 1, kSkip},
-                      {7, true, 1, kPayload},
-                      {8, false, 1, kPayload}},
-                     1},
-        SequenceCase{"AdaptationOnlyDoesNotAdvance",
-                     {{3, true, 1, kPayload},
-                      {3, false, 2, kPayload},
-                      {3, false, 2, kPayload},
-                      {4, false, 3, kPayload}},
-                     0},
-        SequenceCase{"AdaptationOnlyWithNextCounterIsError",
-                     {{3, true, 1, kPayload}, {4, false, 2, kError}},
-                     1},
-        SequenceCase{
-            "SecondStartIsNewPES", {{5, true, 1, kPayload}, {6, true, 1, kPayload | kNewPES}}, 0},
-        SequenceCase{"StartAfterGapRestarts",
-                     {{5, true, 1, kPayload},
-                      {9, true, 1, kError | kPayload},
-                      {10, false, 1, kPayload},
-                      {11, true, 1, kPayload | kNewPES}},
-                     1},
-        SequenceCase{"SkipsBeforeFirstStart",
-                     {{0, false, 1, kSkip}, {1, false, 1, kSkip}, {2, true, 1, kPayload}},
-                     0}),
-    [](const auto& info) { return std::string(info.param.name); });
+// Steps are {counter, unit start, adaptation_field_control, result}.
+// clang-format off
+const SequenceCase kSequences[] = {
+    {"WrapFifteenToZero", 0, {{14, 1, 1, kPayload}, {15, 0, 1, kPayload}, {0, 0, 1, kPayload}}},
+    {"RepeatedCounterIsError", 1, {{14, 1, 1, kPayload}, {14, 0, 1, kError}, {15, 0, 1, kSkip}},
+     "parse - [PID = 273] continuity error! Discarding entire PES packet "
+     "(expected 0x0F, received 0x0E)"},
+    {"GapIsErrorThenSkipUntilStart", 1, {{3, 1, 1, kPayload}, {5, 0, 1, kError},
+                                         {6, 0, 1, kSkip}, {7, 1, 1, kPayload},
+                                         {8, 0, 1, kPayload}}},
+    {"AdaptationOnlyDoesNotAdvance", 0, {{3, 1, 1, kPayload}, {3, 0, 2, kPayload},
+                                         {3, 0, 2, kPayload}, {4, 0, 3, kPayload}}},
+    {"AdaptationOnlyWithNextCounterIsError", 1, {{3, 1, 1, kPayload}, {4, 0, 2, kError}}},
+    {"SecondStartIsNewPES", 0, {{5, 1, 1, kPayload}, {6, 1, 1, kPayload | kNewPES}}},
+    {"StartAfterGapRestarts", 1, {{5, 1, 1, kPayload}, {9, 1, 1, kError | kPayload},
+                                  {10, 0, 1, kPayload}, {11, 1, 1, kPayload | kNewPES}}},
+    {"SkipsBeforeFirstStart", 0, {{0, 0, 1, kSkip}, {1, 0, 1, kSkip}, {2, 1, 1, kPayload}}},
+};
+// clang-format on
+INSTANTIATE_TEST_SUITE_P(Counters, TSPacketParserSequenceTest, ::testing::ValuesIn(kSequences),
+                         [](const auto& info) { return std::string(info.param.name); });
 
 TEST(TSPacketParserContinuityTest, StartAfterGapKeepsPreviousPayload) {
     TraceCapture trace;

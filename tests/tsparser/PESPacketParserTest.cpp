@@ -7,8 +7,8 @@
 #include <vector>
 
 #include "support/PesBuilder.h"
-#include "support/TsPacketBuilder.h"
 #include "support/TraceCapture.h"
+#include "support/TsPacketBuilder.h"
 
 namespace TavoPlayer {
 namespace {
@@ -24,7 +24,7 @@ struct LayoutCase {
     std::vector<uint8_t> pes;
     uint32_t esOffset;
     bool optionalHeaderParsed;
-    const char* message;  // expected log fragment, or null
+    const char* message = nullptr;  // expected log fragment (else: nothing logged)
 };
 void PrintTo(const LayoutCase& c, std::ostream* os) {
     *os << c.name;
@@ -50,37 +50,32 @@ TEST_P(PESPacketParserLayoutTest, ElementaryStreamPosition) {
     }
 }
 
-INSTANTIATE_TEST_SUITE_P(
-    StreamIds, PESPacketParserLayoutTest,
-    ::testing::Values(
-        LayoutCase{"VideoPtsDts", PesBuilder(0xE0).pts(1).dts(2).payload(ramp(100)).build(), 19,
-                   true, nullptr},
-        LayoutCase{"VideoPtsOnly", PesBuilder(0xE3).pts(1).payload(ramp(100)).build(), 14, true,
-                   nullptr},
-        LayoutCase{"AudioNoTimes", PesBuilder(0xC0).payload(ramp(10)).build(), 9, true, nullptr},
-        LayoutCase{"AudioHighId", PesBuilder(0xDF).pts(5).payload(ramp(10)).build(), 14, true,
-                   nullptr},
-        LayoutCase{"PrivateStream1Captions", PesBuilder(0xBD).pts(5).payload(ramp(30)).build(), 14,
-                   true, nullptr},
-        LayoutCase{"PaddingAtByte6",
-                   PesBuilder(0xBE).noOptionalHeader().payload(ramp(50, 0xFF)).build(), 6, false,
-                   nullptr},
-        LayoutCase{"PrivateStream2AtByte6",
-                   PesBuilder(0xBF).noOptionalHeader().payload(ramp(50)).build(), 6, false,
-                   nullptr},
-        LayoutCase{"StuffingInHeader",
-                   PesBuilder(0xE0).pts(1).stuffing(7).payload(ramp(20)).build(), 21, true,
-                   nullptr},
-        // The header data length alone places the payload, whatever the flags say.
-        LayoutCase{"LengthWinsOverFlags",
-                   PesBuilder(0xE0).pts(1).dts(2).headerDataLength(3).payload(ramp(20)).build(), 12,
-                   true, nullptr},
-        LayoutCase{"BadStartBitsAccepted",
-                   PesBuilder(0xE0).byte6(0x40).pts(1).payload(ramp(20)).build(), 6, false,
-                   "parseOptHeader - bad optional header start bits!"},
-        LayoutCase{"TruncatedOptionalHeader", std::vector<uint8_t>{0, 0, 1, 0xE0, 0, 2, 0x80, 0x80},
-                   6, false, "truncated optional header"}),
-    [](const auto& info) { return std::string(info.param.name); });
+PesBuilder pes(uint8_t streamId) {
+    return PesBuilder(streamId);
+}
+
+const LayoutCase kLayouts[] = {
+    {"VideoPtsDts", pes(0xE0).pts(1).dts(2).payload(ramp(100)).build(), 19, true},
+    {"VideoPtsOnly", pes(0xE3).pts(1).payload(ramp(100)).build(), 14, true},
+    {"AudioNoTimes", pes(0xC0).payload(ramp(10)).build(), 9, true},
+    {"AudioHighId", pes(0xDF).pts(5).payload(ramp(10)).build(), 14, true},
+    {"PrivateStream1Captions", pes(0xBD).pts(5).payload(ramp(30)).build(), 14, true},
+    {"PaddingAtByte6", pes(0xBE).noOptionalHeader().payload(ramp(50, 0xFF)).build(), 6, false},
+    {"PrivateStream2AtByte6", pes(0xBF).noOptionalHeader().payload(ramp(50)).build(), 6, false},
+    {"StuffingInHeader", pes(0xE0).pts(1).stuffing(7).payload(ramp(20)).build(), 21, true},
+    // The header data length alone places the payload, whatever the flags say.
+    {"LengthWinsOverFlags", pes(0xE0).pts(1).dts(2).headerDataLength(3).payload(ramp(20)).build(),
+     12, true},
+    {"BadStartBitsAccepted", pes(0xE0).byte6(0x40).pts(1).payload(ramp(20)).build(), 6, false,
+     "parseOptHeader - bad optional header start bits!"},
+    {"TruncatedOptionalHeader",
+     {0, 0, 1, 0xE0, 0, 2, 0x80, 0x80},
+     6,
+     false,
+     "truncated optional header"},
+};
+INSTANTIATE_TEST_SUITE_P(StreamIds, PESPacketParserLayoutTest, ::testing::ValuesIn(kLayouts),
+                         [](const auto& info) { return std::string(info.param.name); });
 
 // --- time stamps ---------------------------------------------------------------------
 
@@ -121,21 +116,6 @@ TEST(PESPacketParserTimeTest, BuilderRoundTripAtBoundaries) {
             EXPECT_EQ(data.mPTSDTSFlags, 3);
         }
     }
-}
-
-TEST(PESPacketParserTimeTest, TimesOfEarlierPacketsAreKept) {
-    PESPacketParser parser;
-    PESParsedData data;
-    const auto first = PesBuilder(0xE0).pts(3000).dts(1000).payload({1}).build();
-    const auto second = PesBuilder(0xE0).payload({2}).build();
-    const auto third = PesBuilder(0xE0).pts(6000).payload({3}).build();
-    ASSERT_EQ(parser.parse(first.data(), first.size(), &data), 1u);
-    ASSERT_EQ(parser.parse(second.data(), second.size(), &data), 1u);
-    EXPECT_EQ(data.mPTS, 3000u);
-    EXPECT_EQ(data.mDTS, 1000u);
-    ASSERT_EQ(parser.parse(third.data(), third.size(), &data), 1u);
-    EXPECT_EQ(data.mPTS, 6000u);
-    EXPECT_EQ(data.mDTS, 1000u);
 }
 
 // --- the remaining optional fields ----------------------------------------------------

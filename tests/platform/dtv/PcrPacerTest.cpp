@@ -2,7 +2,8 @@
 
 #include <gtest/gtest.h>
 
-#include "support/TsTestUtil.h"
+#include <ostream>
+
 #include "support/TsPacketBuilder.h"
 
 namespace TavoPlayer {
@@ -108,6 +109,9 @@ struct JumpCase {
     bool discontinuity;
     int64_t secondDueMs;  // from the anchor, for a 4-packet segment of 40 ms before
 };
+void PrintTo(const JumpCase& c, std::ostream* os) {
+    *os << c.name;
+}
 
 class PcrPacerJumps : public ::testing::TestWithParam<JumpCase> {};
 

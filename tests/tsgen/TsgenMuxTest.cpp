@@ -30,7 +30,7 @@ TEST_F(TsgenMuxTest, PcrFollowsTheConstantRateAndItsInterval) {
     EXPECT_TRUE(pcrAnomalies(mTs, kMuxRate).empty());
     int64_t last = -1;
     size_t pcrCount = 0;
-    for (const auto& p : mTs.packets()) {
+    for (const auto& p : mTs.packets) {
         if (p.hasPcr) {
             ++pcrCount;
             EXPECT_EQ(p.pid, 0x111);
@@ -43,8 +43,8 @@ TEST_F(TsgenMuxTest, PcrFollowsTheConstantRateAndItsInterval) {
 }
 
 TEST_F(TsgenMuxTest, TablesComeFirstAndAtTheirPeriod) {
-    EXPECT_EQ(mTs.packets()[0].pid, 0x0000);
-    EXPECT_EQ(mTs.packets()[1].pid, 0x1000);
+    EXPECT_EQ(mTs.packets[0].pid, 0x0000);
+    EXPECT_EQ(mTs.packets[1].pid, 0x1000);
     const auto pats = mTs.packetsOf(0x0000);
     // 100 ms at 752 us per slot is 133 slots; the stream lasts about 3.8 s.
     for (size_t i = 1; i < pats.size(); ++i) {
@@ -67,7 +67,7 @@ TEST_F(TsgenMuxTest, VideoPesCarryOneAccessUnitWithDelimiterAndTimes) {
         // Fixed GOPs of 15: an IDR with its parameter sets, flagged as a random
         // access point in the adaptation field.
         EXPECT_TRUE(i % 15 != 0 || (has(5) && has(7) && has(8))) << "PES " << i;
-        EXPECT_TRUE(i % 15 != 0 || mTs.packets()[p.firstPacket].randomAccess) << "PES " << i;
+        EXPECT_TRUE(i % 15 != 0 || mTs.packets[p.firstPacket].randomAccess) << "PES " << i;
         pts.push_back(p.pts);
     }
     std::sort(pts.begin(), pts.end());
@@ -78,7 +78,7 @@ TEST_F(TsgenMuxTest, VideoPesCarryOneAccessUnitWithDelimiterAndTimes) {
 
 TEST_F(TsgenMuxTest, EveryPesArrivesBeforeItsDecodingTime) {
     // The receiver's clock at a packet is the PCR extrapolated along the rate.
-    const auto& packets = mTs.packets();
+    const auto& packets = mTs.packets;
     const auto pcr = std::find_if(packets.begin(), packets.end(), [](auto& p) { return p.hasPcr; });
     ASSERT_NE(pcr, packets.end());
     for (uint16_t pid : {0x111, 0x112, 0x130}) {

@@ -33,6 +33,11 @@ CommandResult runCommand(const std::string& command) {
             {errBytes.begin(), errBytes.end()}};
 }
 
+std::vector<uint8_t> readFile(const std::string& file) {
+    std::ifstream in(file, std::ios::binary);
+    return {std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>()};
+}
+
 std::vector<uint8_t> hex(const std::string& text) {
     std::istringstream in(text);
     std::vector<uint8_t> out;
@@ -47,52 +52,43 @@ bool contains(const std::vector<uint8_t>& bytes, const std::string& hexBytes) {
     return std::search(bytes.begin(), bytes.end(), part.begin(), part.end()) != bytes.end();
 }
 
-std::vector<uint8_t> readFile(const std::string& file) {
-    std::ifstream in(file, std::ios::binary);
-    return std::vector<uint8_t>(std::istreambuf_iterator<char>(in),
-                                std::istreambuf_iterator<char>());
-}
-
 std::string decodeErrors(const std::string& file) {
     return runCommand("ffmpeg -nostdin -v error -i '" + file + "' -f null -").err;
 }
 
 TsFile::TsFile(const std::vector<uint8_t>& bytes, size_t packetSize) {
-    mValid = !bytes.empty() && bytes.size() % packetSize == 0 && packetSize >= 188;
-    for (size_t off = 0; mValid && off < bytes.size(); off += packetSize) {
+    valid = !bytes.empty() && bytes.size() % packetSize == 0 && packetSize >= 188;
+    for (size_t off = 0; valid && off < bytes.size(); off += packetSize) {
+        // ISO/IEC 13818-1, 2.4.3.2 and 2.4.3.4: header, adaptation field, PCR.
         const uint8_t* p = bytes.data() + off;
         TsPacket t;
         t.position = off / packetSize;
-        t.tei = (p[1] & 0x80) != 0;
-        t.pusi = (p[1] & 0x40) != 0;
         t.pid = static_cast<uint16_t>(((p[1] & 0x1F) << 8) | p[2]);
         t.scrambling = p[3] >> 6;
         t.adaptationControl = (p[3] >> 4) & 3;
         t.cc = p[3] & 0x0F;
+        t.tei = (p[1] & 0x80) != 0;
+        t.pusi = (p[1] & 0x40) != 0;
         const uint8_t length = (t.adaptationControl & 2) ? p[4] : 0;
-        if (p[0] != 0x47 || length > 183) {
-            mValid = false;
-            break;
-        }
-        if ((t.adaptationControl & 2) && length > 0) {
+        valid = p[0] == 0x47 && length <= 183;
+        if (valid && length > 0) {
             t.discontinuity = (p[5] & 0x80) != 0;
             t.randomAccess = (p[5] & 0x40) != 0;
             t.hasPcr = (p[5] & 0x10) != 0;
             const uint64_t base = (uint64_t{p[6]} << 25) | (uint64_t{p[7]} << 17) |
                                   (uint64_t{p[8]} << 9) | (uint64_t{p[9]} << 1) | (p[10] >> 7);
-            t.pcr27 =
-                t.hasPcr ? static_cast<int64_t>(base * 300 + (((p[10] & 1U) << 8) | p[11])) : 0;
+            t.pcr27 = t.hasPcr ? int64_t(base * 300 + (((p[10] & 1U) << 8) | p[11])) : 0;
         }
-        if (t.adaptationControl & 1) {
+        if (valid && (t.adaptationControl & 1)) {
             t.payload.assign(p + ((t.adaptationControl & 2) ? 5 + length : 4), p + 188);
         }
-        mPackets.push_back(std::move(t));
+        packets.push_back(std::move(t));
     }
 }
 
 std::vector<const TsPacket*> TsFile::packetsOf(uint16_t pid) const {
     std::vector<const TsPacket*> out;
-    for (const auto& p : mPackets) {
+    for (const auto& p : packets) {
         if (p.pid == pid) {
             out.push_back(&p);
         }
@@ -113,17 +109,12 @@ void finishPes(const std::vector<uint8_t>& b, uint64_t first, std::vector<Pes>& 
     if (b.size() < 9 || b[0] != 0 || b[1] != 0 || b[2] != 1 || 9u + b[8] > b.size()) {
         return;
     }
-    Pes pes;
-    pes.firstPacket = first;
-    pes.streamId = b[3];
-    pes.hasPts = (b[7] & 0x80) != 0;
-    pes.hasDts = (b[7] >> 6) == 3;
-    pes.pts = pes.hasPts ? readTimestamp(&b[9]) : 0;
-    pes.dts = pes.hasDts ? readTimestamp(&b[14]) : 0;
     const size_t length = (b[4] << 8) | b[5];
     const size_t end = (length != 0 && 6 + length <= b.size()) ? 6 + length : b.size();
-    pes.payload.assign(b.begin() + 9 + b[8], b.begin() + static_cast<std::ptrdiff_t>(end));
-    out.push_back(std::move(pes));
+    const bool hasPts = (b[7] & 0x80) != 0, hasDts = (b[7] >> 6) == 3;
+    out.push_back({first, b[3], hasPts, hasDts, hasPts ? readTimestamp(&b[9]) : 0,
+                   hasDts ? readTimestamp(&b[14]) : 0,
+                   std::vector<uint8_t>(b.begin() + 9 + b[8], b.begin() + int64_t(end))});
 }
 
 }  // namespace
@@ -140,9 +131,7 @@ std::vector<Pes> TsFile::pesOf(uint16_t pid) const {
             bytes.clear();
             first = p;
         }
-        if (first != nullptr) {
-            bytes.insert(bytes.end(), p->payload.begin(), p->payload.end());
-        }
+        bytes.insert(bytes.end(), p->payload.begin(), p->payload.end());
     }
     if (first != nullptr) {
         finishPes(bytes, first->position, out);
@@ -150,23 +139,35 @@ std::vector<Pes> TsFile::pesOf(uint16_t pid) const {
     return out;
 }
 
-std::vector<size_t> TsFile::continuityErrors(uint16_t pid) const {
-    std::vector<size_t> errors;
-    const auto packets = packetsOf(pid);
-    for (size_t i = 1; i < packets.size(); ++i) {
-        // Packets without payload keep the counter; packets with payload advance it.
-        const uint8_t step = packets[i]->adaptationControl & 1;
-        if (packets[i]->cc != ((packets[i - 1]->cc + step) & 0x0F)) {
-            errors.push_back(i);
+PacketIndices TsFile::where(const std::function<bool(const TsPacket&)>& predicate) const {
+    PacketIndices out;
+    std::map<uint16_t, size_t> count;
+    for (const auto& p : packets) {
+        const size_t index = count[p.pid]++;
+        if (predicate(p)) {
+            out[p.pid].push_back(index);
         }
     }
-    return errors;
+    return out;
+}
+
+PacketIndices TsFile::continuityErrors() const {
+    std::map<uint16_t, uint8_t> last;
+    return where([&](const TsPacket& p) {
+        // Packets without payload keep the counter, packets with payload advance
+        // it; null packets have none to keep.
+        const auto it = last.find(p.pid);
+        const bool error = p.pid != 0x1FFF && it != last.end() &&
+                           p.cc != ((it->second + (p.adaptationControl & 1)) & 0x0F);
+        last[p.pid] = p.cc;
+        return error;
+    });
 }
 
 std::vector<std::pair<uint64_t, int64_t>> pcrAnomalies(const TsFile& ts, int64_t muxRate) {
     std::vector<std::pair<uint64_t, int64_t>> anomalies;
     const TsPacket* previous = nullptr;
-    for (const auto& p : ts.packets()) {
+    for (const auto& p : ts.packets) {
         if (p.hasPcr && previous != nullptr) {
             const int64_t slots = static_cast<int64_t>(p.position - previous->position);
             const int64_t excess = p.pcr27 - previous->pcr27 - slots * ticks27PerPacket(muxRate);
@@ -180,22 +181,22 @@ std::vector<std::pair<uint64_t, int64_t>> pcrAnomalies(const TsFile& ts, int64_t
 }
 
 ::testing::AssertionResult Generated::ok() const {
-    if (run.exitCode != 0 || !ts.valid()) {
+    if (run.exitCode != 0 || !ts.valid) {
         return ::testing::AssertionFailure()
                << "tsgen exit " << run.exitCode << ", " << bytes.size() << " bytes: " << run.err;
     }
     return ::testing::AssertionSuccess();
 }
 
-const Generated& tsgen(const std::string& args, size_t packetSize) {
+const Generated& tsgen(const std::string& args) {
     static std::map<std::string, std::unique_ptr<Generated>> made;
     auto& slot = made[args];
     if (!slot) {
         const std::string file = tempPath("gen" + std::to_string(made.size()) + ".ts");
         auto run = runCommand(std::string(TAVO_TSGEN_PATH) + " -o '" + file + "' " + args);
         auto bytes = readFile(file);
-        TsFile ts(bytes, packetSize);
-        slot.reset(new Generated{std::move(run), file, std::move(bytes), std::move(ts)});
+        const size_t packetSize = args.find("--packet-size 204") != std::string::npos ? 204 : 188;
+        slot.reset(new Generated{std::move(run), file, bytes, TsFile(bytes, packetSize)});
     }
     return *slot;
 }
@@ -207,9 +208,6 @@ std::map<std::string, std::string> ffprobe(const std::string& file) {
     for (std::string line; std::getline(lines, line);) {
         const auto eq = line.find('=');
         std::string key = line.substr(0, eq), value = line.substr(eq + 1);
-        if (eq == std::string::npos) {
-            continue;
-        }
         key = key.rfind("programs.program.0.", 0) == 0 ? "p." + key.substr(19) : key;
         key = key.rfind("streams.stream.", 0) == 0 ? key.substr(15) : key;
         const bool quoted = value.size() >= 2 && value.front() == '"' && value.back() == '"';

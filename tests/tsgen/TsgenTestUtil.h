@@ -5,6 +5,7 @@
 #include <gtest/gtest.h>
 
 #include <cstdint>
+#include <functional>
 #include <map>
 #include <string>
 #include <vector>
@@ -13,8 +14,7 @@ namespace TavoPlayer::test {
 
 struct CommandResult {
     int exitCode = -1;
-    std::string out;  // standard output, unless redirected in the command
-    std::string err;
+    std::string out, err;  // standard output (unless redirected) and standard error
 };
 
 CommandResult runCommand(const std::string& command);
@@ -30,14 +30,8 @@ std::string decodeErrors(const std::string& file);
 struct TsPacket {
     uint64_t position = 0;  // packet number in the file
     uint16_t pid = 0;
-    bool tei = false;
-    bool pusi = false;
-    uint8_t scrambling = 0;
-    uint8_t adaptationControl = 0;
-    uint8_t cc = 0;
-    bool hasPcr = false;
-    bool randomAccess = false;
-    bool discontinuity = false;
+    uint8_t scrambling = 0, adaptationControl = 0, cc = 0;
+    bool tei = false, pusi = false, hasPcr = false, randomAccess = false, discontinuity = false;
     int64_t pcr27 = 0;  // base * 300 + extension
     std::vector<uint8_t> payload;
 };
@@ -45,31 +39,28 @@ struct TsPacket {
 struct Pes {
     uint64_t firstPacket = 0;  // position of the packet that started it
     uint8_t streamId = 0;
-    bool hasPts = false;
-    bool hasDts = false;
-    int64_t pts = 0;
-    int64_t dts = 0;
+    bool hasPts = false, hasDts = false;
+    int64_t pts = 0, dts = 0;
     std::vector<uint8_t> payload;  // elementary stream bytes
 };
 
+// Per PID, the indices among that PID's packets where something holds.
+using PacketIndices = std::map<uint16_t, std::vector<size_t>>;
+
 // Reads 188-byte packets (or 204-byte ones, ignoring their last 16 bytes);
 // every packet must start with 0x47.
-class TsFile {
-public:
+struct TsFile {
     explicit TsFile(const std::vector<uint8_t>& bytes, size_t packetSize = 188);
-    bool valid() const { return mValid; }
-    const std::vector<TsPacket>& packets() const { return mPackets; }
     std::vector<const TsPacket*> packetsOf(uint16_t pid) const;
     // Whole PES packets of a PID (a PES ends where the next one starts; the
     // last one at the end of the file).
     std::vector<Pes> pesOf(uint16_t pid) const;
-    // Positions (index among the PID's packets) where the continuity counter
-    // does not follow ISO/IEC 13818-1, 2.4.3.3.
-    std::vector<size_t> continuityErrors(uint16_t pid) const;
+    PacketIndices where(const std::function<bool(const TsPacket&)>& predicate) const;
+    // Where the continuity counter does not follow ISO/IEC 13818-1, 2.4.3.3.
+    PacketIndices continuityErrors() const;
 
-private:
-    bool mValid = true;
-    std::vector<TsPacket> mPackets;
+    bool valid = true;
+    std::vector<TsPacket> packets;
 };
 
 // Time of one packet slot at a constant transport rate, in 27 MHz ticks.
@@ -81,7 +72,7 @@ constexpr int64_t ticks27PerPacket(int64_t muxRate) {
 std::vector<std::pair<uint64_t, int64_t>> pcrAnomalies(const TsFile& ts, int64_t muxRate);
 
 // tsgen's output for `args`, made once per test process and shared by the
-// tests that ask for the same arguments.
+// tests that ask for the same arguments; read as 204-byte packets where asked.
 struct Generated {
     CommandResult run;
     std::string file;
@@ -89,7 +80,7 @@ struct Generated {
     TsFile ts;
     ::testing::AssertionResult ok() const;
 };
-const Generated& tsgen(const std::string& args, size_t packetSize = 188);
+const Generated& tsgen(const std::string& args);
 
 // ffprobe's flat view of a file, keys shortened: "p." for the first programme,
 // "N." for stream N (e.g. "p.pcr_pid", "1.codec_name").

@@ -2,24 +2,6 @@
 
 namespace TavoPlayer::test {
 
-void BitSink::put(uint32_t value, unsigned int bits) {
-    for (unsigned int i = bits; i-- > 0;) {
-        if (mBits % 8 == 0) {
-            mBytes.push_back(0);
-        }
-        if (i < 32 && ((value >> i) & 1u)) {  // fields wider than 32 bits are zero-extended
-            mBytes.back() |= static_cast<uint8_t>(0x80u >> (mBits % 8));
-        }
-        ++mBits;
-    }
-}
-
-void BitSink::putBytes(const std::vector<uint8_t>& bytes) {
-    for (uint8_t b : bytes) {
-        put(b, 8);
-    }
-}
-
 void writeAsc(BitSink& sink, const AscFields& asc) {
     if (asc.hierarchicalExtension != 0) {
         sink.put(asc.hierarchicalExtension, 5);

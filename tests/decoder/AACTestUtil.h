@@ -7,25 +7,9 @@
 #include <cstdint>
 #include <vector>
 
+#include "PesRecordTestUtil.h"
+
 namespace TavoPlayer::test {
-
-// MSB-first writer of fields up to 32 bits into a growing byte vector.
-class BitSink {
-public:
-    void put(uint32_t value, unsigned int bits);
-    void putBytes(const std::vector<uint8_t>& bytes);
-    void align() {
-        while (mBits % 8 != 0) {
-            put(0, 1);
-        }
-    }
-    size_t bitCount() const { return mBits; }
-    const std::vector<uint8_t>& bytes() const { return mBytes; }
-
-private:
-    std::vector<uint8_t> mBytes;
-    size_t mBits = 0;
-};
 
 struct AscFields {
     uint32_t aot = 2;

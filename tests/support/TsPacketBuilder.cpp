@@ -26,20 +26,10 @@ TsPacket TsPacketBuilder::build() const {
     const bool anyField = mDiscontinuity || mRandomAccess || mPcr || mOpcr || mSplice || mPrivate;
     std::vector<uint8_t> field;
     if (anyField) {
-        uint8_t flags = 0;
-        if (mDiscontinuity)
-            flags |= 0x80;
-        if (mRandomAccess)
-            flags |= 0x40;
-        if (mPcr)
-            flags |= 0x10;
-        if (mOpcr)
-            flags |= 0x08;
-        if (mSplice)
-            flags |= 0x04;
-        if (mPrivate)
-            flags |= 0x02;
-        field.push_back(flags);
+        // ISO/IEC 13818-1, 2.4.3.4: the flags byte, then the parts in flag order.
+        field.push_back(static_cast<uint8_t>(mDiscontinuity << 7 | mRandomAccess << 6 |
+                                             mPcr.has_value() << 4 | mOpcr.has_value() << 3 |
+                                             mSplice.has_value() << 2 | mPrivate.has_value() << 1));
         if (mPcr)
             appendClock(&field, mPcr->first, mPcr->second);
         if (mOpcr)

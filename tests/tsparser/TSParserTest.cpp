@@ -79,8 +79,14 @@ protected:
     uint8_t counter = 0;
 };
 
-TEST_F(TSParserModuleTest, PesAcrossTenPacketsIsWrittenAtTheEleventh) {
-    startParser(TSParser::KIND_VIDEO);
+// The record reaches the first output and a copy every further one.
+TEST_F(TSParserModuleTest, PesAcrossTenPacketsIsWrittenAtTheEleventhToEveryOutput) {
+    auto second = makeRing("copy1", 1 << 16);
+    auto third = makeRing("copy2", 1 << 16);
+    create(TSParser::KIND_VIDEO);
+    parser->addOutput(second, nullptr);
+    parser->addOutput(third, nullptr);
+    ASSERT_EQ(parser->start(), 0u);
     // 19 header bytes + 1821 = 1840 = 10 x 184: exactly ten full packets.
     const auto first =
         PesBuilder(0xE0).pts(0x1ABCDEF01ull).dts(0x1ABCD0000ull).payload(ramp(1821)).build();
@@ -90,17 +96,19 @@ TEST_F(TSParserModuleTest, PesAcrossTenPacketsIsWrittenAtTheEleventh) {
     EXPECT_EQ(output->usedSpace(), 0u) << "nothing may be written before the next unit start";
 
     feedPes(PesBuilder(0xE0).pts(5).payload(ramp(10)).build());
-    auto record = readRecord(*output);
-    ASSERT_TRUE(record.has_value());
-    EXPECT_EQ(record->type, 0u);
-    EXPECT_EQ(record->size, 40u + 1840u);
-    EXPECT_EQ(record->pts, 0x1ABCDEF01ull);
-    EXPECT_EQ(record->dts, 0x1ABCD0000ull);
-    EXPECT_EQ(record->sizeES, 1821u);
-    EXPECT_EQ(record->offsetES, 40u + 19u);
-    EXPECT_EQ(record->pes, first);
-    EXPECT_EQ(record->es(), ramp(1821));
-    EXPECT_EQ(output->usedSpace(), 0u) << "exactly one record";
+    for (auto* ring : {output.get(), second.get(), third.get()}) {
+        auto record = readRecord(*ring);
+        ASSERT_TRUE(record.has_value()) << ring->name();
+        EXPECT_EQ(record->type, 0u);
+        EXPECT_EQ(record->size, 40u + 1840u);
+        EXPECT_EQ(record->pts, 0x1ABCDEF01ull);
+        EXPECT_EQ(record->dts, 0x1ABCD0000ull);
+        EXPECT_EQ(record->sizeES, 1821u);
+        EXPECT_EQ(record->offsetES, 40u + 19u);
+        EXPECT_EQ(record->pes, first) << ring->name();
+        EXPECT_EQ(record->es(), ramp(1821));
+        EXPECT_EQ(ring->usedSpace(), 0u) << "exactly one record";
+    }
     EXPECT_TRUE(clock->isValid(Synchronization::Video));
     EXPECT_FALSE(clock->isValid(Synchronization::Audio));
 }
@@ -248,8 +256,9 @@ TEST_F(TSParserModuleTest, RandomInputThenCleanStream) {
 
 // --- batches and the clock -----------------------------------------------------------
 
-TEST_F(TSParserModuleTest, PartialPacketIsConsumedWithTheBatch) {
+TEST_F(TSParserModuleTest, PcrParserFeedsTheLastPcrOncePerBatch) {
     startParser(TSParser::KIND_PCR, false);
+    // A batch that ends in a partial packet is consumed whole.
     auto bytes = concatPackets({TsPacketBuilder().pid(0x100).unitStart().pcr(900000).build()});
     bytes.resize(375, 0x47);
     ASSERT_TRUE(writeAll(*input, bytes));
@@ -258,10 +267,7 @@ TEST_F(TSParserModuleTest, PartialPacketIsConsumedWithTheBatch) {
     EXPECT_EQ(input->head(), 376u);
     EXPECT_TRUE(clock->isValid(Synchronization::RealPCR));
     EXPECT_EQ(trace.count("Setting PCR: 900000 "), 1u) << trace.all();
-}
 
-TEST_F(TSParserModuleTest, PcrParserFeedsTheLastPcrOncePerBatch) {
-    startParser(TSParser::KIND_PCR, false);
     std::vector<TsPacket> batch;
     // 10 s apart: each would re-base the clock if it were fed on its own.
     for (uint8_t i = 0; i < 5; ++i)
@@ -272,12 +278,12 @@ TEST_F(TSParserModuleTest, PcrParserFeedsTheLastPcrOncePerBatch) {
                             .pcr(900000ull * (i + 1))
                             .build());
     feed(batch);
-    EXPECT_EQ(trace.count("(Real PCR)"), 1u) << trace.all();
+    EXPECT_EQ(trace.count("(Real PCR)"), 2u) << trace.all();
     EXPECT_EQ(trace.count("Setting PCR: 4500000 "), 1u) << trace.all();
 
     feed({TsPacketBuilder().pid(0x100).continuity(5).unitStart().pcr(90000000).build(),
           TsPacketBuilder().pid(0x100).continuity(6).payload(ramp(184)).build()});
-    EXPECT_EQ(trace.count("(Real PCR)"), 2u) << trace.all();
+    EXPECT_EQ(trace.count("(Real PCR)"), 3u) << trace.all();
     EXPECT_EQ(trace.count("Setting PCR: 90000000 "), 1u) << trace.all();
     EXPECT_EQ(output->usedSpace(), 0u);
 }
@@ -303,26 +309,6 @@ TEST_F(TSParserModuleTest, AudioPtsIsNotifiedOnlyWithTheFlag) {
 }
 
 // --- further outputs ---------------------------------------------------------------
-
-TEST_F(TSParserModuleTest, CopiesReachEveryOutput) {
-    auto second = makeRing("copy1", 1 << 16);
-    auto third = makeRing("copy2", 1 << 16);
-    create(TSParser::KIND_VIDEO);
-    parser->addOutput(second, nullptr);
-    parser->addOutput(third, nullptr);
-    ASSERT_EQ(parser->start(), 0u);
-    const auto unit = PesBuilder(0xE0).pts(77).dts(70).payload(ramp(999)).build();
-    feedPes(unit);
-    feedPes(PesBuilder(0xE0).pts(1).payload(ramp(3)).build());
-    for (auto* ring : {output.get(), second.get(), third.get()}) {
-        auto r = readRecord(*ring);
-        ASSERT_TRUE(r.has_value()) << ring->name();
-        EXPECT_EQ(r->pes, unit) << ring->name();
-        EXPECT_EQ(r->pts, 77u);
-        EXPECT_EQ(r->dts, 70u);
-        EXPECT_EQ(r->sizeES, 999u);
-    }
-}
 
 TEST_F(TSParserModuleTest, CopyToOtherOutputsReportsAFullOne) {
     auto roomy = makeRing("roomy", 1 << 16);

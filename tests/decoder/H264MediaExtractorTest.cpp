@@ -173,6 +173,9 @@ Bytes spsRbsp(const SpsParams& p) {
     return r.bytes();
 }
 
+Bytes spsNal(const SpsParams& p = {}) {
+    return nal(0x67, spsRbsp(p));
+}
 Bytes aud() {
     return nal(0x09, Rbsp().u(3, 7).bytes());
 }
@@ -524,10 +527,14 @@ TEST_F(H264SeiTest, NoTimingIsInvalid) {
 
 class H264AccessUnitTest : public H264Fixture {};
 
+using Units = std::vector<ExtractedUnit>;
+constexpr unsigned char kIdrSps = H264MediaExtractor::kFlagIdr | H264MediaExtractor::kFlagSps;
+const SpsParams kInterlaced{
+    .heightMapUnits = 34, .frameMbsOnly = false, .cropBottom = 2, .picStructPresent = true};
+
 TEST_F(H264AccessUnitTest, DelimiterSplitsRecordIntoTwoUnits) {
-    SpsParams p{.picStructPresent = true};
-    const Bytes first =
-        concat({aud(), nal(0x67, spsRbsp(p)), pps(), picTimingSei(0), slice(0x65, 0, true)});
+    const Bytes first = concat(
+        {aud(), spsNal({.picStructPresent = true}), pps(), picTimingSei(0), slice(0x65, 0, true)});
     const Bytes second = concat({aud(), slice(0x41, 0, true)});
     const Bytes es = concat({first, second});
     ASSERT_TRUE(test::writePesRecord(*mRing, es, 90000));
@@ -535,9 +542,7 @@ TEST_F(H264AccessUnitTest, DelimiterSplitsRecordIntoTwoUnits) {
     ASSERT_EQ(test::pullUnit(*mExtractor, mOut, &units), 0u);
     EXPECT_EQ(mRing->tail(), 0u);  // the record is still in use
     // The first unit has the leading zero of its 4-byte start code.
-    EXPECT_EQ(units,
-              (std::vector<ExtractedUnit>{
-                  {first, 90000, H264MediaExtractor::kFlagIdr | H264MediaExtractor::kFlagSps}}));
+    EXPECT_EQ(units, (Units{{first, 90000, kIdrSps}}));
     unsigned long length = 0;
     long long pts = 0;
     unsigned char flags = 0xFF;  // must be written, not left as it was
@@ -549,141 +554,92 @@ TEST_F(H264AccessUnitTest, DelimiterSplitsRecordIntoTwoUnits) {
 }
 
 TEST_F(H264AccessUnitTest, NothingIsOutputBeforeTheFirstSps) {
-    SpsParams p;
     const Bytes withoutSps = concat({aud(), slice(0x41, 0)});
-    const Bytes withSps = concat({aud(), nal(0x67, spsRbsp(p)), slice(0x65, 0)});
-    const auto units = run({{withoutSps, 100}, {withoutSps, 200}, {withSps, 300}});
-    ASSERT_EQ(units.size(), 1u);
-    EXPECT_EQ(units[0].bytes, withSps);
-    EXPECT_EQ(units[0].pts, 300);
+    const Bytes withSps = concat({aud(), spsNal(), slice(0x65, 0)});
+    EXPECT_EQ(run({{withoutSps, 100}, {withoutSps, 200}, {withSps, 300}}),
+              (Units{{withSps, 300, kIdrSps}}));
 }
 
+// Without VUI the SPS fails (no SPS flag) and slices never delimit: the first record is
+// one unit; in the next, the unit runs from the first AUD to the payload end.
 TEST_F(H264AccessUnitTest, SpsWithoutVuiDelimitsOnlyByRecord) {
     test::TraceCapture trace;
-    SpsParams p{.vui = false};
     const Bytes first =
-        concat({aud(), nal(0x67, spsRbsp(p)), slice(0x65, 0), aud(), slice(0x41, 0)});
-    const Bytes next = concat({slice(0x41, 0), aud(), slice(0x41, 0)});
-    const auto units = run({{first, 1000}, {next, 4000}});
-    ASSERT_EQ(units.size(), 2u);
-    EXPECT_EQ(units[0].bytes, first);  // the whole record: slices never delimit
-    EXPECT_EQ(units[0].pts, 1000);
-    EXPECT_EQ(units[0].flags, H264MediaExtractor::kFlagIdr);  // the SPS failed: no flag 16
-    // From the first AUD to the payload end, with the record's own PTS.
-    EXPECT_EQ(units[1].bytes,
-              Bytes(next.begin() + static_cast<long>(slice(0x41, 0).size()), next.end()));
-    EXPECT_EQ(units[1].pts, 4000);
+        concat({aud(), spsNal({.vui = false}), slice(0x65, 0), aud(), slice(0x41, 0)});
+    const Bytes fromAud = concat({aud(), slice(0x41, 0)});
+    EXPECT_EQ(run({{first, 1000}, {concat({slice(0x41, 0), fromAud}), 4000}}),
+              (Units{{first, 1000, H264MediaExtractor::kFlagIdr}, {fromAud, 4000, 0}}));
     EXPECT_EQ(trace.count("decodeSPS: VUI is not present"), 1u);
     EXPECT_EQ(trace.count("getNextAccessUnit: Error decoding SPS"), 1u);
     EXPECT_FALSE(mExtractor->isFrameDurationKnown());
 }
 
 TEST_F(H264AccessUnitTest, PicStructStreamWaitsForPictureTiming) {
-    SpsParams p{.picStructPresent = true};
     // No picture-timing SEI yet: slices are ignored, so the second AUD does not end the AU.
     const Bytes first =
-        concat({aud(), nal(0x67, spsRbsp(p)), slice(0x65, 0), aud(), slice(0x41, 0)});
-    const Bytes next = concat({aud(), picTimingSei(0), slice(0x41, 0), aud(), slice(0x41, 0)});
-    const auto units = run({{first, 0}, {next, 9000}});
-    ASSERT_EQ(units.size(), 3u);
-    EXPECT_EQ(units[0].bytes, first);
-    EXPECT_EQ(units[1].pts, 9000);
-    EXPECT_EQ(units[2].pts, 9000 + 1501);
+        concat({aud(), spsNal({.picStructPresent = true}), slice(0x65, 0), aud(), slice(0x41, 0)});
+    const Bytes second = concat({aud(), picTimingSei(0), slice(0x41, 0)});
+    const Bytes third = concat({aud(), slice(0x41, 0)});
+    EXPECT_EQ(run({{first, 0}, {concat({second, third}), 9000}}),
+              (Units{{first, 0, kIdrSps}, {second, 9000, 0}, {third, 9000 + 1501, 0}}));
 }
 
 TEST_F(H264AccessUnitTest, InterlacedStreamOfFramePicturesIsStampedEvery1501Ticks) {
     // 29.97 Hz, num_units_in_tick 1001, time_scale 60000, fixed rate, pic_struct 0:
     // 1001 x 90000 / 60000 = 1501 ticks per unit (a tick is one field period).
-    SpsParams p{
-        .heightMapUnits = 34, .frameMbsOnly = false, .cropBottom = 2, .picStructPresent = true};
-    const Bytes unit1 = concat({aud(), nal(0x67, spsRbsp(p)), pps(), picTimingSei(0),
+    const Bytes unit1 = concat({aud(), spsNal(kInterlaced), pps(), picTimingSei(0),
                                 slice(0x65, 0, true, 0), slice(0x65, 30, false, 0)});
     const Bytes unit2 = concat({aud(), picTimingSei(0), slice(0x41, 0, true, 0)});
-    const Bytes unit3 = concat({aud(), picTimingSei(0), slice(0x41, 0, true, 0)});
-    const auto units = run({{concat({unit1, unit2, unit3}), 5000}});
-    ASSERT_EQ(units.size(), 3u);
-    EXPECT_EQ(units[0].bytes, unit1);
-    EXPECT_EQ(units[1].bytes, unit2);
-    EXPECT_EQ(units[2].bytes, unit3);
-    EXPECT_EQ(units[0].pts, 5000);
-    EXPECT_EQ(units[1].pts, 5000 + 1501);
-    EXPECT_EQ(units[2].pts, 5000 + 2 * 1501);
+    EXPECT_EQ(run({{concat({unit1, unit2, unit2}), 5000}}),
+              (Units{{unit1, 5000, kIdrSps}, {unit2, 5000 + 1501, 0}, {unit2, 5000 + 3002, 0}}));
     EXPECT_EQ(mExtractor->getCroppedHeight(), 1080u);
 }
 
 TEST_F(H264AccessUnitTest, FieldPairsInOneRecordAreCutAtEveryFirstMbZero) {
     // Field pictures (field_pic_flag 1) each start with first_mb_in_slice 0, so the
     // second field ends the unit that the AUD opened; what follows it up to the next
-    // delimiter is cut by the same rule. Field pictures without pic_struct count two
-    // ticks each: 3003.
-    SpsParams p{.heightMapUnits = 34, .frameMbsOnly = false};
-    const Bytes head = concat({aud(), nal(0x67, spsRbsp(p)), pps(), slice(0x65, 0, true, 1)});
-    const Bytes field2 = slice(0x41, 0, true, 1);
-    const Bytes aud2 = aud();
-    const Bytes field3 = slice(0x41, 0, true, 1);
-    const Bytes field4 = slice(0x41, 0, true, 1);
-    const auto units = run({{concat({head, field2, aud2, field3, field4}), 0}});
-    ASSERT_EQ(units.size(), 3u);
-    EXPECT_EQ(units[0].bytes, head);
-    EXPECT_EQ(units[1].bytes, aud2);    // field 2 only marks the first slice of its call
-    EXPECT_EQ(units[2].bytes, field4);  // field 3 likewise
-    EXPECT_EQ(units[1].pts, 3003);
+    // delimiter is cut by the same rule: field 2 (and likewise field 3) only marks the
+    // first slice of its call. Field pictures without pic_struct count two ticks each.
+    const Bytes head = concat({aud(), spsNal({.heightMapUnits = 34, .frameMbsOnly = false}), pps(),
+                               slice(0x65, 0, true, 1)});
+    const Bytes field = slice(0x41, 0, true, 1);
+    EXPECT_EQ(run({{concat({head, field, aud(), field, field}), 0}}),
+              (Units{{head, 0, kIdrSps}, {aud(), 3003, 0}, {field, 6006, 0}}));
     EXPECT_EQ(mExtractor->getFrameDuration(), 3003);
 }
 
+// Records without any unit start: after 31 of them the extractor delimits by record,
+// and then at every slice that starts a picture.
 TEST_F(H264AccessUnitTest, WorkaroundAfterThirtyOneRecordsWithoutStart) {
     test::TraceCapture trace;
-    SpsParams p;
-    std::vector<PesChunk> chunks;
-    chunks.push_back({concat({nal(0x67, spsRbsp(p)), pps(), slice(0x65, 0)}), 0});
-    for (int i = 1; i <= 40; ++i) {
-        chunks.push_back({slice(0x41, 0, true), static_cast<uint64_t>(i) * 3000});
+    std::vector<PesChunk> chunks = {{concat({spsNal(), pps(), slice(0x65, 0)}), 0}};
+    const Bytes picture = slice(0x41, 0, true);
+    for (uint64_t i = 1; i <= 40; ++i) {
+        chunks.push_back({picture, i * 3000});
     }
-    const auto units = run(chunks);
+    chunks.push_back({concat({picture, picture, slice(0x41, 60)}), 700000});
+    Units expected = {{chunks[0].es, 0, kIdrSps}};
+    for (uint64_t i = 32; i <= 40; ++i) {
+        expected.push_back({picture, static_cast<long long>(i * 3000), 0});
+    }
+    expected.push_back({picture, 700000, 0});
+    expected.push_back({concat({picture, slice(0x41, 60)}), 700000 + 1501, 0});
+    EXPECT_EQ(run(chunks), expected);
     EXPECT_TRUE(mExtractor->isWorkaroundActive());
     EXPECT_EQ(trace.count("getNextAccessUnit: apply workaround"), 1u) << trace.all();
-    // The first record, then nothing for records 1..31, then one unit per record.
-    ASSERT_EQ(units.size(), 1u + 9u);
-    EXPECT_EQ(units[0].pts, 0);
-    for (size_t i = 1; i < units.size(); ++i) {
-        EXPECT_EQ(units[i].pts, static_cast<long long>((31 + i) * 3000));
-        EXPECT_EQ(units[i].bytes, slice(0x41, 0, true));
-    }
-}
-
-TEST_F(H264AccessUnitTest, WorkaroundDelimitsEverySliceStartingAPicture) {
-    SpsParams p;
-    std::vector<PesChunk> chunks;
-    chunks.push_back({concat({nal(0x67, spsRbsp(p)), pps(), slice(0x65, 0)}), 0});
-    for (int i = 1; i <= 31; ++i) {
-        chunks.push_back({slice(0x41, 0, true), 0});
-    }
-    // Two pictures in one record, the second in two slices.
-    chunks.push_back(
-        {concat({slice(0x41, 0, true), slice(0x41, 0, true), slice(0x41, 60)}), 70000});
-    const auto units = run(chunks);
-    ASSERT_EQ(units.size(), 3u);
-    EXPECT_EQ(units[1].bytes, slice(0x41, 0, true));
-    EXPECT_EQ(units[1].pts, 70000);
-    EXPECT_EQ(units[2].bytes, concat({slice(0x41, 0, true), slice(0x41, 60)}));
-    EXPECT_EQ(units[2].pts, 70000 + 1501);
 }
 
 TEST_F(H264AccessUnitTest, UnitLargerThanOutputIsDroppedSilently) {
-    SpsParams p;
-    const Bytes big = concat({aud(), nal(0x67, spsRbsp(p)), slice(0x65, 0, true, -1, 400)});
+    const Bytes big = concat({aud(), spsNal(), slice(0x65, 0, true, -1, 400)});
     const Bytes small = concat({aud(), slice(0x41, 0, true)});
     test::TraceCapture trace;
-    const auto units = run({{concat({big, small}), 100}}, 300);
-    ASSERT_EQ(units.size(), 1u);
-    EXPECT_EQ(units[0].bytes, small);
-    EXPECT_EQ(units[0].pts, 100);  // a dropped unit does not advance the time
+    // A dropped unit does not advance the time.
+    EXPECT_EQ(run({{concat({big, small}), 100}}, 300), (Units{{small, 100, 0}}));
     EXPECT_EQ(trace.lines().size(), 0u) << trace.all();
 }
 
 TEST_F(H264AccessUnitTest, ResetGivesTheRecordBackAndDecodesTheSpsAgain) {
-    SpsParams p;
-    const Bytes first = concat({aud(), nal(0x67, spsRbsp(p)), slice(0x65, 0)});
+    const Bytes first = concat({aud(), spsNal(), slice(0x65, 0)});
     const Bytes es = concat({first, aud(), slice(0x41, 0)});
     ASSERT_TRUE(test::writePesRecord(*mRing, es, 700));
     std::vector<ExtractedUnit> units;
@@ -692,9 +648,7 @@ TEST_F(H264AccessUnitTest, ResetGivesTheRecordBackAndDecodesTheSpsAgain) {
     EXPECT_FALSE(mExtractor->isFrameDurationKnown());
     ASSERT_EQ(test::pullUnit(*mExtractor, mOut, &units), 0u);
     // Both times from the record's start, with the SPS decoded again.
-    const ExtractedUnit expected{first, 700,
-                                 H264MediaExtractor::kFlagIdr | H264MediaExtractor::kFlagSps};
-    EXPECT_EQ(units, (std::vector<ExtractedUnit>{expected, expected}));
+    EXPECT_EQ(units, (Units{{first, 700, kIdrSps}, {first, 700, kIdrSps}}));
 }
 
 TEST_F(H264AccessUnitTest, ScanStepsOverLeadingOnesAndEndsUnitsAtTheNextStartCode) {
@@ -715,15 +669,10 @@ TEST_F(H264AccessUnitTest, ScanStepsOverLeadingOnesAndEndsUnitsAtTheNextStartCod
 }
 
 TEST_F(H264AccessUnitTest, StatedEsSizeBeyondTheRecordIsBoundedByTheRecord) {
-    SpsParams p;
-    const Bytes first = concat({aud(), nal(0x67, spsRbsp(p)), slice(0x65, 0)});
+    const Bytes first = concat({aud(), spsNal(), slice(0x65, 0)});
     ASSERT_TRUE(test::writeRawRecord(*mRing, 40 + first.size(), 40, 1 << 20, 1234, first));
     const Bytes second = concat({aud(), slice(0x41, 0)});
-    const auto units = run({{second, 5678}});
-    ASSERT_EQ(units.size(), 2u);
-    EXPECT_EQ(units[0].bytes, first);
-    EXPECT_EQ(units[1].bytes, second);
-    EXPECT_EQ(units[1].pts, 5678);
+    EXPECT_EQ(run({{second, 5678}}), (Units{{first, 1234, kIdrSps}, {second, 5678, 0}}));
 }
 
 // --- real encoder output against libavcodec's H.264 parser --------------------------

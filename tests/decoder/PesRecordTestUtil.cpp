@@ -151,6 +151,10 @@ Bytes concat(std::initializer_list<Bytes> parts) {
     return out;
 }
 
+void PrintTo(const ExtractedUnit& unit, std::ostream* os) {
+    *os << goldenDump({unit});
+}
+
 std::vector<Bytes> bytesOf(const std::vector<ExtractedUnit>& units) {
     std::vector<Bytes> out;
     for (const ExtractedUnit& unit : units) {

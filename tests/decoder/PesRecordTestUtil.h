@@ -94,6 +94,8 @@ struct ExtractedUnit {
     unsigned char flags = 0;
     bool operator==(const ExtractedUnit&) const = default;
 };
+// Prints as its golden-dump line.
+void PrintTo(const ExtractedUnit& unit, std::ostream* os);
 std::vector<Bytes> bytesOf(const std::vector<ExtractedUnit>& units);
 
 // Empty when `got` equals `want`, else which unit first differs and how.

@@ -47,16 +47,16 @@ TEST_F(TsgenMuxTest, TablesComeFirstAndAtTheirPeriod) {
     EXPECT_EQ(mTs.packets[1].pid, 0x1000);
     const auto pats = mTs.packetsOf(0x0000);
     // 100 ms at 752 us per slot is 133 slots; the stream lasts about 3.8 s.
-    for (size_t i = 1; i < pats.size(); ++i) {
+    for (size_t i = 1; i < pats.size(); ++i)
         EXPECT_NEAR(static_cast<double>(pats[i]->position - pats[i - 1]->position), 133.0, 1.0);
-    }
     EXPECT_GE(pats.size(), 35u);
 }
 
-TEST_F(TsgenMuxTest, VideoPesCarryOneAccessUnitWithDelimiterAndTimes) {
+// The presentation times' spacing from --start-pts is checked beside the fault
+// that makes them wrap.
+TEST_F(TsgenMuxTest, VideoPesCarryOneAccessUnitAndGopsOf15) {
     const auto pes = mTs.pesOf(0x111);
     ASSERT_EQ(pes.size(), 90u);
-    std::vector<int64_t> pts;
     for (size_t i = 0; i < pes.size(); ++i) {
         const Pes& p = pes[i];
         EXPECT_EQ(p.streamId, 0xE0);
@@ -68,11 +68,6 @@ TEST_F(TsgenMuxTest, VideoPesCarryOneAccessUnitWithDelimiterAndTimes) {
         // access point in the adaptation field.
         EXPECT_TRUE(i % 15 != 0 || (has(5) && has(7) && has(8))) << "PES " << i;
         EXPECT_TRUE(i % 15 != 0 || mTs.packets[p.firstPacket].randomAccess) << "PES " << i;
-        pts.push_back(p.pts);
-    }
-    std::sort(pts.begin(), pts.end());
-    for (size_t i = 0; i < pts.size(); ++i) {
-        EXPECT_EQ(pts[i], kStartPts + static_cast<int64_t>(i) * 3003);
     }
 }
 
@@ -123,9 +118,8 @@ TEST_F(TsgenMuxTest, CaptionStatementsCarryTheTextAtTheirTimes) {
         EXPECT_EQ(p.payload.size(), 3 + 5 + ((p.payload[6] << 8) | p.payload[7]) + 2u);
         EXPECT_EQ(tsgen::CaptionWriter::crc16(p.payload.data() + 3, p.payload.size() - 3), 0);
         managementCount += p.payload == management ? 1 : 0;
-        if (p.payload != management) {
+        if (p.payload != management)
             statements.emplace_back(p.pts, p.payload);
-        }
     }
     // Management data every second from the start, before the statements.
     EXPECT_EQ(managementCount, 3u);

@@ -22,21 +22,30 @@ uint16_t crc16(const std::vector<uint8_t>& bytes, size_t from = 0) {
     return CaptionWriter::crc16(bytes.data() + from, bytes.size() - from);
 }
 
+// "01 1" -> {0x60}: the bits in order, zero-padded to a byte.
+std::vector<uint8_t> bits(const std::string& text) {
+    BitWriter w;
+    for (char bit : text) {
+        if (bit != ' ')
+            w.putBits(bit == '1' ? 1 : 0, 1);
+    }
+    w.alignZero();
+    return w.bytes();
+}
+
 TEST(BitWriterTest, ExpGolombCodesMatchTheStandardTable) {
     // ITU-T H.264, Table 9-2.
     const struct {
         uint32_t value;
-        const char* bits;
+        std::string bits;
     } kCases[] = {{0, "1"},     {1, "010"},     {2, "011"},      {3, "00100"},
                   {6, "00111"}, {7, "0001000"}, {14, "0001111"}, {255, "00000000100000000"}};
     for (const auto& c : kCases) {
         BitWriter w;
         w.putUe(c.value);
-        std::string bits;
-        for (size_t i = 0; i < w.bitCount(); ++i) {
-            bits += ((w.bytes()[i / 8] >> (7 - i % 8)) & 1) ? '1' : '0';
-        }
-        EXPECT_EQ(bits, c.bits) << "ue(" << c.value << ")";
+        EXPECT_EQ(w.bitCount(), c.bits.size()) << "ue(" << c.value << ")";
+        w.alignZero();
+        EXPECT_EQ(w.bytes(), bits(c.bits)) << "ue(" << c.value << ")";
         uint32_t back = 0;
         BitReader r(w.bytes().data(), w.bytes().size());
         ASSERT_TRUE(r.getUe(back));
@@ -85,9 +94,8 @@ TEST(AacFramerTest, FramesMatchTheSyntaxTables) {
                   0)
             << c.name;
         auto expected = hex(c.header);
-        if (c.framing == 'A') {
+        if (c.framing == 'A')
             expected.insert(expected.end(), raw.begin(), raw.end());
-        }
         EXPECT_EQ(out, expected) << c.name;
     }
     // 600 = 255 + 255 + 90: three PayloadLengthInfo bytes, so 45 + 24 + 4800
@@ -103,26 +111,29 @@ TEST(AacFramerTest, FramesMatchTheSyntaxTables) {
     }
 }
 
+// The letters that ISO 8859-1 lacks take their ISO 8859-15 positions; \x1D\x21
+// is SS3 and the music note.
 TEST(CaptionWriterTest, TextBecomesLatinCaptionCodesOrIsRefusedWithAReason) {
     // CRC-16 with polynomial 0x1021 and initial value 0 gives 0x31C3 over "123456789".
     EXPECT_EQ(crc16({'1', '2', '3', '4', '5', '6', '7', '8', '9'}), 0x31C3);
     const struct {
         const char* text;
         const char* codesOrError;  // hex codes, or the reason for refusing
-    } kCases[] = {{"Ola", "4F 6C 61"},
-                  {"Olá ç", "4F 6C E1 20 E7"},
-                  // ISO 8859-15 positions of the letters that ISO 8859-1 lacks.
-                  {"€ŠšŽžŒœŸ", "A4 A6 A8 B4 B8 BC BD BE"},
-                  {"a\\x1D\\x21b", "61 1D 21 62"},  // SS3 + music note
-                  {"\\f\\n\\\\", "0C 0D 5C"},
-                  {"\\x1", "two hex digits"},
-                  {"\\xg0", "two hex digits"},
-                  {"a\\", "lone backslash"},
-                  {"\\q", "unknown escape"},
-                  {"中", "no Latin caption code"},
-                  {"\xC3", "not valid UTF-8"},
-                  {"\xC3(", "not valid UTF-8"},
-                  {"\x80", "not valid UTF-8"}};
+    } kCases[] = {
+        {"Ola", "4F 6C 61"},
+        {"Olá ç", "4F 6C E1 20 E7"},
+        {"€ŠšŽžŒœŸ", "A4 A6 A8 B4 B8 BC BD BE"},
+        {"a\\x1D\\x21b", "61 1D 21 62"},
+        {"\\f\\n\\\\", "0C 0D 5C"},
+        {"\\x1", "two hex digits"},
+        {"\\xg0", "two hex digits"},
+        {"a\\", "lone backslash"},
+        {"\\q", "unknown escape"},
+        {"中", "no Latin caption code"},
+        {"\xC3", "not valid UTF-8"},
+        {"\xC3(", "not valid UTF-8"},
+        {"\x80", "not valid UTF-8"},
+    };
     for (const auto& c : kCases) {
         std::vector<uint8_t> codes;
         std::string error;
@@ -171,33 +182,14 @@ TEST(TsMuxerPesHeaderTest, TimestampsAreReducedTo33BitsAndLongVideoIsUnbounded) 
     EXPECT_EQ(h[5], 0);
 }
 
-// A Baseline SPS written field by field (ITU-T H.264, 7.3.2.1.1): profile 66,
-// level 30, id 0, log2_max_frame_num - 4 = 0, POC type 2, one reference frame,
-// no gaps, 20x15 macroblocks, frame_mbs_only, direct_8x8, no cropping; with VUI,
-// nine clear VUI flags follow. A width of 0 marks ue(v).
+// A Baseline SPS bit by bit (ITU-T H.264, 7.3.2.1.1): NAL header 0x67,
+// profile 66, no constraint flags, level 30; ue(v) id 0, log2_max_frame_num - 4
+// = 0, POC type 2, one reference frame; no gaps; ue(v) 19 and 14 for 20x15
+// macroblocks; frame_mbs_only, direct_8x8, no cropping; the VUI flag (with VUI,
+// nine clear VUI flags follow); rbsp_stop_one_bit.
 std::vector<uint8_t> baselineSps(bool withVui) {
-    BitWriter w;
-    for (const auto& [value, width] : {std::pair<uint32_t, int>{0x67, 8},
-                                       {66, 8},
-                                       {0, 8},
-                                       {30, 8},
-                                       {0, 0},
-                                       {0, 0},
-                                       {2, 0},
-                                       {1, 0},
-                                       {0, 1},
-                                       {19, 0},
-                                       {14, 0},
-                                       {0b110, 3},
-                                       {withVui, 1}}) {
-        width == 0 ? w.putUe(value) : w.putBits(value, width);
-    }
-    if (withVui) {
-        w.putBits(0, 9);
-    }
-    w.putBits(1, 1);  // rbsp_stop_one_bit
-    w.alignZero();
-    return w.bytes();
+    return bits("01100111 01000010 00000000 00011110 1 1 011 010 0 000010100 0001111 110 " +
+                std::string(withVui ? "1 000000000" : "0") + " 1");
 }
 
 TEST(H264SpsEditorTest, EmulationPreventionAndVuiRemoval) {

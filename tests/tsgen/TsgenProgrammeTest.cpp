@@ -74,12 +74,10 @@ TEST(TsgenProgrammeTest, PcrPidOfItsOwnCarriesOnlyThePcr) {
     ASSERT_TRUE(gen.ok());
     const auto pcrPackets = gen.ts.packetsOf(0x100);
     ASSERT_FALSE(pcrPackets.empty());
-    for (const auto* p : pcrPackets) {
+    for (const auto* p : pcrPackets)
         EXPECT_TRUE(p->adaptationControl == 2 && p->hasPcr) << p->position;
-    }
-    for (const auto* p : gen.ts.packetsOf(0x211)) {
+    for (const auto* p : gen.ts.packetsOf(0x211))
         EXPECT_FALSE(p->hasPcr) << p->position;
-    }
 }
 
 TEST(TsgenProgrammeTest, PmtDeclaresIsdbTbComponentsAndCaptions) {

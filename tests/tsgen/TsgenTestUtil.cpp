@@ -41,9 +41,8 @@ std::vector<uint8_t> readFile(const std::string& file) {
 std::vector<uint8_t> hex(const std::string& text) {
     std::istringstream in(text);
     std::vector<uint8_t> out;
-    for (unsigned byte = 0; in >> std::hex >> byte;) {
+    for (unsigned byte = 0; in >> std::hex >> byte;)
         out.push_back(static_cast<uint8_t>(byte));
-    }
     return out;
 }
 
@@ -79,9 +78,8 @@ TsFile::TsFile(const std::vector<uint8_t>& bytes, size_t packetSize) {
                                   (uint64_t{p[8]} << 9) | (uint64_t{p[9]} << 1) | (p[10] >> 7);
             t.pcr27 = t.hasPcr ? int64_t(base * 300 + (((p[10] & 1U) << 8) | p[11])) : 0;
         }
-        if (valid && (t.adaptationControl & 1)) {
+        if (valid && (t.adaptationControl & 1))
             t.payload.assign(p + ((t.adaptationControl & 2) ? 5 + length : 4), p + 188);
-        }
         packets.push_back(std::move(t));
     }
 }
@@ -89,9 +87,8 @@ TsFile::TsFile(const std::vector<uint8_t>& bytes, size_t packetSize) {
 std::vector<const TsPacket*> TsFile::packetsOf(uint16_t pid) const {
     std::vector<const TsPacket*> out;
     for (const auto& p : packets) {
-        if (p.pid == pid) {
+        if (p.pid == pid)
             out.push_back(&p);
-        }
     }
     return out;
 }
@@ -106,9 +103,8 @@ int64_t readTimestamp(const uint8_t* q) {
 // ISO/IEC 13818-1, 2.4.3.6: the PES header, its PTS/DTS and the bytes that
 // PES_packet_length bounds (0: all that follow).
 void finishPes(const std::vector<uint8_t>& b, uint64_t first, std::vector<Pes>& out) {
-    if (b.size() < 9 || b[0] != 0 || b[1] != 0 || b[2] != 1 || 9u + b[8] > b.size()) {
+    if (b.size() < 9 || b[0] != 0 || b[1] != 0 || b[2] != 1 || 9u + b[8] > b.size())
         return;
-    }
     const size_t length = (b[4] << 8) | b[5];
     const size_t end = (length != 0 && 6 + length <= b.size()) ? 6 + length : b.size();
     const bool hasPts = (b[7] & 0x80) != 0, hasDts = (b[7] >> 6) == 3;
@@ -125,17 +121,15 @@ std::vector<Pes> TsFile::pesOf(uint16_t pid) const {
     const TsPacket* first = nullptr;
     for (const auto* p : packetsOf(pid)) {
         if (p->pusi && !p->payload.empty()) {
-            if (first != nullptr) {
+            if (first != nullptr)
                 finishPes(bytes, first->position, out);
-            }
             bytes.clear();
             first = p;
         }
         bytes.insert(bytes.end(), p->payload.begin(), p->payload.end());
     }
-    if (first != nullptr) {
+    if (first != nullptr)
         finishPes(bytes, first->position, out);
-    }
     return out;
 }
 
@@ -144,9 +138,8 @@ PacketIndices TsFile::where(const std::function<bool(const TsPacket&)>& predicat
     std::map<uint16_t, size_t> count;
     for (const auto& p : packets) {
         const size_t index = count[p.pid]++;
-        if (predicate(p)) {
+        if (predicate(p))
             out[p.pid].push_back(index);
-        }
     }
     return out;
 }
@@ -171,9 +164,8 @@ std::vector<std::pair<uint64_t, int64_t>> pcrAnomalies(const TsFile& ts, int64_t
         if (p.hasPcr && previous != nullptr) {
             const int64_t slots = static_cast<int64_t>(p.position - previous->position);
             const int64_t excess = p.pcr27 - previous->pcr27 - slots * ticks27PerPacket(muxRate);
-            if (excess > 1 || excess < -1) {
+            if (excess > 1 || excess < -1)
                 anomalies.emplace_back(p.position, excess);
-            }
         }
         previous = p.hasPcr ? &p : previous;
     }

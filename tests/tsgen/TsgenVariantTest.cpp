@@ -25,50 +25,81 @@ void expectMislabelled(const TsFile& ts, const char* pmtEntry, int sync, int syn
     EXPECT_EQ(((pes[0].payload[0] << 8) | pes[0].payload[1]) >> (16 - syncBits), sync);
 }
 
-struct FaultCase {
+// The same elementary stream of `pid` cut into other PES: every PES of the
+// clean stream starts a unit; in the cut stream a PES has the PTS of the first
+// unit that starts in it, or none.
+std::function<void(const Generated&, const Generated&)> sameUnits(uint16_t pid) {
+    return [pid](const Generated& variant, const Generated& clean) {
+        const auto plain = clean.ts.pesOf(pid);
+        const auto cut = variant.ts.pesOf(pid);
+        EXPECT_NE(cut.size(), plain.size());
+
+        std::vector<uint8_t> plainEs, cutEs;
+        std::vector<size_t> unitStarts;
+        for (const auto& p : plain) {
+            unitStarts.push_back(plainEs.size());
+            plainEs.insert(plainEs.end(), p.payload.begin(), p.payload.end());
+        }
+        size_t unit = 0;
+        for (const auto& p : cut) {
+            const size_t offset = cutEs.size();
+            cutEs.insert(cutEs.end(), p.payload.begin(), p.payload.end());
+            while (unit < unitStarts.size() && unitStarts[unit] < offset)
+                ++unit;
+            const bool starts = unit < unitStarts.size() && unitStarts[unit] < cutEs.size();
+            EXPECT_EQ(p.hasPts, starts);
+            EXPECT_TRUE(!starts || p.pts == plain[unit].pts) << "PES at " << offset;
+        }
+        EXPECT_EQ(cutEs, plainEs);
+        EXPECT_EQ(decodeErrors(variant.file), "");
+    };
+}
+
+struct VariantCase {
     const char* name;
+    const char* codecArgs;  // shared by the variant and the clean stream
     const char* args;
     // Checks the variant; `clean` is the same stream without it.
     std::function<void(const Generated& variant, const Generated& clean)> check;
 };
 
-void PrintTo(const FaultCase& c, std::ostream* os) {
+void PrintTo(const VariantCase& c, std::ostream* os) {
     *os << c.name;
 }
 
-class TsgenVariantTest : public ::testing::TestWithParam<FaultCase> {};
+class TsgenVariantTest : public ::testing::TestWithParam<VariantCase> {};
 
 TEST_P(TsgenVariantTest, DiffersFromTheCleanStreamOnlyAsAsked) {
-    const auto& clean = tsgen(kBase);
-    const auto& variant = tsgen(kBase + GetParam().args);
+    const auto& clean = tsgen(kBase + GetParam().codecArgs);
+    const auto& variant = tsgen(kBase + GetParam().codecArgs + " " + GetParam().args);
     ASSERT_TRUE(clean.ok());
     ASSERT_TRUE(variant.ok());
     GetParam().check(variant, clean);
 }
 
-const FaultCase kVariants[] = {
-    {"CcError", "--cc-error 0x111:40 --cc-error 0x112:7",
+const VariantCase kVariants[] = {
+    {"CcError", "", "--cc-error 0x111:40 --cc-error 0x112:7",
      [](const Generated& v, const Generated&) {
          EXPECT_EQ(v.ts.continuityErrors(), (PacketIndices{{0x111, {40}}, {0x112, {7}}}));
      }},
-    {"Drop", "--drop 0x112:10:2",
+    {"Drop", "", "--drop 0x112:10:2",
      [](const Generated& v, const Generated& c) {
          EXPECT_EQ(v.ts.packetsOf(0x112).size() + 2, c.ts.packetsOf(0x112).size());
          EXPECT_EQ(v.ts.packetsOf(0x111).size(), c.ts.packetsOf(0x111).size());
          EXPECT_EQ(v.ts.continuityErrors(), (PacketIndices{{0x112, {10}}}));
      }},
-    {"TransportError", "--tei 0x111:20:3",
+    {"TransportError", "", "--tei 0x111:20:3",
      [](const Generated& v, const Generated&) {
          EXPECT_EQ(v.ts.where([](auto& p) { return p.tei; }),
                    (PacketIndices{{0x111, {20, 21, 22}}}));
      }},
-    {"Scrambled", "--scramble 0x111:30:5 --scrambling-value 3",
+    {"Scrambled", "", "--scramble 0x111:30:5 --scrambling-value 3",
      [](const Generated& v, const Generated&) {
          const PacketIndices expected{{0x111, {30, 31, 32, 33, 34}}};
          EXPECT_EQ(v.ts.where([](auto& p) { return p.scrambling != 0; }), expected);
          EXPECT_EQ(v.ts.where([](auto& p) { return p.scrambling == 3; }), expected);
      }},
-    {"PcrJump", "--pcr-jump 1:500",
+    {"PcrJump", "", "--pcr-jump 1:500",
      [](const Generated& v, const Generated& c) {
          const auto anomalies = pcrAnomalies(v.ts, kMuxRate);
          ASSERT_EQ(anomalies.size(), 1u);
@@ -78,7 +109,7 @@ const FaultCase kVariants[] = {
          EXPECT_EQ(v.ts.pesOf(0x111)[10].pts, c.ts.pesOf(0x111)[10].pts);
          EXPECT_TRUE(pcrAnomalies(c.ts, kMuxRate).empty());
      }},
-    {"Gap", "--gap 1:300",
+    {"Gap", "", "--gap 1:300",
      [](const Generated& v, const Generated& c) {
          const auto anomalies = pcrAnomalies(v.ts, kMuxRate);
          ASSERT_EQ(anomalies.size(), 1u);
@@ -89,7 +120,7 @@ const FaultCase kVariants[] = {
          // The lost stretch breaks the counters of the streams that were sending.
          EXPECT_EQ(v.ts.continuityErrors().count(0x111), 1u);
      }},
-    {"NoAud", "--no-aud",
+    {"NoAud", "", "--no-aud",
      [](const Generated& v, const Generated& c) {
          for (const auto& p : v.ts.pesOf(0x111)) {
              const auto nals = nalTypes(p.payload);
@@ -101,7 +132,7 @@ const FaultCase kVariants[] = {
              EXPECT_EQ(nals[0], 9);
          }
      }},
-    {"NoVui", "--no-vui",
+    {"NoVui", "", "--no-vui",
      [](const Generated& v, const Generated&) {
          // libavcodec's own bitstream tracer reads the SPS.
          const auto trace = runCommand("ffmpeg -nostdin -hide_banner -i '" + v.file +
@@ -112,35 +143,33 @@ const FaultCase kVariants[] = {
          EXPECT_EQ(decodeErrors(v.file), "");
          EXPECT_EQ(v.ts.pesOf(0x111).size(), 60u);
      }},
-    {"StartPtsWrap", "--start-pts 8589844592",
+    {"StartPtsWrap", "", "--start-pts 8589844592",
      [](const Generated& v, const Generated&) {
          constexpr int64_t kWrap = int64_t{1} << 33;
          const int64_t start = kWrap - 90000;
          // Modulo 2^33 the presentation times are still one frame apart.
          const auto pes = v.ts.pesOf(0x111);
          std::vector<int64_t> offsets;
-         for (const auto& p : pes) {
+         for (const auto& p : pes)
              offsets.push_back((p.pts - start) & (kWrap - 1));
-         }
          EXPECT_LT(pes.back().pts, start);  // the last picture is past the wrap
          std::sort(offsets.begin(), offsets.end());
-         for (size_t i = 0; i < offsets.size(); ++i) {
+         for (size_t i = 0; i < offsets.size(); ++i)
              EXPECT_EQ(offsets[i], static_cast<int64_t>(i) * 3003);
-         }
          // The PCR wraps too, once, by 2^33 * 300 ticks.
          const auto anomalies = pcrAnomalies(v.ts, kMuxRate);
          ASSERT_EQ(anomalies.size(), 1u);
          EXPECT_NEAR(anomalies[0].second, -kWrap * 300, 1);
      }},
-    {"LatmLabelledAdts", "--latm-as-adts",
+    {"LatmLabelledAdts", "", "--latm-as-adts",
      [](const Generated& v, const Generated&) {
          expectMislabelled(v.ts, "0F E1 12 F0", 0x2B7, 11);  // still LOAS
      }},
-    {"AdtsLabelledLatm", "--audio adts --adts-as-latm",
+    {"AdtsLabelledLatm", "--audio adts", "--adts-as-latm",
      [](const Generated& v, const Generated&) {
          expectMislabelled(v.ts, "11 E1 12 F0", 0xFFF, 12);  // ADTS
      }},
-    {"Packets204", "--packet-size 204",
+    {"Packets204", "", "--packet-size 204",
      [](const Generated& v, const Generated& c) {
          ASSERT_EQ(v.ts.packets.size(), c.ts.packets.size());
          for (size_t i = 0; i < v.ts.packets.size(); ++i) {
@@ -149,7 +178,7 @@ const FaultCase kVariants[] = {
                  << "packet " << i;
          }
      }},
-    {"TimebaseJump", "--timebase-jump 1:5000",
+    {"TimebaseJump", "", "--timebase-jump 1:5000",
      [](const Generated& v, const Generated& c) {
          ASSERT_EQ(v.ts.packets.size(), c.ts.packets.size());
          // One PCR moves on by 5 s more than the bytes say, and only its packet
@@ -158,9 +187,8 @@ const FaultCase kVariants[] = {
          ASSERT_EQ(anomalies.size(), 1u);
          EXPECT_NEAR(anomalies[0].second, 5000 * 27000, 1);
          const uint64_t mark = anomalies[0].first;
-         for (const auto& p : v.ts.packets) {
+         for (const auto& p : v.ts.packets)
              EXPECT_EQ(p.discontinuity, p.position == mark) << "packet " << p.position;
-         }
          // PES that start after the mark are on the new time base; those before are not.
          for (uint16_t pid : {0x111, 0x112}) {
              const auto before = c.ts.pesOf(pid);
@@ -175,68 +203,17 @@ const FaultCase kVariants[] = {
              EXPECT_GT(moved, 0u);
          }
      }},
+    {"CutVideoSmall", "", "--video-pes-bytes 777", sameUnits(0x111)},
+    {"CutVideoLarge", "", "--video-pes-bytes 5000", sameUnits(0x111)},
+    {"CutLatmOdd", "", "--audio-pes-bytes 101", sameUnits(0x112)},
+    {"CutLatmSeveralFrames", "", "--audio-pes-bytes 1000", sameUnits(0x112)},
+    {"CutAdtsOdd", "--audio adts", "--audio-pes-bytes 250", sameUnits(0x112)},
+    {"CutMp2Odd", "--audio mp2", "--audio-pes-bytes 333", sameUnits(0x112)},
+    {"LatmThreeFramesPerPes", "", "--audio-frames-per-pes 3", sameUnits(0x112)},
 };
 
 INSTANTIATE_TEST_SUITE_P(Variants, TsgenVariantTest, ::testing::ValuesIn(kVariants),
                          [](const auto& info) { return std::string(info.param.name); });
-
-struct CutCase {
-    const char* name;
-    const char* codecArgs;  // shared by the cut stream and its reference
-    const char* cutArgs;
-    uint16_t pid;
-};
-
-void PrintTo(const CutCase& c, std::ostream* os) {
-    *os << c.name;
-}
-
-class TsgenResegmentationTest : public ::testing::TestWithParam<CutCase> {};
-
-TEST_P(TsgenResegmentationTest, SameBytesInOtherPesWithTimesOnlyWhereUnitsStart) {
-    const CutCase& c = GetParam();
-    const auto& cutGen = tsgen(kBase + c.codecArgs + " " + c.cutArgs);
-    const auto& plainGen = tsgen(kBase + c.codecArgs);
-    ASSERT_TRUE(cutGen.ok());
-    ASSERT_TRUE(plainGen.ok());
-    const auto plain = plainGen.ts.pesOf(c.pid);
-    const auto cut = cutGen.ts.pesOf(c.pid);
-    EXPECT_NE(cut.size(), plain.size());
-
-    // Every PES of the plain stream starts a unit; in the cut stream a PES has
-    // the PTS of the first unit that starts in it, or none. Both carry the
-    // same elementary stream.
-    std::vector<uint8_t> plainEs, cutEs;
-    std::vector<size_t> unitStarts;
-    for (const auto& p : plain) {
-        unitStarts.push_back(plainEs.size());
-        plainEs.insert(plainEs.end(), p.payload.begin(), p.payload.end());
-    }
-    size_t unit = 0;
-    for (const auto& p : cut) {
-        const size_t offset = cutEs.size();
-        cutEs.insert(cutEs.end(), p.payload.begin(), p.payload.end());
-        while (unit < unitStarts.size() && unitStarts[unit] < offset) {
-            ++unit;
-        }
-        const bool starts = unit < unitStarts.size() && unitStarts[unit] < cutEs.size();
-        EXPECT_EQ(p.hasPts, starts);
-        EXPECT_TRUE(!starts || p.pts == plain[unit].pts) << "PES at " << offset;
-    }
-    EXPECT_EQ(cutEs, plainEs);
-    EXPECT_EQ(decodeErrors(cutGen.file), "");
-}
-
-INSTANTIATE_TEST_SUITE_P(
-    Cuts, TsgenResegmentationTest,
-    ::testing::Values(CutCase{"VideoSmall", "", "--video-pes-bytes 777", 0x111},
-                      CutCase{"VideoLarge", "", "--video-pes-bytes 5000", 0x111},
-                      CutCase{"LatmOdd", "", "--audio-pes-bytes 101", 0x112},
-                      CutCase{"LatmSeveralFrames", "", "--audio-pes-bytes 1000", 0x112},
-                      CutCase{"AdtsOdd", "--audio adts", "--audio-pes-bytes 250", 0x112},
-                      CutCase{"Mp2Odd", "--audio mp2", "--audio-pes-bytes 333", 0x112},
-                      CutCase{"LatmThreeFramesPerPes", "", "--audio-frames-per-pes 3", 0x112}),
-    [](const auto& info) { return std::string(info.param.name); });
 
 }  // namespace
 }  // namespace TavoPlayer::test

@@ -21,6 +21,7 @@ extern "C" {
 namespace TavoPlayer {
 namespace {
 
+using test::Bytes;
 using test::ExtractedUnit;
 using test::PesChunk;
 using test::PrintTo;
@@ -190,70 +191,48 @@ TEST_F(MP3ExtractorFixture, TooFewBytesForTheNextHeader) {
     }
 }
 
-class MP3CarryTest : public MP3ExtractorFixture {};
+using Units = std::vector<ExtractedUnit>;
 
-TEST_F(MP3CarryTest, FrameStraddlingRecordsIsWholeWithTheEarlierPts) {
-    HeaderFields f;
-    std::vector<uint8_t> es;
+// Four 128 kbit/s 44.1 kHz frames (2340 ticks each) cut into records: a frame keeps
+// the PTS current where it began; a record's own PTS is not advanced by a frame that
+// began before it.
+TEST_F(MP3ExtractorFixture, FramesStraddlingRecordsAreWholeWithThePtsOfTheirStart) {
+    std::vector<Bytes> frames;
     for (uint8_t i = 0; i < 4; ++i) {
-        append(es, frame(f, 417, i));
+        frames.push_back(frame({}, 417, i));
     }
-    // Record A: frame 0 and 100 bytes of frame 1. Record B: the rest of frame 1 and
-    // frame 2 and 200 bytes of frame 3. Record C: the rest of frame 3.
-    const auto chunks = test::cutAt(es, {0, 517, 1451}, {1000, 50000, 90000});
-    const auto units = run(chunks);
-    ASSERT_EQ(units.size(), 4u);
-    for (size_t i = 0; i < 4; ++i) {
-        EXPECT_EQ(units[i].bytes,
-                  std::vector<uint8_t>(es.begin() + 417 * i, es.begin() + 417 * (i + 1)))
-            << "frame " << i;
-    }
-    EXPECT_EQ(units[0].pts, 1000);
-    EXPECT_EQ(units[1].pts, 1000 + 2340);  // current when frame 1 began, in record A
-    EXPECT_EQ(units[2].pts, 50000);        // record B's own PTS, not advanced by frame 1
-    EXPECT_EQ(units[3].pts, 50000 + 2340);
+    const Bytes es = test::joinEs(test::groupCuts(frames, 1, 0, 0));
+    // A: frame 0 and 100 bytes of 1; B: the rest of 1, frame 2, 200 bytes of 3; C: the rest.
+    EXPECT_EQ(run(test::cutAt(es, {0, 517, 1451}, {1000, 50000, 90000})),
+              (Units{{frames[0], 1000, 0},
+                     {frames[1], 1000 + 2340, 0},
+                     {frames[2], 50000, 0},
+                     {frames[3], 50000 + 2340, 0}}));
+    // Frame 0 spread over three records, frame 1 starting the fourth.
+    SetUp();
+    EXPECT_EQ(run(test::cutAt(test::concat({frames[0], frames[1]}), {0, 100, 250, 417},
+                              {10, 20, 30, 40})),
+              (Units{{frames[0], 10, 0}, {frames[1], 40, 0}}));
 }
 
-TEST_F(MP3CarryTest, FrameSpreadOverThreeRecordsKeepsThePtsOfItsStart) {
-    HeaderFields f;
-    std::vector<uint8_t> es = frame(f, 417, 7);
-    append(es, frame(f, 417, 8));
-    const auto chunks = test::cutAt(es, {0, 100, 250, 417}, {10, 20, 30, 40});
-    const auto units = run(chunks);
-    ASSERT_EQ(units.size(), 2u);
-    EXPECT_EQ(units[0].bytes, std::vector<uint8_t>(es.begin(), es.begin() + 417));
-    EXPECT_EQ(units[0].pts, 10);
-    EXPECT_EQ(units[1].pts, 40);
-}
-
-TEST_F(MP3CarryTest, OutputOneByteTooSmallDropsOnlyThatFrame) {
+TEST_F(MP3ExtractorFixture, OutputOneByteTooSmallDropsOnlyThatFrame) {
     test::TraceCapture trace;
-    HeaderFields padded;
-    padded.padding = 1;
-    HeaderFields plain;
-    std::vector<uint8_t> es = frame(padded, 561, 1);
-    append(es, frame(plain, 417, 2));
-    const auto units = run({{es, 500}}, 560);
-    EXPECT_EQ(trace.count("getNextFragment: not enough space in output buffer for MPEG audio "
-                          "frame."),
-              1u)
+    const Bytes padded = frame({.padding = 1}, 561, 1);
+    const Bytes plain = frame({}, 417, 2);
+    // The dropped frame does not advance the time.
+    EXPECT_EQ(run({{test::concat({padded, plain}), 500}}, 560), (Units{{plain, 500, 0}}));
+    EXPECT_EQ(
+        trace.count("getNextFragment: not enough space in output buffer for MPEG audio frame."), 1u)
         << trace.all();
-    ASSERT_EQ(units.size(), 1u);
-    EXPECT_EQ(units[0].bytes, std::vector<uint8_t>(es.begin() + 561, es.end()));
-    EXPECT_EQ(units[0].pts, 500);  // the dropped frame does not advance the time
 }
 
-TEST_F(MP3CarryTest, ResyncSkipsGarbageAndFalseSyncs) {
-    HeaderFields f;
+TEST_F(MP3ExtractorFixture, ResyncSkipsGarbageAndFalseSyncs) {
     // FF E0 with a reserved layer: a false sync that must be stepped over.
-    std::vector<uint8_t> es = {0x00, 0x12, 0xFF, 0xE0, 0x00, 0x00, 0x00, 0x00, 0x7F};
-    const size_t garbage = es.size();
-    append(es, frame(f, 417, 1));
-    append(es, frame(f, 417, 2));
-    const auto units = run({{es, 0}});
-    ASSERT_EQ(units.size(), 2u);
-    EXPECT_EQ(units[0].bytes,
-              std::vector<uint8_t>(es.begin() + garbage, es.begin() + garbage + 417));
+    const Bytes garbage = {0x00, 0x12, 0xFF, 0xE0, 0x00, 0x00, 0x00, 0x00, 0x7F};
+    const Bytes frame1 = frame({}, 417, 1);
+    const Bytes frame2 = frame({}, 417, 2);
+    EXPECT_EQ(run({{test::concat({garbage, frame1, frame2}), 0}}),
+              (Units{{frame1, 0, 0}, {frame2, 2340, 0}}));
 }
 
 class MP3RingProtocolTest : public MP3ExtractorFixture {
@@ -316,18 +295,13 @@ TEST_F(MP3RingProtocolTest, RecordHeldAcrossCallsAndConsumedWhenUsedUp) {
 }
 
 TEST_F(MP3RingProtocolTest, StatedEsSizeBeyondTheRecordIsBoundedByTheRecord) {
-    HeaderFields f;
-    std::vector<uint8_t> first = frame(f, 417, 1);
+    const Bytes frame1 = frame({}, 417, 1);
+    Bytes first = frame1;
     first.resize(417 + 30, 0x11);  // a frame, then 30 bytes of a frame cut short
     // mSizeES claims far more than the record holds; the next record follows in the ring.
     ASSERT_TRUE(test::writeRawRecord(*mRing, 40 + 447, 40, 100000, 7000, first));
-    std::vector<uint8_t> second = frame(f, 417, 2);
-    const auto units = run({{second, 8000}});
-    ASSERT_EQ(units.size(), 2u);
-    EXPECT_EQ(units[0].bytes, std::vector<uint8_t>(first.begin(), first.begin() + 417));
-    EXPECT_EQ(units[0].pts, 7000);
-    EXPECT_EQ(units[1].bytes.size(), 417u);
-    EXPECT_EQ(units[1].pts, 8000);
+    const Bytes second = frame({}, 417, 2);
+    EXPECT_EQ(run({{second, 8000}}), (Units{{frame1, 7000, 0}, {second, 8000, 0}}));
 }
 
 std::vector<std::vector<uint8_t>> ffmpegFrames(const std::vector<uint8_t>& es, AVCodecID id) {

@@ -72,12 +72,12 @@ INSTANTIATE_TEST_SUITE_P(Streams, TsgenProbeTest, ::testing::ValuesIn(kCases),
 TEST(TsgenProgrammeTest, PcrPidOfItsOwnCarriesOnlyThePcr) {
     const auto& gen = tsgen(kCases[8].args);
     ASSERT_TRUE(gen.ok());
-    const auto pcrPackets = gen.ts.packetsOf(0x100);
-    ASSERT_FALSE(pcrPackets.empty());
-    for (const auto* p : pcrPackets)
-        EXPECT_TRUE(p->adaptationControl == 2 && p->hasPcr) << p->position;
-    for (const auto* p : gen.ts.packetsOf(0x211))
-        EXPECT_FALSE(p->hasPcr) << p->position;
+    // Every packet of PID 0x100, and no other, carries a PCR in an adaptation
+    // field without payload.
+    const auto pcrPid = gen.ts.where([](auto& p) { return p.pid == 0x100; });
+    ASSERT_EQ(pcrPid.size(), 1u);
+    EXPECT_EQ(gen.ts.where([](auto& p) { return p.hasPcr; }), pcrPid);
+    EXPECT_EQ(gen.ts.where([](auto& p) { return p.adaptationControl == 2 && p.hasPcr; }), pcrPid);
 }
 
 TEST(TsgenProgrammeTest, PmtDeclaresIsdbTbComponentsAndCaptions) {

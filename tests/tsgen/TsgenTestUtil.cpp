@@ -86,10 +86,9 @@ TsFile::TsFile(const std::vector<uint8_t>& bytes, size_t packetSize) {
 
 std::vector<const TsPacket*> TsFile::packetsOf(uint16_t pid) const {
     std::vector<const TsPacket*> out;
-    for (const auto& p : packets) {
+    for (const auto& p : packets)
         if (p.pid == pid)
             out.push_back(&p);
-    }
     return out;
 }
 
@@ -173,11 +172,8 @@ std::vector<std::pair<uint64_t, int64_t>> pcrAnomalies(const TsFile& ts, int64_t
 }
 
 ::testing::AssertionResult Generated::ok() const {
-    if (run.exitCode != 0 || !ts.valid) {
-        return ::testing::AssertionFailure()
-               << "tsgen exit " << run.exitCode << ", " << bytes.size() << " bytes: " << run.err;
-    }
-    return ::testing::AssertionSuccess();
+    return ::testing::AssertionResult(run.exitCode == 0 && ts.valid)
+           << "tsgen exit " << run.exitCode << ", " << bytes.size() << " bytes: " << run.err;
 }
 
 const Generated& tsgen(const std::string& args) {
@@ -202,8 +198,8 @@ std::map<std::string, std::string> ffprobe(const std::string& file) {
         std::string key = line.substr(0, eq), value = line.substr(eq + 1);
         key = key.rfind("programs.program.0.", 0) == 0 ? "p." + key.substr(19) : key;
         key = key.rfind("streams.stream.", 0) == 0 ? key.substr(15) : key;
-        const bool quoted = value.size() >= 2 && value.front() == '"' && value.back() == '"';
-        values[key] = quoted ? value.substr(1, value.size() - 2) : value;
+        value.erase(std::remove(value.begin(), value.end(), '"'), value.end());
+        values[key] = value;
     }
     return values;
 }

@@ -122,15 +122,11 @@ const VariantCase kVariants[] = {
      }},
     {"NoAud", "", "--no-aud",
      [](const Generated& v, const Generated& c) {
-         for (const auto& p : v.ts.pesOf(0x111)) {
-             const auto nals = nalTypes(p.payload);
-             EXPECT_EQ(std::count(nals.begin(), nals.end(), 9), 0);
-         }
-         for (const auto& p : c.ts.pesOf(0x111)) {
-             const auto nals = nalTypes(p.payload);
-             ASSERT_FALSE(nals.empty());
-             EXPECT_EQ(nals[0], 9);
-         }
+         // Emulation prevention keeps 00 00 01 out of NAL units: this finds start codes only.
+         for (const auto& p : v.ts.pesOf(0x111))
+             EXPECT_FALSE(contains(p.payload, "00 00 01 09"));
+         for (const auto& p : c.ts.pesOf(0x111))
+             EXPECT_EQ(nalTypes(p.payload).at(0), 9);
      }},
     {"NoVui", "", "--no-vui",
      [](const Generated& v, const Generated&) {

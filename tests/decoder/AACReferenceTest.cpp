@@ -36,92 +36,63 @@ struct Demuxed {
     std::vector<uint8_t> extradata;
     int sampleRate = 0;
     int channels = 0;
-    int profile = 0;
     bool ok = false;
+    // With ADTS through aac_adtstoasc: raw access units and the configuration it derives.
+    std::vector<std::vector<uint8_t>> raw;
+    std::vector<uint8_t> asc;
 };
 
-// The audio packets of a file as FFmpeg's demuxer (and parser) splits them.
-Demuxed demux(const std::string& path, const char* format = nullptr) {
+// The audio packets of a file as FFmpeg's demuxer (and parser) splits them; with
+// `adtsToAsc`, also passed through FFmpeg's aac_adtstoasc filter.
+Demuxed demux(const std::string& path, const char* format = nullptr, bool adtsToAsc = false) {
     Demuxed out;
     AVFormatContext* ctx = nullptr;
     const AVInputFormat* input = format ? av_find_input_format(format) : nullptr;
     if (avformat_open_input(&ctx, path.c_str(), input, nullptr) < 0) {
         return out;
     }
-    if (avformat_find_stream_info(ctx, nullptr) >= 0) {
-        const int index = av_find_best_stream(ctx, AVMEDIA_TYPE_AUDIO, -1, -1, nullptr, 0);
-        if (index >= 0) {
-            const AVCodecParameters* par = ctx->streams[index]->codecpar;
-            out.extradata.assign(par->extradata, par->extradata + par->extradata_size);
-            out.sampleRate = par->sample_rate;
-            out.channels = par->ch_layout.nb_channels;
-            out.profile = par->profile;
-            AVPacket* pkt = av_packet_alloc();
-            while (av_read_frame(ctx, pkt) >= 0) {
-                if (pkt->stream_index == index) {
-                    out.packets.push_back(
-                        {std::vector<uint8_t>(pkt->data, pkt->data + pkt->size), pkt->pts});
-                }
-                av_packet_unref(pkt);
-            }
-            av_packet_free(&pkt);
-            out.ok = true;
-        }
-    }
-    avformat_close_input(&ctx);
-    return out;
-}
-
-// ADTS packets through FFmpeg's aac_adtstoasc: raw access units and the
-// AudioSpecificConfig it derives.
-bool adtsToRaw(const std::string& path, std::vector<std::vector<uint8_t>>* units,
-               std::vector<uint8_t>* asc, const char* format = "aac") {
-    AVFormatContext* ctx = nullptr;
-    const AVInputFormat* input = format ? av_find_input_format(format) : nullptr;
-    if (avformat_open_input(&ctx, path.c_str(), input, nullptr) < 0) {
-        return false;
-    }
-    bool ok = false;
     AVBSFContext* bsf = nullptr;
     const int index = avformat_find_stream_info(ctx, nullptr) >= 0
                           ? av_find_best_stream(ctx, AVMEDIA_TYPE_AUDIO, -1, -1, nullptr, 0)
                           : -1;
-    if (index >= 0 && av_bsf_alloc(av_bsf_get_by_name("aac_adtstoasc"), &bsf) >= 0) {
-        avcodec_parameters_copy(bsf->par_in, ctx->streams[index]->codecpar);
-        bsf->time_base_in = ctx->streams[index]->time_base;
-        if (av_bsf_init(bsf) >= 0) {
-            AVPacket* pkt = av_packet_alloc();
-            while (av_read_frame(ctx, pkt) >= 0) {
-                if (pkt->stream_index != index) {
-                    av_packet_unref(pkt);
-                    continue;
-                }
-                if (av_bsf_send_packet(bsf, pkt) < 0) {
-                    av_packet_unref(pkt);
-                    break;
-                }
+    if (index >= 0) {
+        const AVCodecParameters* par = ctx->streams[index]->codecpar;
+        out.extradata.assign(par->extradata, par->extradata + par->extradata_size);
+        out.sampleRate = par->sample_rate;
+        out.channels = par->ch_layout.nb_channels;
+        out.ok =
+            !adtsToAsc || (av_bsf_alloc(av_bsf_get_by_name("aac_adtstoasc"), &bsf) >= 0 &&
+                           avcodec_parameters_copy(bsf->par_in, par) >= 0 && av_bsf_init(bsf) >= 0);
+        AVPacket* pkt = av_packet_alloc();
+        while (out.ok && av_read_frame(ctx, pkt) >= 0) {
+            if (pkt->stream_index == index) {
+                out.packets.push_back(
+                    {std::vector<uint8_t>(pkt->data, pkt->data + pkt->size), pkt->pts});
+            }
+            if (bsf != nullptr && pkt->stream_index == index) {
+                out.ok = av_bsf_send_packet(bsf, pkt) >= 0;
                 while (av_bsf_receive_packet(bsf, pkt) >= 0) {
                     size_t sideSize = 0;
                     const uint8_t* side =
                         av_packet_get_side_data(pkt, AV_PKT_DATA_NEW_EXTRADATA, &sideSize);
-                    if (side != nullptr && asc->empty()) {
-                        asc->assign(side, side + sideSize);
+                    if (side != nullptr && out.asc.empty()) {
+                        out.asc.assign(side, side + sideSize);
                     }
-                    units->emplace_back(pkt->data, pkt->data + pkt->size);
+                    out.raw.emplace_back(pkt->data, pkt->data + pkt->size);
                     av_packet_unref(pkt);
                 }
             }
-            av_packet_free(&pkt);
-            if (asc->empty() && bsf->par_out->extradata_size > 0) {
-                asc->assign(bsf->par_out->extradata,
-                            bsf->par_out->extradata + bsf->par_out->extradata_size);
-            }
-            ok = true;
+            av_packet_unref(pkt);
+        }
+        av_packet_free(&pkt);
+        if (bsf != nullptr && out.asc.empty()) {
+            out.asc.assign(bsf->par_out->extradata,
+                           bsf->par_out->extradata + bsf->par_out->extradata_size);
         }
     }
     av_bsf_free(&bsf);
     avformat_close_input(&ctx);
-    return ok;
+    return out;
 }
 
 struct Decoded {
@@ -242,14 +213,13 @@ TEST_F(AACReferenceTest, FfmpegAdtsAndLatmGiveFfmpegsUnits) {
                adts));
     ASSERT_TRUE(ffmpeg("-i " + adts + " -c:a copy -f latm " + latm));
 
-    std::vector<std::vector<uint8_t>> reference;
-    std::vector<uint8_t> asc;
-    ASSERT_TRUE(adtsToRaw(adts, &reference, &asc));
+    const Demuxed adtsPackets = demux(adts, "aac", true);
+    ASSERT_TRUE(adtsPackets.ok);
+    const auto& reference = adtsPackets.raw;
+    const auto& asc = adtsPackets.asc;
     ASSERT_GT(reference.size(), 100u);
     EXPECT_EQ(0x11, asc[0]);  // AAC LC, 48 kHz, stereo
 
-    const Demuxed adtsPackets = demux(adts, "aac");
-    ASSERT_TRUE(adtsPackets.ok);
     std::vector<Unit> units;
     expectSameUnitsThreeWays(adtsPackets.packets, AACMediaExtractor::TRANSPORT_LAYER_ADTS, &units);
     expectUnits(units, reference, asc);
@@ -273,11 +243,10 @@ TEST_F(AACReferenceTest, ExoPlayerAdtsSamples) {
     if (plain.empty() || withId3.empty()) {
         GTEST_SKIP() << "sample streams not found in " << TAVO_SHARED_STREAMS_DIR;
     }
-    std::vector<std::vector<uint8_t>> reference;
-    std::vector<uint8_t> asc;
-    ASSERT_TRUE(adtsToRaw(plain, &reference, &asc));
-    const Demuxed packets = demux(plain, "aac");
+    const Demuxed packets = demux(plain, "aac", true);
     ASSERT_TRUE(packets.ok);
+    const auto& reference = packets.raw;
+    const auto& asc = packets.asc;
     std::vector<Unit> units;
     expectSameUnitsThreeWays(packets.packets, AACMediaExtractor::TRANSPORT_LAYER_ADTS, &units);
     expectUnits(units, reference, asc);
@@ -290,10 +259,10 @@ TEST_F(AACReferenceTest, ExoPlayerAdtsSamples) {
     // by a tag instead of a sync word before sync is established, is not trusted, so
     // the configuration takes the second frame's place and audio starts with the
     // third. FFmpeg's demuxer knows ID3 and keeps the first frame.
-    std::vector<std::vector<uint8_t>> taggedReference;
-    std::vector<uint8_t> taggedAsc;
-    ASSERT_TRUE(adtsToRaw(withId3, &taggedReference, &taggedAsc));
-    EXPECT_EQ(asc, taggedAsc);
+    const Demuxed taggedRef = demux(withId3, "aac", true);
+    ASSERT_TRUE(taggedRef.ok);
+    const auto& taggedReference = taggedRef.raw;
+    EXPECT_EQ(asc, taggedRef.asc);
     const std::vector<uint8_t> file = test::readFile(withId3);
     ASSERT_FALSE(file.empty());
     const auto tagged =
@@ -368,7 +337,7 @@ TEST_P(AACTsgenTest, UnitsAndTimesMatchFfmpeg) {
     ASSERT_TRUE(test::runCommand(std::string(TAVO_TSGEN_PATH) + " -o " + path +
                                  " -d 2 --size 160x120 --audio " + (c.adts ? "adts " : "latm ") +
                                  c.args + " >/dev/null 2>&1"));
-    const Demuxed ref = demux(path);
+    const Demuxed ref = demux(path, nullptr, c.adts);
     ASSERT_TRUE(ref.ok);
     ASSERT_GT(ref.packets.size(), 50u);
     const auto units = extract(
@@ -379,10 +348,7 @@ TEST_P(AACTsgenTest, UnitsAndTimesMatchFfmpeg) {
         EXPECT_EQ(ref.packets[i].pts, units[i].pts) << "unit " << i;
     }
     if (c.adts) {
-        std::vector<std::vector<uint8_t>> reference;
-        std::vector<uint8_t> asc;
-        ASSERT_TRUE(adtsToRaw(path, &reference, &asc, nullptr));
-        expectUnits(units, reference, asc);
+        expectUnits(units, ref.raw, ref.asc);
     }
     const Decoded decoded = decodeRaw(units[0].bytes, units);
     EXPECT_EQ(0, decoded.errors);

@@ -12,6 +12,8 @@
 namespace TavoPlayer::test {
 namespace {
 
+using tsgen::CaptionWriter;
+
 constexpr int64_t kMuxRate = 2000000;
 constexpr int64_t kStartPts = 900000;
 constexpr int64_t kSlot27 = ticks27PerPacket(kMuxRate);  // 752 us per packet
@@ -107,7 +109,7 @@ TEST_F(TsgenMuxTest, AudioPesFollowOneAnotherByOneFrame) {
 TEST_F(TsgenMuxTest, CaptionStatementsCarryTheTextAtTheirTimes) {
     // The data groups' layout is checked byte by byte with the caption writer;
     // here the PES carry them whole and consistent, at their times.
-    const auto management = tsgen::CaptionWriter::managementPayload();
+    const auto management = CaptionWriter::managementPayload();
     std::vector<std::pair<int64_t, std::vector<uint8_t>>> statements;
     size_t managementCount = 0;
     for (const auto& p : mTs.pesOf(0x130)) {
@@ -116,7 +118,7 @@ TEST_F(TsgenMuxTest, CaptionStatementsCarryTheTextAtTheirTimes) {
         // data_group_size, and a CRC_16 that leaves no remainder (ARIB STD-B24).
         ASSERT_GE(p.payload.size(), 10u);
         EXPECT_EQ(p.payload.size(), 3 + 5 + ((p.payload[6] << 8) | p.payload[7]) + 2u);
-        EXPECT_EQ(tsgen::CaptionWriter::crc16(p.payload.data() + 3, p.payload.size() - 3), 0);
+        EXPECT_EQ(CaptionWriter::crc16(p.payload.data() + 3, p.payload.size() - 3), 0);
         managementCount += p.payload == management ? 1 : 0;
         if (p.payload != management)
             statements.emplace_back(p.pts, p.payload);
@@ -125,9 +127,8 @@ TEST_F(TsgenMuxTest, CaptionStatementsCarryTheTextAtTheirTimes) {
     EXPECT_EQ(managementCount, 3u);
     // "Olá" in the Latin set, \n as APR (0x0D); \f as CS (0x0C).
     const std::vector<std::pair<int64_t, std::vector<uint8_t>>> expected = {
-        {kStartPts + 90000,
-         tsgen::CaptionWriter::statementPayload(hex("4F 6C E1 0D 6D 75 6E 64 6F"))},
-        {kStartPts + 225000, tsgen::CaptionWriter::statementPayload({0x0C})}};
+        {kStartPts + 90000, CaptionWriter::statementPayload(hex("4F 6C E1 0D 6D 75 6E 64 6F"))},
+        {kStartPts + 225000, CaptionWriter::statementPayload({0x0C})}};
     EXPECT_EQ(statements, expected);
 }
 

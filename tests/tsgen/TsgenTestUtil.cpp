@@ -13,6 +13,9 @@
 
 namespace TavoPlayer::test {
 
+namespace {
+
+// A path in a temporary folder of this test process, removed when it exits.
 std::string tempPath(const std::string& name) {
     static struct Folder {
         Folder() { std::filesystem::create_directories(path); }
@@ -23,6 +26,13 @@ std::string tempPath(const std::string& name) {
     return folder.path + "/" + name;
 }
 
+std::vector<uint8_t> readFile(const std::string& file) {
+    std::ifstream in(file, std::ios::binary);
+    return {std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>()};
+}
+
+}  // namespace
+
 CommandResult runCommand(const std::string& command) {
     static int count = 0;
     const std::string out = tempPath("out" + std::to_string(++count)), err = out + ".err";
@@ -31,11 +41,6 @@ CommandResult runCommand(const std::string& command) {
     return {WIFEXITED(status) ? WEXITSTATUS(status) : -1,
             {outBytes.begin(), outBytes.end()},
             {errBytes.begin(), errBytes.end()}};
-}
-
-std::vector<uint8_t> readFile(const std::string& file) {
-    std::ifstream in(file, std::ios::binary);
-    return {std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>()};
 }
 
 std::vector<uint8_t> hex(const std::string& text) {
@@ -187,29 +192,6 @@ const Generated& tsgen(const std::string& args) {
         slot.reset(new Generated{std::move(run), file, bytes, TsFile(bytes, packetSize)});
     }
     return *slot;
-}
-
-std::map<std::string, std::string> ffprobe(const std::string& file) {
-    std::istringstream lines(
-        runCommand("ffprobe -v error -show_programs -show_streams -of flat '" + file + "'").out);
-    std::map<std::string, std::string> values;
-    for (std::string line; std::getline(lines, line);) {
-        const auto eq = line.find('=');
-        std::string key = line.substr(0, eq), value = line.substr(eq + 1);
-        key = key.rfind("programs.program.0.", 0) == 0 ? "p." + key.substr(19) : key;
-        key = key.rfind("streams.stream.", 0) == 0 ? key.substr(15) : key;
-        value.erase(std::remove(value.begin(), value.end(), '"'), value.end());
-        values[key] = value;
-    }
-    return values;
-}
-
-void expectProbe(std::map<std::string, std::string> probe, const std::string& expected) {
-    std::istringstream items(expected);
-    for (std::string item; items >> item;) {
-        const auto eq = item.find('=');
-        EXPECT_EQ(probe[item.substr(0, eq)], item.substr(eq + 1)) << item.substr(0, eq);
-    }
 }
 
 std::vector<int> nalTypes(const std::vector<uint8_t>& es) {

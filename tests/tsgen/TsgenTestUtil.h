@@ -18,9 +18,6 @@ struct CommandResult {
 };
 
 CommandResult runCommand(const std::string& command);
-// A path in a temporary folder of this test process, removed when it exits.
-std::string tempPath(const std::string& name);
-std::vector<uint8_t> readFile(const std::string& file);
 // "56 E0 11" -> {0x56, 0xE0, 0x11}; stops at the first word that is not hex.
 std::vector<uint8_t> hex(const std::string& text);
 bool contains(const std::vector<uint8_t>& bytes, const std::string& hexBytes);
@@ -81,12 +78,6 @@ struct Generated {
     ::testing::AssertionResult ok() const;
 };
 const Generated& tsgen(const std::string& args);
-
-// ffprobe's flat view of a file, keys shortened: "p." for the first programme,
-// "N." for stream N (e.g. "p.pcr_pid", "1.codec_name").
-std::map<std::string, std::string> ffprobe(const std::string& file);
-// Checks that view against "key=value" items separated by spaces.
-void expectProbe(std::map<std::string, std::string> probe, const std::string& expected);
 
 // NAL unit types of an Annex B byte stream, in order.
 std::vector<int> nalTypes(const std::vector<uint8_t>& es);

@@ -7,6 +7,7 @@
 
 #include <algorithm>
 #include <functional>
+#include <map>
 
 #include "TsgenTestUtil.h"
 
@@ -30,25 +31,20 @@ void expectMislabelled(const TsFile& ts, const char* pmtEntry, int sync, int syn
 // unit that starts in it, or none.
 std::function<void(const Generated&, const Generated&)> sameUnits(uint16_t pid) {
     return [pid](const Generated& variant, const Generated& clean) {
-        const auto plain = clean.ts.pesOf(pid);
-        const auto cut = variant.ts.pesOf(pid);
-        EXPECT_NE(cut.size(), plain.size());
-
+        std::map<size_t, int64_t> unitPts;  // elementary stream offset of each unit -> its PTS
         std::vector<uint8_t> plainEs, cutEs;
-        std::vector<size_t> unitStarts;
-        for (const auto& p : plain) {
-            unitStarts.push_back(plainEs.size());
+        for (const auto& p : clean.ts.pesOf(pid)) {
+            unitPts[plainEs.size()] = p.pts;
             plainEs.insert(plainEs.end(), p.payload.begin(), p.payload.end());
         }
-        size_t unit = 0;
+        const auto cut = variant.ts.pesOf(pid);
+        EXPECT_NE(cut.size(), unitPts.size());
         for (const auto& p : cut) {
-            const size_t offset = cutEs.size();
+            const auto first = unitPts.lower_bound(cutEs.size());
             cutEs.insert(cutEs.end(), p.payload.begin(), p.payload.end());
-            while (unit < unitStarts.size() && unitStarts[unit] < offset)
-                ++unit;
-            const bool starts = unit < unitStarts.size() && unitStarts[unit] < cutEs.size();
+            const bool starts = first != unitPts.end() && first->first < cutEs.size();
             EXPECT_EQ(p.hasPts, starts);
-            EXPECT_TRUE(!starts || p.pts == plain[unit].pts) << "PES at " << offset;
+            EXPECT_TRUE(!starts || p.pts == first->second) << "PES at " << first->first;
         }
         EXPECT_EQ(cutEs, plainEs);
         EXPECT_EQ(decodeErrors(variant.file), "");
@@ -167,12 +163,10 @@ const VariantCase kVariants[] = {
      }},
     {"Packets204", "", "--packet-size 204",
      [](const Generated& v, const Generated& c) {
-         ASSERT_EQ(v.ts.packets.size(), c.ts.packets.size());
-         for (size_t i = 0; i < v.ts.packets.size(); ++i) {
-             ASSERT_TRUE(std::equal(v.bytes.begin() + i * 204, v.bytes.begin() + i * 204 + 188,
-                                    c.bytes.begin() + i * 188))
-                 << "packet " << i;
-         }
+         std::vector<uint8_t> first188;
+         for (size_t at = 0; at < v.bytes.size(); at += 204)
+             first188.insert(first188.end(), v.bytes.begin() + at, v.bytes.begin() + at + 188);
+         EXPECT_TRUE(first188 == c.bytes);
      }},
     {"TimebaseJump", "", "--timebase-jump 1:5000",
      [](const Generated& v, const Generated& c) {

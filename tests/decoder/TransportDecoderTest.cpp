@@ -42,46 +42,18 @@ public:
         stream.push_back(mType == TT_MP4_LOAS ? 0x56 : 0xFF);
         stream.push_back(mType == TT_MP4_LOAS ? 0xE0 : 0xF1);
         std::vector<Outcome> out;
-        size_t offset = 0;
-        if (chunk == 0) {
-            chunk = stream.size();
-        }
-        bool more = true;
-        while (more) {
-            uint32_t size = static_cast<uint32_t>(std::min(chunk, stream.size() - offset));
+        chunk = chunk == 0 ? stream.size() : chunk;
+        for (size_t offset = 0; offset < stream.size(); offset += chunk) {
+            const auto size = static_cast<uint32_t>(std::min(chunk, stream.size() - offset));
             uint32_t valid = size;
-            while (valid > 0 || more) {
+            do {  // until the decoder has taken the whole fill
                 EXPECT_EQ(TRANSPORTDEC_OK,
                           transportDec_FillData(mHandle, stream.data() + offset, size, &valid, 0));
-                // Read until the decoder needs bytes.
-                for (;;) {
-                    const uint32_t error = transportDec_ReadAccessUnit(mHandle, 0);
-                    if (error == TRANSPORTDEC_NOT_ENOUGH_BITS) {
-                        break;
-                    }
-                    Outcome o{error, {}};
-                    if (error == TRANSPORTDEC_OK) {
-                        const uint32_t bits = transportDec_GetAuBitsTotal(mHandle, 0);
-                        EXPECT_EQ(0u, bits % 8);
-                        EXPECT_EQ(static_cast<int32_t>(bits),
-                                  transportDec_GetAuBitsRemaining(mHandle, 0));
-                        o.unit.resize(bits / 8);
-                        TransportBitReader* r = transportDec_GetBitstream(mHandle, 0);
-                        for (auto& b : o.unit) {
-                            b = static_cast<uint8_t>(r->readBits(8));
-                        }
-                        EXPECT_FALSE(r->overrun());
-                        EXPECT_EQ(0, transportDec_GetAuBitsRemaining(mHandle, 0));
-                        transportDec_EndAccessUnit(mHandle);
-                    }
-                    out.push_back(std::move(o));
+                for (uint32_t error; (error = transportDec_ReadAccessUnit(mHandle, 0)) !=
+                                     TRANSPORTDEC_NOT_ENOUGH_BITS;) {
+                    out.push_back(take(error));
                 }
-                if (valid == 0) {
-                    break;
-                }
-            }
-            offset += size;
-            more = offset < stream.size();
+            } while (valid > 0);
         }
         return out;
     }
@@ -89,6 +61,24 @@ public:
     std::vector<CSAudioSpecificConfig> configs;
 
 private:
+    // The unit of a successful read, read to its last bit through the decoder's reader.
+    Outcome take(uint32_t error) {
+        Outcome o{error, {}};
+        if (error == TRANSPORTDEC_OK) {
+            const uint32_t bits = transportDec_GetAuBitsTotal(mHandle, 0);
+            EXPECT_EQ(0u, bits % 8);
+            EXPECT_EQ(static_cast<int32_t>(bits), transportDec_GetAuBitsRemaining(mHandle, 0));
+            o.unit.resize(bits / 8);
+            TransportBitReader* r = transportDec_GetBitstream(mHandle, 0);
+            for (auto& b : o.unit) {
+                b = static_cast<uint8_t>(r->readBits(8));
+            }
+            EXPECT_FALSE(r->overrun());
+            EXPECT_EQ(0, transportDec_GetAuBitsRemaining(mHandle, 0));
+            transportDec_EndAccessUnit(mHandle);
+        }
+        return o;
+    }
     static int32_t onConfig(void* self, const CSAudioSpecificConfig* config, unsigned char,
                             unsigned char*) {
         static_cast<Harness*>(self)->configs.push_back(*config);

@@ -101,21 +101,19 @@ TEST(CaptionWriterTest, TextBecomesLatinCaptionCodesOrIsRefusedWithAReason) {
     const struct {
         const char* text;
         const char* codesOrError;  // hex codes, or the reason for refusing
-    } kCases[] = {
-        {"Ola", "4F 6C 61"},
-        {"Olá ç", "4F 6C E1 20 E7"},
-        {"€ŠšŽžŒœŸ", "A4 A6 A8 B4 B8 BC BD BE"},
-        {"a\\x1D\\x21b", "61 1D 21 62"},
-        {"\\f\\n\\\\", "0C 0D 5C"},
-        {"\\x1", "two hex digits"},
-        {"\\xg0", "two hex digits"},
-        {"a\\", "lone backslash"},
-        {"\\q", "unknown escape"},
-        {"中", "no Latin caption code"},
-        {"\xC3", "not valid UTF-8"},
-        {"\xC3(", "not valid UTF-8"},
-        {"\x80", "not valid UTF-8"},
-    };
+    } kCases[] = {{"Ola", "4F 6C 61"},
+                  {"Olá ç", "4F 6C E1 20 E7"},
+                  {"€ŠšŽžŒœŸ", "A4 A6 A8 B4 B8 BC BD BE"},
+                  {"a\\x1D\\x21b", "61 1D 21 62"},
+                  {"\\f\\n\\\\", "0C 0D 5C"},
+                  {"\\x1", "two hex digits"},
+                  {"\\xg0", "two hex digits"},
+                  {"a\\", "lone backslash"},
+                  {"\\q", "unknown escape"},
+                  {"中", "no Latin caption code"},
+                  {"\xC3", "not valid UTF-8"},
+                  {"\xC3(", "not valid UTF-8"},
+                  {"\x80", "not valid UTF-8"}};
     for (const auto& c : kCases) {
         std::vector<uint8_t> codes;
         std::string error;
@@ -150,18 +148,14 @@ TEST(CaptionWriterTest, DataGroupsLayoutAndCrc) {
 }
 
 TEST(TsMuxerPesHeaderTest, TimestampsAreReducedTo33BitsAndLongVideoIsUnbounded) {
-    PesUnit unit;
-    unit.payload = {1, 2, 3};
-    unit.pts = (int64_t{1} << 33) + 1;  // wraps to 1
-    unit.dts = (int64_t{1} << 33) - 1;
-    unit.hasDts = true;
+    // PTS 2^33 + 1 wraps to 1; DTS 2^33 - 1 stays.
+    PesUnit unit{{1, 2, 3}, (int64_t{1} << 33) + 1, (int64_t{1} << 33) - 1, true};
     // ISO/IEC 13818-1, 2.4.3.7: '0011' PTS 1, '0001' DTS 2^33 - 1, marker bits set.
     EXPECT_EQ(TsMuxer::pesHeader(0xE0, unit),
               hex("00 00 01 E0 00 10 84 C0 0A  31 00 01 00 03  1F FF FF FF FF"));
     unit.payload.assign(70000, 0);
     const auto h = TsMuxer::pesHeader(0xE0, unit);
-    EXPECT_EQ(h[4], 0);
-    EXPECT_EQ(h[5], 0);
+    EXPECT_EQ((h[4] << 8) | h[5], 0);  // PES_packet_length 0: unbounded
 }
 
 // A Baseline SPS bit by bit (ITU-T H.264, 7.3.2.1.1): NAL header 0x67,

@@ -121,19 +121,18 @@ void finishPes(const std::vector<uint8_t>& b, uint64_t first, std::vector<Pes>& 
 
 std::vector<Pes> TsFile::pesOf(uint16_t pid) const {
     std::vector<Pes> out;
-    std::vector<uint8_t> bytes;
-    const TsPacket* first = nullptr;
+    std::vector<uint8_t> bytes;  // the PES being gathered; none before the first unit start
+    uint64_t first = 0;
     for (const auto* p : packetsOf(pid)) {
         if (p->pusi && !p->payload.empty()) {
-            if (first != nullptr)
-                finishPes(bytes, first->position, out);
-            bytes.clear();
-            first = p;
+            finishPes(bytes, first, out);
+            bytes.assign(p->payload.begin(), p->payload.end());
+            first = p->position;
+        } else if (!bytes.empty()) {
+            bytes.insert(bytes.end(), p->payload.begin(), p->payload.end());
         }
-        bytes.insert(bytes.end(), p->payload.begin(), p->payload.end());
     }
-    if (first != nullptr)
-        finishPes(bytes, first->position, out);
+    finishPes(bytes, first, out);
     return out;
 }
 
@@ -196,12 +195,9 @@ const Generated& tsgen(const std::string& args) {
 
 std::vector<int> nalTypes(const std::vector<uint8_t>& es) {
     std::vector<int> types;
-    for (size_t i = 0; i + 3 < es.size(); ++i) {
-        if (es[i] == 0 && es[i + 1] == 0 && es[i + 2] == 1) {
+    for (size_t i = 0; i + 3 < es.size(); ++i)
+        if (es[i] == 0 && es[i + 1] == 0 && es[i + 2] == 1)
             types.push_back(es[i + 3] & 0x1F);
-            i += 2;
-        }
-    }
     return types;
 }
 

@@ -106,7 +106,8 @@ TEST_F(TsgenMuxTest, CaptionStatementsCarryTheTextAtTheirTimes) {
     // The data groups' layout is checked byte by byte with the caption writer;
     // here the PES carry them whole and consistent, at their times.
     const auto management = CaptionWriter::managementPayload();
-    std::vector<std::pair<int64_t, std::vector<uint8_t>>> statements;
+    using Timed = std::vector<std::pair<int64_t, std::vector<uint8_t>>>;  // PTS, PES payload
+    Timed statements;
     size_t managementCount = 0;
     for (const auto& p : mTs.pesOf(0x130)) {
         EXPECT_EQ(p.streamId, 0xBD);
@@ -122,10 +123,9 @@ TEST_F(TsgenMuxTest, CaptionStatementsCarryTheTextAtTheirTimes) {
     // Management data every second from the start, before the statements.
     EXPECT_EQ(managementCount, 3u);
     // "Olá" in the Latin set, \n as APR (0x0D); \f as CS (0x0C).
-    const std::vector<std::pair<int64_t, std::vector<uint8_t>>> expected = {
-        {kStartPts + 90000, CaptionWriter::statementPayload(hex("4F 6C E1 0D 6D 75 6E 64 6F"))},
-        {kStartPts + 225000, CaptionWriter::statementPayload({0x0C})}};
-    EXPECT_EQ(statements, expected);
+    EXPECT_EQ(statements, (Timed{{kStartPts + 90000, CaptionWriter::statementPayload(
+                                                         hex("4F 6C E1 0D 6D 75 6E 64 6F"))},
+                                 {kStartPts + 225000, CaptionWriter::statementPayload({0x0C})}}));
 }
 
 }  // namespace

@@ -181,13 +181,11 @@ const VariantCase kVariants[] = {
              const auto before = c.ts.pesOf(pid);
              const auto after = v.ts.pesOf(pid);
              ASSERT_EQ(before.size(), after.size());
-             size_t moved = 0;
+             EXPECT_GE(after.back().firstPacket, mark);  // some PES come after the mark
              for (size_t i = 0; i < before.size(); ++i) {
                  const bool late = after[i].firstPacket >= mark;
                  EXPECT_EQ(after[i].pts - before[i].pts, late ? 450000 : 0) << pid << " PES " << i;
-                 moved += late ? 1 : 0;
              }
-             EXPECT_GT(moved, 0u);
          }
      }},
     {"CutVideoSmall", "", "--video-pes-bytes 777", sameUnits(0x111)},

@@ -61,8 +61,8 @@ TEST(AacFramerTest, FramesMatchTheSyntaxTables) {
     // 000 (AOT 2, index 3, 2 channels).
     const AacFramer framer(2, 3, 2);
     EXPECT_EQ(framer.audioSpecificConfig(), hex("11 90"));
-    const std::vector<uint8_t> hundred(100, 0x5A), ten(10, 0xAB);
-    std::vector<uint8_t> adts, loas, loasSameConfig;
+    const std::vector<uint8_t> hundred(100, 0x5A), ten(10, 0xAB), long600(600, 0x01);
+    std::vector<uint8_t> adts, loas, loasSameConfig, loasLong;
     ASSERT_EQ(framer.appendAdts(hundred.data(), hundred.size(), adts), 0);
     ASSERT_EQ(framer.appendLoas(ten.data(), ten.size(), loas), 0);
     ASSERT_EQ(framer.appendLoas(ten.data(), ten.size(), loasSameConfig, false), 0);
@@ -81,15 +81,12 @@ TEST(AacFramerTest, FramesMatchTheSyntaxTables) {
     EXPECT_EQ(loasSameConfig, hex("56 E0 0C 85 55 D5 D5 D5 D5 D5 D5 D5 D5 D5 80"));
     // 600 = 255 + 255 + 90: three PayloadLengthInfo bytes, so 45 + 24 + 4800
     // bits after the sync header, rounded up to 609 bytes.
-    const std::vector<uint8_t> raw(600, 0x01);
-    std::vector<uint8_t> out;
-    ASSERT_EQ(framer.appendLoas(raw.data(), raw.size(), out), 0);
-    EXPECT_EQ(((out[1] & 0x1F) << 8) | out[2], 609);
-    EXPECT_EQ(out.size(), 3u + 609u);
+    ASSERT_EQ(framer.appendLoas(long600.data(), long600.size(), loasLong), 0);
+    EXPECT_EQ(((loasLong[1] & 0x1F) << 8) | loasLong[2], 609);
+    EXPECT_EQ(loasLong.size(), 3u + 609u);
     for (const auto& [rate, index] :
-         {std::pair{48000, 3}, {44100, 4}, {24000, 6}, {8000, 11}, {47999, -1}}) {
+         {std::pair{48000, 3}, {44100, 4}, {24000, 6}, {8000, 11}, {47999, -1}})
         EXPECT_EQ(AacFramer::samplingFrequencyIndex(rate), index) << rate;
-    }
 }
 
 // The letters that ISO 8859-1 lacks take their ISO 8859-15 positions; \x1D\x21

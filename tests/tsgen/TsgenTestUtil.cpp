@@ -175,11 +175,6 @@ std::vector<std::pair<uint64_t, int64_t>> pcrAnomalies(const TsFile& ts, int64_t
     return anomalies;
 }
 
-::testing::AssertionResult Generated::ok() const {
-    return ::testing::AssertionResult(run.exitCode == 0 && ts.valid)
-           << "tsgen exit " << run.exitCode << ", " << bytes.size() << " bytes: " << run.err;
-}
-
 const Generated& tsgen(const std::string& args) {
     static std::map<std::string, std::unique_ptr<Generated>> made;
     auto& slot = made[args];

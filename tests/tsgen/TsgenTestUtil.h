@@ -75,7 +75,10 @@ struct Generated {
     std::string file;
     std::vector<uint8_t> bytes;
     TsFile ts;
-    ::testing::AssertionResult ok() const;
+    ::testing::AssertionResult ok() const {
+        return ::testing::AssertionResult(run.exitCode == 0 && ts.valid)
+               << "tsgen exit " << run.exitCode << ", " << bytes.size() << " bytes: " << run.err;
+    }
 };
 const Generated& tsgen(const std::string& args);
 

@@ -60,11 +60,8 @@ struct VariantCase {
     const char* args;
     // Checks the variant; `clean` is the same stream without it.
     std::function<void(const Generated& variant, const Generated& clean)> check;
+    friend void PrintTo(const VariantCase& c, std::ostream* os) { *os << c.name; }
 };
-
-void PrintTo(const VariantCase& c, std::ostream* os) {
-    *os << c.name;
-}
 
 class TsgenVariantTest : public ::testing::TestWithParam<VariantCase> {};
 
@@ -112,10 +109,9 @@ const VariantCase kVariants[] = {
      [](const Generated& v, const Generated& c) {
          const auto anomalies = pcrAnomalies(v.ts, kMuxRate);
          ASSERT_EQ(anomalies.size(), 1u);
-         // The missing packets' time: 300 ms rounded to whole slots.
+         // The missing packets' time: 300 ms rounded to whole slots of 1504 bits.
          EXPECT_NEAR(anomalies[0].second, 300 * 27000, ticks27PerPacket(kMuxRate) + 1);
-         const double missing = static_cast<double>(c.ts.packets.size() - v.ts.packets.size());
-         EXPECT_NEAR(missing, 0.3 * kMuxRate / (188 * 8), 1.0);
+         EXPECT_NEAR(double(c.ts.packets.size() - v.ts.packets.size()), 0.3 * kMuxRate / 1504, 1.0);
          // The lost stretch breaks the counters of the streams that were sending.
          EXPECT_EQ(v.ts.continuityErrors().count(0x111), 1u);
      }},

@@ -84,13 +84,10 @@ std::vector<TsPacket> packetizePes(uint16_t pid, const std::vector<uint8_t>& pes
     size_t offset = 0;
     do {
         const size_t take = std::min<size_t>(184, pes.size() - offset);
-        std::vector<uint8_t> chunk(pes.begin() + offset, pes.begin() + offset + take);
-        packets.push_back(TsPacketBuilder()
-                              .pid(pid)
-                              .unitStart(offset == 0)
-                              .continuity(*counter)
-                              .payload(std::move(chunk))
-                              .build());
+        TsPacketBuilder builder;
+        builder.pid(pid).unitStart(offset == 0).continuity(*counter);
+        builder.payload(std::vector<uint8_t>(pes.begin() + offset, pes.begin() + offset + take));
+        packets.push_back(builder.build());
         *counter = (*counter + 1) & 0x0F;
         offset += take;
     } while (offset < pes.size());

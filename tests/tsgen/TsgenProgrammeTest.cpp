@@ -6,7 +6,6 @@
 
 #include <algorithm>
 #include <cstdlib>
-#include <map>
 #include <sstream>
 
 #include "TsgenTestUtil.h"

@@ -6,8 +6,6 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
-#include <functional>
-#include <map>
 
 #include "TsgenTestUtil.h"
 
@@ -47,7 +45,7 @@ std::function<void(const Generated&, const Generated&)> sameUnits(uint16_t pid) 
             cutEs.insert(cutEs.end(), p.payload.begin(), p.payload.end());
             const bool starts = first != unitPts.end() && first->first < cutEs.size();
             EXPECT_EQ(p.hasPts, starts);
-            EXPECT_TRUE(!starts || p.pts == first->second) << "PES at " << first->first;
+            EXPECT_TRUE(!starts || p.pts == first->second) << "PES ending at " << cutEs.size();
         }
         EXPECT_EQ(cutEs, plainEs);
         EXPECT_EQ(decodeErrors(variant.file), "");

@@ -27,6 +27,11 @@ protected:
     const TsFile& mTs = mGen.ts;
 };
 
+TEST_F(TsgenMuxTest, CountersRunUnbrokenAndNoPacketIsFlagged) {
+    EXPECT_TRUE(mTs.continuityErrors().empty());
+    EXPECT_TRUE(mTs.where([](auto& p) { return p.tei || p.scrambling != 0; }).empty());
+}
+
 TEST_F(TsgenMuxTest, PcrFollowsTheConstantRateAndItsInterval) {
     // The PCR is exact to a tick at the constant rate, and only on the video PID.
     EXPECT_TRUE(pcrAnomalies(mTs, kMuxRate).empty());

@@ -4,7 +4,6 @@
 
 #include <gtest/gtest.h>
 
-#include <algorithm>
 #include <cstdlib>
 #include <sstream>
 
@@ -26,7 +25,7 @@ std::map<std::string, std::string> expectProbe(const std::string& file,
         std::string key = line.substr(0, eq), value = line.substr(eq + 1);
         key = key.rfind("programs.program.0.", 0) == 0 ? "p." + key.substr(19) : key;
         key = key.rfind("streams.stream.", 0) == 0 ? key.substr(15) : key;
-        value.erase(std::remove(value.begin(), value.end(), '"'), value.end());
+        std::erase(value, '"');
         values[key] = value;
     }
     std::istringstream items(expected);
@@ -122,15 +121,14 @@ TEST(TsgenProgrammeTest, DecodedPicturesShowTheirFrameNumber) {
                    "-pix_fmt gray -");
     const size_t frameBytes = 640 * 360;
     ASSERT_EQ(decoded.out.size(), 3 * frameBytes) << decoded.err;
-    size_t frame = 0;
-    for (int expected : {0, 37, 89}) {
+    const int expected[] = {0, 37, 89};
+    for (size_t frame = 0; frame < 3; ++frame) {
         // 24 blocks of 16x16 on the second block row, most significant bit first.
         int number = 0;
         for (size_t x = 16 + 8; x < 25 * 16; x += 16)
             number =
                 (number << 1) | (uint8_t(decoded.out[frame * frameBytes + 24 * 640 + x]) > 128);
-        EXPECT_EQ(number, expected);
-        ++frame;
+        EXPECT_EQ(number, expected[frame]);
     }
 }
 

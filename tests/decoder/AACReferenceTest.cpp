@@ -5,7 +5,6 @@
 // own decoder must decode the units with that configuration.
 #include <gtest/gtest.h>
 
-#include <cstdio>
 #include <filesystem>
 #include <string>
 #include <vector>

@@ -1,10 +1,8 @@
 #include <gtest/gtest.h>
 
-#include <cstdio>
 #include <filesystem>
 #include <map>
 #include <random>
-#include <sstream>
 #include <string>
 #include <vector>
 

@@ -1,11 +1,8 @@
 #include <gtest/gtest.h>
 
 #include <cstdio>
-#include <cstring>
 #include <filesystem>
-#include <fstream>
 #include <map>
-#include <sstream>
 #include <string>
 #include <vector>
 
@@ -67,10 +64,6 @@ std::vector<uint8_t> frame(const HeaderFields& f, size_t length, uint8_t seed) {
     return bytes;
 }
 
-void append(std::vector<uint8_t>& to, const std::vector<uint8_t>& bytes) {
-    to.insert(to.end(), bytes.begin(), bytes.end());
-}
-
 class MP3ExtractorFixture : public ::testing::Test {
 protected:
     void SetUp() override {
@@ -101,7 +94,7 @@ class MP3FrameLengthTest : public MP3ExtractorFixture,
 TEST_P(MP3FrameLengthTest, LengthAndDurationFollowTheTables) {
     const LengthCase& c = GetParam();
     std::vector<uint8_t> es = frame(c.fields, c.length, 1);
-    append(es, frame(c.fields, c.length, 2));
+    es = test::concat({es, frame(c.fields, c.length, 2)});
     const auto units = run({{es, 9000}});
     ASSERT_EQ(units.size(), 2u);
     EXPECT_EQ(units[0].bytes.size(), c.length);
@@ -231,61 +224,56 @@ TEST_F(MP3ExtractorFixture, ResyncSkipsGarbageAndFalseSyncs) {
 
 class MP3RingProtocolTest : public MP3ExtractorFixture {
 protected:
-    std::string dumpRing() {
+    // The reader lock as the ring's dump shows it: "Locked" or "Unlocked".
+    std::string readLock() {
         char* text = nullptr;
         size_t size = 0;
         FILE* stream = open_memstream(&text, &size);
         mRing->dump(stream, 0);
         fclose(stream);
-        std::string result(text, size);
+        const std::string dump(text, size);
         free(text);
-        return result;
+        return dump.find("ReadLock: \e[01;31mLocked") != std::string::npos     ? "Locked"
+               : dump.find("ReadLock: \e[01;32mUnlocked") != std::string::npos ? "Unlocked"
+                                                                               : dump;
     }
+    unsigned int call(unsigned char* flags = nullptr) {
+        long long pts = 0;
+        return mExtractor->getDecodableUnit(mOut.data(), mOut.size(), &mLength, &pts, flags);
+    }
+    Bytes mOut = Bytes(4096);
+    unsigned long mLength = 7;
 };
 
 TEST_F(MP3RingProtocolTest, NoDataReturnsTwoAndHoldsNoLock) {
-    std::vector<uint8_t> out(4096);
-    unsigned long length = 7;
-    long long pts = 0;
     unsigned char flags = 0x5A;
-    EXPECT_EQ(mExtractor->getDecodableUnit(out.data(), out.size(), &length, &pts, &flags),
-              MediaExtractor::RESULT_NO_INPUT);
-    EXPECT_EQ(length, 0u);
+    EXPECT_EQ(call(&flags), MediaExtractor::RESULT_NO_INPUT);
+    EXPECT_EQ(mLength, 0u);
     EXPECT_EQ(flags, 0x5A);  // not touched by this extractor
-    EXPECT_NE(dumpRing().find("ReadLock: \e[01;32mUnlocked"), std::string::npos);
+    EXPECT_EQ(readLock(), "Unlocked");
 }
 
 TEST_F(MP3RingProtocolTest, RecordLargerThanReadableIsAFaultAndNotConsumed) {
     test::TraceCapture trace;
-    ASSERT_TRUE(test::writeRawRecord(*mRing, 5000, 54, 4946, 0, std::vector<uint8_t>(8)));
-    std::vector<uint8_t> out(4096);
-    unsigned long length = 0;
-    long long pts = 0;
-    EXPECT_EQ(mExtractor->getDecodableUnit(out.data(), out.size(), &length, &pts, nullptr),
-              MediaExtractor::RESULT_RING_FAULT);
+    ASSERT_TRUE(test::writeRawRecord(*mRing, 5000, 54, 4946, 0, Bytes(8)));
+    EXPECT_EQ(call(), MediaExtractor::RESULT_RING_FAULT);
     EXPECT_EQ(trace.count(TRACE_ERROR, "getDecodableUnit: RingBuffer fatal errror: 48 5000"), 1u)
         << trace.all();
     EXPECT_EQ(mRing->tail(), 0u);
-    EXPECT_NE(dumpRing().find("ReadLock: \e[01;32mUnlocked"), std::string::npos);
+    EXPECT_EQ(readLock(), "Unlocked");
 }
 
 TEST_F(MP3RingProtocolTest, RecordHeldAcrossCallsAndConsumedWhenUsedUp) {
-    HeaderFields f;
-    std::vector<uint8_t> es = frame(f, 417, 1);
-    append(es, frame(f, 417, 2));
+    const Bytes es = test::concat({frame({}, 417, 1), frame({}, 417, 2)});
     ASSERT_TRUE(test::writePesRecord(*mRing, es, 0));
-    const uint32_t footprint = RingBuffer::roundUp4(40 + 14 + es.size());
-    std::vector<uint8_t> out(4096);
-    unsigned long length = 0;
-    long long pts = 0;
-    ASSERT_EQ(mExtractor->getDecodableUnit(out.data(), out.size(), &length, &pts, nullptr), 0u);
-    EXPECT_EQ(length, 417u);
+    ASSERT_EQ(call(), 0u);
+    EXPECT_EQ(mLength, 417u);
     EXPECT_EQ(mRing->tail(), 0u);
-    EXPECT_NE(dumpRing().find("ReadLock: \e[01;31mLocked"), std::string::npos);
-    ASSERT_EQ(mExtractor->getDecodableUnit(out.data(), out.size(), &length, &pts, nullptr), 0u);
-    EXPECT_EQ(length, 417u);
-    EXPECT_EQ(mRing->tail(), footprint);
-    EXPECT_NE(dumpRing().find("ReadLock: \e[01;32mUnlocked"), std::string::npos);
+    EXPECT_EQ(readLock(), "Locked");
+    ASSERT_EQ(call(), 0u);
+    EXPECT_EQ(mLength, 417u);
+    EXPECT_EQ(mRing->tail(), RingBuffer::roundUp4(40 + 14 + es.size()));
+    EXPECT_EQ(readLock(), "Unlocked");
 }
 
 TEST_F(MP3RingProtocolTest, StatedEsSizeBeyondTheRecordIsBoundedByTheRecord) {

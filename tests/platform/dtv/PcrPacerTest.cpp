@@ -81,22 +81,18 @@ TEST_F(PcrPacerTest, PacketsBetweenTwoPcrsAreSpreadEvenlyBetweenTheirTimes) {
     EXPECT_EQ(out.size(), 5u * 188);
 }
 
-TEST_F(PcrPacerTest, PacketsBeforeTheFirstPcrAreDueAtOnce) {
+// Packets before the first PCR are due at once; only the first PCR PID drives the
+// clock.
+TEST_F(PcrPacerTest, FirstPcrPidAnchorsAndDrivesTheClock) {
     push(plainPacket(0x101, 1));
     push(plainPacket(0x101, 2));
     EXPECT_FALSE(pacer.nextKnown());
     push(pcrPacket(0x100, 0));
-    std::vector<uint8_t> out;
-    EXPECT_EQ(pacer.takeDue(now, out), 3u);
-    EXPECT_EQ(pacer.pcrPid(), 0x100);
-}
-
-TEST_F(PcrPacerTest, OnlyTheFirstPcrPidDrivesTheClock) {
-    push(pcrPacket(0x100, 0));
     push(pcrPacket(0x200, 9'000'000));  // another programme's clock: ignored
     push(pcrPacket(0x100, 900));        // 10 ms
     std::vector<uint8_t> out;
-    EXPECT_EQ(pacer.takeDue(now, out), 1u);
+    EXPECT_EQ(pacer.takeDue(now, out), 3u);
+    EXPECT_EQ(pacer.pcrPid(), 0x100);
     EXPECT_EQ(pacer.nextDueNs(), now + 5 * kMs);
     EXPECT_EQ(pacer.discontinuities(), 0u);
 }

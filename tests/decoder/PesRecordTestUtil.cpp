@@ -50,43 +50,6 @@ android::sp<RingBuffer> makeRing(unsigned int log2Size, const std::string& name)
     return ring;
 }
 
-bool writePesRecord(RingBuffer& ring, const uint8_t* es, size_t esSize, uint64_t pts,
-                    uint8_t streamId) {
-    // PES header: prefix, stream_id, PES_packet_length, flags '10' 00 0 0 0 0,
-    // PTS_DTS_flags '10', header length 5, then the 5-byte PTS.
-    constexpr uint32_t kPesHeader = 14;
-    const uint32_t pesSize = kPesHeader + static_cast<uint32_t>(esSize);
-    const uint32_t recordSize = PESData::kHeaderSize + pesSize;
-    if (!ring.waitForSpace(RingBuffer::roundUp4(recordSize))) {
-        return false;
-    }
-    uint8_t* at = ring.writePointer();
-    auto* record = new (at) PESData();
-    record->mSize = recordSize;
-    record->mPTS = pts & 0x1FFFFFFFFull;
-    record->mDTS = record->mPTS;
-    record->mSizeES = static_cast<uint32_t>(esSize);
-    record->mOffsetES = recordSize - record->mSizeES;
-    uint8_t* pes = at + PESData::kHeaderSize;
-    const uint32_t packetLength = pesSize > 6 + 0xFFFF ? 0 : pesSize - 6;
-    const uint64_t p = record->mPTS;
-    // clang-format off
-    const uint8_t header[kPesHeader] = {
-        0x00, 0x00, 0x01, streamId,
-        static_cast<uint8_t>(packetLength >> 8), static_cast<uint8_t>(packetLength),
-        0x80, 0x80, 0x05,
-        static_cast<uint8_t>(0x21 | ((p >> 29) & 0x0E)), static_cast<uint8_t>(p >> 22),
-        static_cast<uint8_t>(((p >> 14) & 0xFE) | 1), static_cast<uint8_t>(p >> 7),
-        static_cast<uint8_t>(((p << 1) & 0xFE) | 1)};
-    // clang-format on
-    std::memcpy(pes, header, kPesHeader);
-    if (esSize > 0) {
-        std::memcpy(pes + kPesHeader, es, esSize);
-    }
-    ring.commitWrite(recordSize);
-    return true;
-}
-
 bool writeRawRecord(RingBuffer& ring, uint32_t size, uint32_t offsetES, uint32_t sizeES,
                     uint64_t pts, const std::vector<uint8_t>& bytes) {
     const uint32_t footprint =
@@ -107,6 +70,28 @@ bool writeRawRecord(RingBuffer& ring, uint32_t size, uint32_t offsetES, uint32_t
     // The ring advances by what was really written, whatever mSize says.
     ring.commitWrite(footprint);
     return true;
+}
+
+bool writePesRecord(RingBuffer& ring, const uint8_t* es, size_t esSize, uint64_t pts,
+                    uint8_t streamId) {
+    // PES header: prefix, stream_id, PES_packet_length, flags '10' 00 0 0 0 0,
+    // PTS_DTS_flags '10', header length 5, then the 5-byte PTS.
+    constexpr uint32_t kPesHeader = 14;
+    const auto pesSize = static_cast<uint32_t>(kPesHeader + esSize);
+    const uint32_t packetLength = pesSize > 6 + 0xFFFF ? 0 : pesSize - 6;
+    const uint64_t p = pts & 0x1FFFFFFFFull;
+    // clang-format off
+    Bytes pes = {
+        0x00, 0x00, 0x01, streamId,
+        static_cast<uint8_t>(packetLength >> 8), static_cast<uint8_t>(packetLength),
+        0x80, 0x80, 0x05,
+        static_cast<uint8_t>(0x21 | ((p >> 29) & 0x0E)), static_cast<uint8_t>(p >> 22),
+        static_cast<uint8_t>(((p >> 14) & 0xFE) | 1), static_cast<uint8_t>(p >> 7),
+        static_cast<uint8_t>(((p << 1) & 0xFE) | 1)};
+    // clang-format on
+    pes.insert(pes.end(), es, es + esSize);
+    return writeRawRecord(ring, PESData::kHeaderSize + pesSize, PESData::kHeaderSize + kPesHeader,
+                          static_cast<uint32_t>(esSize), p, pes);
 }
 
 std::vector<PesChunk> cutAt(const std::vector<uint8_t>& es, const std::vector<size_t>& offsets,

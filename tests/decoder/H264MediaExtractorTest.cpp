@@ -448,9 +448,9 @@ TEST_F(H264SeiTest, OtherMessageIsSkippedModulo256Bits) {
         decodeSps({.picStructPresent = true});
         Bytes sei = {5, size};
         sei.resize(2 + size, 0x55);
-        sei[10] = 1;
-        sei[11] = 1;
-        sei[12] = 0x40;  // pic_struct 4, clock flags 0 0
+        sei.at(10) = 1;
+        sei.at(11) = 1;
+        sei.at(12) = 0x40;  // pic_struct 4, clock flags 0 0
         sei.insert(sei.end(), {1, 1, 0x20, 0x80});
         decodeSei(nal(0x06, sei, false));
         EXPECT_TRUE(mExtractor->isPicTimingSeen());

@@ -209,7 +209,7 @@ void BM_FileToReceiverRings(benchmark::State& state) {
     // and its rings were made (rings, filter queues, thread stacks, buffers).
     state.counters["rssGrowthBytes"] = peakGrowth;
     state.counters["queueBytesMax"] =
-        static_cast<double>(pids.size() * DemuxSourceSpec::kDefaultQueuePackets * kPacket);
+        static_cast<double>(pids.size() * DemuxSourceConfig::kDefaultQueuePackets * kPacket);
 }
 BENCHMARK(BM_FileToReceiverRings)->Unit(benchmark::kMillisecond)->UseManualTime()->Iterations(5);
 

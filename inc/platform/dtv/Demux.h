@@ -34,7 +34,7 @@
 
 #include "platform/dtv/DemuxBinder.h"
 #include "platform/dtv/DemuxSource.h"
-#include "platform/dtv/DemuxSourceSpec.h"
+#include "platform/dtv/DemuxSourceConfig.h"
 #include "platform/dtv/PacketQueue.h"
 
 namespace TavoPlayer {
@@ -103,7 +103,7 @@ private:
     std::mutex mControlLock;
     std::unique_ptr<DemuxSource> mSource;  // mControlLock
     android::sp<SourceThread> mThread;     // mControlLock
-    DemuxSourceSpec mSpec;                 // written under both locks, at open
+    DemuxSourceConfig mConfig;             // written under both locks, at open
 
     mutable std::mutex mLock;
     std::condition_variable mDataReady;  // a filter got packets

@@ -16,7 +16,7 @@
 #include <memory>
 #include <string>
 
-#include "platform/dtv/DemuxSourceSpec.h"
+#include "platform/dtv/DemuxSourceConfig.h"
 
 namespace TavoPlayer {
 
@@ -28,8 +28,8 @@ public:
     static constexpr ssize_t kRestart = -2;  // the stream starts again (a loop)
     static constexpr ssize_t kFailed = -3;   // a read error; logged by the source
 
-    // The source for `spec`, not yet opened.
-    static std::unique_ptr<DemuxSource> create(const DemuxSourceSpec& spec);
+    // The source for `config`, not yet opened.
+    static std::unique_ptr<DemuxSource> create(const DemuxSourceConfig& config);
 
     DemuxSource();
     virtual ~DemuxSource();

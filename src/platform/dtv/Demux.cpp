@@ -201,14 +201,14 @@ int Demux::openSource_c() {
                   "DemuxBinder_StartFiltering", kSourceProperty);
         return -ENOENT;
     }
-    DemuxSourceSpec spec;
+    DemuxSourceConfig config;
     std::string error;
-    if (!DemuxSourceSpec::parse(text, &spec, &error)) {
+    if (!DemuxSourceConfig::parse(text, &config, &error)) {
         TAVO_LOGE("%s: bad %s \"%s\": %s\n", "DemuxBinder_StartFiltering", kSourceProperty,
                   text.c_str(), error.c_str());
         return -EINVAL;
     }
-    std::unique_ptr<DemuxSource> source = DemuxSource::create(spec);
+    std::unique_ptr<DemuxSource> source = DemuxSource::create(config);
     const int rc = source->open();
     if (rc < 0) {
         TAVO_LOGE("%s: cannot open demux source \"%s\"\n", "DemuxBinder_StartFiltering",
@@ -217,7 +217,7 @@ int Demux::openSource_c() {
     }
     {
         std::lock_guard<std::mutex> lock(mLock);
-        mSpec = spec;
+        mConfig = config;
         mStopping = false;
         mEnded = false;
         mReaderArrived = false;
@@ -291,7 +291,7 @@ int Demux::startFiltering(uint16_t pid, int filterKind) {
         std::lock_guard<std::mutex> lock(mLock);
         handle = allocateHandle_l();
         if (handle >= 0) {
-            mFilters[handle] = std::make_unique<Filter>(pid, filterKind, mSpec.queuePackets);
+            mFilters[handle] = std::make_unique<Filter>(pid, filterKind, mConfig.queuePackets);
             mPidFilters[pid].push_back(mFilters[handle].get());
             ++mFilterCount;
             mNextHandle = (handle + 1) % kDemuxMaxHandles;
@@ -392,7 +392,7 @@ int Demux::readData(int handle, uint8_t* buffer, int size) {
     const size_t n = filter->queue.pop(buffer, static_cast<size_t>(size) / kPacket);
     if (n > 0) {
         filter->stalled = false;
-        if (mSpec.overflow == DemuxSourceSpec::Overflow::kWait)
+        if (mConfig.overflow == DemuxSourceConfig::Overflow::kWait)
             mRoomReady.notify_all();
     }
     if (filter->queue.empty())
@@ -402,7 +402,7 @@ int Demux::readData(int handle, uint8_t* buffer, int size) {
 
 void Demux::deliver(const uint8_t* packets, size_t count) {
     std::unique_lock<std::mutex> lock(mLock);
-    const bool wait = mSpec.overflow == DemuxSourceSpec::Overflow::kWait;
+    const bool wait = mConfig.overflow == DemuxSourceConfig::Overflow::kWait;
     bool delivered = false;
     for (size_t i = 0; i < count; ++i) {
         const uint8_t* packet = packets + i * kPacket;

@@ -13,17 +13,17 @@
 
 namespace TavoPlayer {
 
-std::unique_ptr<DemuxSource> DemuxSource::create(const DemuxSourceSpec& spec) {
-    switch (spec.kind) {
-        case DemuxSourceSpec::Kind::kFile:
-            return std::make_unique<FileSource>(spec.path, spec.loop, spec.paced);
-        case DemuxSourceSpec::Kind::kUdp:
-            return std::make_unique<UdpSource>(spec.host, spec.port, spec.iface);
-        case DemuxSourceSpec::Kind::kStdin:
+std::unique_ptr<DemuxSource> DemuxSource::create(const DemuxSourceConfig& config) {
+    switch (config.kind) {
+        case DemuxSourceConfig::Kind::kFile:
+            return std::make_unique<FileSource>(config.path, config.loop, config.paced);
+        case DemuxSourceConfig::Kind::kUdp:
+            return std::make_unique<UdpSource>(config.host, config.port, config.iface);
+        case DemuxSourceConfig::Kind::kStdin:
             return std::make_unique<StdinSource>(STDIN_FILENO);
-        case DemuxSourceSpec::Kind::kDvb:
-            return std::make_unique<DvbSource>(spec.adapter, spec.demux);
-        case DemuxSourceSpec::Kind::kNone:
+        case DemuxSourceConfig::Kind::kDvb:
+            return std::make_unique<DvbSource>(config.adapter, config.demux);
+        case DemuxSourceConfig::Kind::kNone:
             break;
     }
     return nullptr;

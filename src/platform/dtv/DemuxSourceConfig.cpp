@@ -1,4 +1,4 @@
-#include "platform/dtv/DemuxSourceSpec.h"
+#include "platform/dtv/DemuxSourceConfig.h"
 
 #include <charconv>
 #include <optional>
@@ -16,7 +16,7 @@ std::optional<long> parseNumber(const std::string& text) {
     return value;
 }
 
-bool parseOptions(const std::string& options, DemuxSourceSpec* spec, bool* overflowGiven,
+bool parseOptions(const std::string& options, DemuxSourceConfig* config, bool* overflowGiven,
                   std::string* error) {
     size_t start = 0;
     while (start <= options.size()) {
@@ -42,31 +42,31 @@ bool parseOptions(const std::string& options, DemuxSourceSpec* spec, bool* overf
                 *error = "loop must be 0 or 1";
                 return false;
             }
-            spec->loop = value == "1";
+            config->loop = value == "1";
         } else if (name == "pace") {
             if (value != "pcr" && value != "none") {
                 *error = "pace must be pcr or none";
                 return false;
             }
-            spec->paced = value == "pcr";
+            config->paced = value == "pcr";
         } else if (name == "queue") {
             const auto n = parseNumber(value);
-            if (!n || *n < static_cast<long>(DemuxSourceSpec::kMinQueuePackets) ||
-                *n > static_cast<long>(DemuxSourceSpec::kMaxQueuePackets)) {
+            if (!n || *n < static_cast<long>(DemuxSourceConfig::kMinQueuePackets) ||
+                *n > static_cast<long>(DemuxSourceConfig::kMaxQueuePackets)) {
                 *error = "queue must be a packet count from 16 to 1048576";
                 return false;
             }
-            spec->queuePackets = static_cast<size_t>(*n);
+            config->queuePackets = static_cast<size_t>(*n);
         } else if (name == "overflow") {
             if (value != "drop" && value != "wait") {
                 *error = "overflow must be drop or wait";
                 return false;
             }
-            spec->overflow = value == "wait" ? DemuxSourceSpec::Overflow::kWait
-                                             : DemuxSourceSpec::Overflow::kDrop;
+            config->overflow = value == "wait" ? DemuxSourceConfig::Overflow::kWait
+                                               : DemuxSourceConfig::Overflow::kDrop;
             *overflowGiven = true;
         } else if (name == "iface") {
-            spec->iface = value;
+            config->iface = value;
         } else {
             *error = "unknown option \"" + name + "\"";
             return false;
@@ -79,8 +79,9 @@ bool parseOptions(const std::string& options, DemuxSourceSpec* spec, bool* overf
 
 }  // namespace
 
-bool DemuxSourceSpec::parse(const std::string& text, DemuxSourceSpec* spec, std::string* error) {
-    DemuxSourceSpec result;
+bool DemuxSourceConfig::parse(const std::string& text, DemuxSourceConfig* config,
+                              std::string* error) {
+    DemuxSourceConfig result;
     std::string body = text;
     std::string options;
     // The options follow the last '?', so that a path may not contain one, but
@@ -147,7 +148,7 @@ bool DemuxSourceSpec::parse(const std::string& text, DemuxSourceSpec* spec, std:
         // reader that is merely slower would only hide data.
         result.overflow = Overflow::kWait;
     }
-    *spec = result;
+    *config = result;
     return true;
 }
 

@@ -1,4 +1,4 @@
-// DemuxSourceSpec: the parsed value of the property tavoplayer.demux.source.
+// DemuxSourceConfig: the parsed value of the property tavoplayer.demux.source.
 //
 //   file:PATH[?OPTIONS]        a TS file, read at the pace of its PCR
 //   udp://GROUP:PORT[?OPTIONS] TS over UDP; a multicast group is joined
@@ -23,7 +23,7 @@
 
 namespace TavoPlayer {
 
-class DemuxSourceSpec {
+class DemuxSourceConfig {
 public:
     enum class Kind { kNone, kFile, kUdp, kStdin, kDvb };
     enum class Overflow { kDrop, kWait };
@@ -33,7 +33,7 @@ public:
     static constexpr size_t kMaxQueuePackets = 1 << 20;
 
     // Parses `text`. On failure returns false and says why in `error`.
-    static bool parse(const std::string& text, DemuxSourceSpec* spec, std::string* error);
+    static bool parse(const std::string& text, DemuxSourceConfig* config, std::string* error);
 
     Kind kind = Kind::kNone;
     std::string path;   // file

@@ -1,12 +1,12 @@
-#include "platform/dtv/DemuxSourceSpec.h"
+#include "platform/dtv/DemuxSourceConfig.h"
 
 #include <gtest/gtest.h>
 
 namespace TavoPlayer {
 namespace {
 
-using Kind = DemuxSourceSpec::Kind;
-using Overflow = DemuxSourceSpec::Overflow;
+using Kind = DemuxSourceConfig::Kind;
+using Overflow = DemuxSourceConfig::Overflow;
 
 struct Good {
     const char* text;
@@ -20,7 +20,7 @@ struct Good {
     Overflow overflow;
 };
 
-TEST(DemuxSourceSpecTest, AcceptsEverySourceForm) {
+TEST(DemuxSourceConfigTest, AcceptsEverySourceForm) {
     const Good cases[] = {
         {"file:/a/b.ts", Kind::kFile, "/a/b.ts", 0, 0, false, true, 8192, Overflow::kDrop},
         {"file:/a/b.ts?loop=1", Kind::kFile, "/a/b.ts", 0, 0, true, true, 8192, Overflow::kDrop},
@@ -41,29 +41,29 @@ TEST(DemuxSourceSpecTest, AcceptsEverySourceForm) {
         {"dvb:2.1", Kind::kDvb, "", 2, 1, false, true, 8192, Overflow::kDrop},
     };
     for (const Good& c : cases) {
-        DemuxSourceSpec spec;
+        DemuxSourceConfig config;
         std::string error;
-        ASSERT_TRUE(DemuxSourceSpec::parse(c.text, &spec, &error)) << c.text << ": " << error;
-        EXPECT_EQ(spec.kind, c.kind) << c.text;
+        ASSERT_TRUE(DemuxSourceConfig::parse(c.text, &config, &error)) << c.text << ": " << error;
+        EXPECT_EQ(config.kind, c.kind) << c.text;
         if (c.kind == Kind::kFile) {
-            EXPECT_EQ(spec.path, c.pathOrHost) << c.text;
+            EXPECT_EQ(config.path, c.pathOrHost) << c.text;
         }
         if (c.kind == Kind::kUdp) {
-            EXPECT_EQ(spec.host, c.pathOrHost) << c.text;
-            EXPECT_EQ(spec.port, c.portOrAdapter) << c.text;
+            EXPECT_EQ(config.host, c.pathOrHost) << c.text;
+            EXPECT_EQ(config.port, c.portOrAdapter) << c.text;
         }
         if (c.kind == Kind::kDvb) {
-            EXPECT_EQ(spec.adapter, c.portOrAdapter) << c.text;
-            EXPECT_EQ(spec.demux, c.demux) << c.text;
+            EXPECT_EQ(config.adapter, c.portOrAdapter) << c.text;
+            EXPECT_EQ(config.demux, c.demux) << c.text;
         }
-        EXPECT_EQ(spec.loop, c.loop) << c.text;
-        EXPECT_EQ(spec.paced, c.paced) << c.text;
-        EXPECT_EQ(spec.queuePackets, c.queue) << c.text;
-        EXPECT_EQ(spec.overflow, c.overflow) << c.text;
+        EXPECT_EQ(config.loop, c.loop) << c.text;
+        EXPECT_EQ(config.paced, c.paced) << c.text;
+        EXPECT_EQ(config.queuePackets, c.queue) << c.text;
+        EXPECT_EQ(config.overflow, c.overflow) << c.text;
     }
 }
 
-TEST(DemuxSourceSpecTest, RefusesMalformedSourcesAndSaysWhy) {
+TEST(DemuxSourceConfigTest, RefusesMalformedSourcesAndSaysWhy) {
     const struct {
         const char* text;
         const char* reason;
@@ -89,12 +89,12 @@ TEST(DemuxSourceSpecTest, RefusesMalformedSourcesAndSaysWhy) {
         {"stdin?overflow=maybe", "overflow must be"},
     };
     for (const auto& c : cases) {
-        DemuxSourceSpec spec;
-        spec.path = "unchanged";
+        DemuxSourceConfig config;
+        config.path = "unchanged";
         std::string error;
-        EXPECT_FALSE(DemuxSourceSpec::parse(c.text, &spec, &error)) << c.text;
+        EXPECT_FALSE(DemuxSourceConfig::parse(c.text, &config, &error)) << c.text;
         EXPECT_NE(error.find(c.reason), std::string::npos) << c.text << " gave: " << error;
-        EXPECT_EQ(spec.path, "unchanged") << c.text;
+        EXPECT_EQ(config.path, "unchanged") << c.text;
     }
 }
 

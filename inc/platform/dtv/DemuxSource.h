@@ -54,7 +54,7 @@ public:
 
 protected:
     // Waits until `fd` is readable, the time-out passes or interrupt() is called.
-    // Returns 1 readable, 0 time-out or interrupted, negative errno on error.
+    // Returns 1 readable, 0 time-out or interrupted, negative errno on error (logged).
     int waitReadable(int fd, int timeoutMs);
     int wakeFd() const { return mWakeFd; }
     // Consumes a pending interrupt(), if any.

@@ -5,11 +5,13 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <cstring>
 
 #include "platform/dtv/DvbSource.h"
 #include "platform/dtv/FileSource.h"
 #include "platform/dtv/StdinSource.h"
 #include "platform/dtv/UdpSource.h"
+#include "platform/os/Trace.h"
 
 namespace TavoPlayer {
 
@@ -59,8 +61,14 @@ void DemuxSource::drainWake() {
 int DemuxSource::waitReadable(int fd, int timeoutMs) {
     pollfd fds[2] = {{fd, POLLIN, 0}, {mWakeFd, POLLIN, 0}};
     const int n = poll(fds, mWakeFd >= 0 ? 2 : 1, timeoutMs);
-    if (n < 0)
-        return errno == EINTR ? 0 : -errno;
+    if (n < 0) {
+        const int error = errno;
+        if (error == EINTR)
+            return 0;
+        TAVO_LOGE("%s: waiting on %s failed: %s\n", "DemuxSource::read", describe().c_str(),
+                  strerror(error));
+        return -error;
+    }
     if (n == 0)
         return 0;
     if (fds[1].revents & POLLIN) {

@@ -28,13 +28,8 @@ int StdinSource::open() {
 
 ssize_t StdinSource::read(uint8_t* buffer, size_t size, int timeoutMs) {
     const int ready = waitReadable(mFd, timeoutMs);
-    if (ready < 0) {
-        TAVO_LOGE("%s: waiting on %s failed: %s\n", "DemuxSource::read", describe().c_str(),
-                  strerror(-ready));
-        return kFailed;
-    }
-    if (ready == 0)
-        return kNothing;
+    if (ready <= 0)
+        return ready < 0 ? kFailed : kNothing;
     const ssize_t n = ::read(mFd, buffer, size);
     if (n > 0)
         return n;

@@ -110,13 +110,8 @@ int UdpSource::open() {
 
 ssize_t UdpSource::read(uint8_t* buffer, size_t size, int timeoutMs) {
     const int ready = waitReadable(mFd, timeoutMs);
-    if (ready < 0) {
-        TAVO_LOGE("%s: waiting on %s failed: %s\n", "DemuxSource::read", describe().c_str(),
-                  strerror(-ready));
-        return kFailed;
-    }
-    if (ready == 0)
-        return kNothing;
+    if (ready <= 0)
+        return ready < 0 ? kFailed : kNothing;
     const ssize_t n = recv(mFd, buffer, size, MSG_DONTWAIT);
     if (n < 0) {
         if (errno == EINTR || errno == EAGAIN)

@@ -3,6 +3,7 @@
 
 #include <cstring>
 #include <new>
+#include <ostream>
 
 #include "common/RingBuffer.h"
 #include "common/data/AudioFragmentData.h"
@@ -36,6 +37,10 @@ struct PesSizeCase {
     uint32_t recordSize;
     uint32_t advance;
 };
+
+void PrintTo(const PesSizeCase& c, std::ostream* os) {
+    *os << c.pesBytes << "-byte PES";
+}
 
 class PESDataSizeTest : public RecordInRingTest,
                         public ::testing::WithParamInterface<PesSizeCase> {};

@@ -5,6 +5,7 @@
 
 #include <cstdio>
 #include <memory>
+#include <ostream>
 #include <vector>
 
 #include "support/TraceCapture.h"
@@ -74,6 +75,10 @@ struct ChoiceCase {
     M expected;
 };
 
+void PrintTo(const ChoiceCase& c, std::ostream* os) {
+    *os << "video " << c.video << " audio " << c.audio;
+}
+
 class SourceChoiceTest : public SynchronizationTest,
                          public ::testing::WithParamInterface<ChoiceCase> {};
 
@@ -110,6 +115,10 @@ struct RebaseCase {
     int64_t offsetFromExpected;
     bool rebased;
 };
+
+void PrintTo(const RebaseCase& c, std::ostream* os) {
+    *os << c.name;
+}
 
 class RebaseTest : public SynchronizationTest, public ::testing::WithParamInterface<RebaseCase> {};
 

@@ -2,6 +2,10 @@
 
 #include <cstring>
 
+#if defined(__SSE2__)
+#include <emmintrin.h>
+#endif
+
 namespace TavoPlayer {
 
 void TransportBitReader::init(const uint8_t* data, uint32_t sizeBytes) {
@@ -95,9 +99,27 @@ void TransportBitReader::readBytes(uint8_t* out, uint32_t count) {
         // the data because the whole field is.
         const unsigned int back = 8u - offset;
         uint32_t i = 0;
-#if __BYTE_ORDER__ == __ORDER_LITTLE_ENDIAN__
+#if defined(__SSE2__)
+        // Sixteen output bytes per step: the same byte-wise shift done on two
+        // overlapping loads, with 16-bit lane shifts masked back to byte lanes (bits
+        // that crossed into a neighbouring byte are cleared). LATM access units start
+        // one bit past a byte boundary whenever useSameStreamMux is set, so this loop
+        // carries nearly every LOAS byte; the loads stay within [at, at + count], which
+        // the bound check above guarantees to be inside the data.
+        const __m128i shiftLeft = _mm_cvtsi32_si128(static_cast<int>(offset));
+        const __m128i shiftRight = _mm_cvtsi32_si128(static_cast<int>(back));
+        const __m128i keepHigh = _mm_set1_epi8(static_cast<char>((0xFFu << offset) & 0xFFu));
+        const __m128i keepLow = _mm_set1_epi8(static_cast<char>(0xFFu >> back));
+        for (; i + 16 <= count; i += 16) {
+            const __m128i head = _mm_loadu_si128(reinterpret_cast<const __m128i*>(at + i));
+            const __m128i tail = _mm_loadu_si128(reinterpret_cast<const __m128i*>(at + i + 1));
+            const __m128i high = _mm_and_si128(_mm_sll_epi16(head, shiftLeft), keepHigh);
+            const __m128i low = _mm_and_si128(_mm_srl_epi16(tail, shiftRight), keepLow);
+            _mm_storeu_si128(reinterpret_cast<__m128i*>(out + i), _mm_or_si128(high, low));
+        }
+#elif __BYTE_ORDER__ == __ORDER_LITTLE_ENDIAN__
         // Eight output bytes per step from a big-endian 64-bit load and the byte after
-        // it (LATM payloads rarely start on a byte boundary, so this is the hot path).
+        // it.
         for (; i + 8 <= count; i += 8) {
             uint64_t word;
             std::memcpy(&word, at + i, sizeof(word));

@@ -356,6 +356,41 @@ TEST_F(TransportBitReaderTest, ReadsBytesAtAnyBitOffset) {
     }
 }
 
+// Long copies take the wide path; every length and offset up to the very last byte of
+// the data must give what eight-bit reads give, and never read beyond it (the buffer
+// is exactly sized, so a stray load shows under AddressSanitizer).
+TEST_F(TransportBitReaderTest, LongCopiesMatchByteReadsUpToTheEndOfTheData) {
+    std::vector<uint8_t> data(83);
+    uint32_t seed = 0x2B7u;
+    for (uint8_t& b : data) {
+        seed = seed * 1103515245u + 12345u;
+        b = static_cast<uint8_t>(seed >> 16);
+    }
+    const uint32_t size = static_cast<uint32_t>(data.size());
+    for (unsigned int offset = 0; offset < 8; ++offset) {
+        for (uint32_t count = 1; count * 8 + offset <= size * 8; ++count) {
+            TransportBitReader r(data.data(), size);
+            r.skipBits(offset);
+            std::vector<uint8_t> out(count);
+            r.readBytes(out.data(), count);
+            ASSERT_FALSE(r.overrun()) << "offset " << offset << " count " << count;
+            TransportBitReader check(data.data(), size);
+            check.skipBits(offset);
+            for (uint32_t i = 0; i < count; ++i) {
+                ASSERT_EQ(check.readBits(8), out[i])
+                    << "offset " << offset << " count " << count << " byte " << i;
+            }
+            EXPECT_EQ(offset + count * 8u, r.bitPosition());
+        }
+        TransportBitReader r(data.data(), size);
+        r.skipBits(offset == 0 ? 1 : offset);
+        std::vector<uint8_t> out(size, 0x5A);
+        r.readBytes(out.data(), size);  // one bit short of the data
+        EXPECT_TRUE(r.overrun());
+        EXPECT_EQ(0x5A, out[0]) << "nothing copied when the field does not fit";
+    }
+}
+
 class TransportDecoderApiTest : public ::testing::Test {};
 
 TEST_F(TransportDecoderApiTest, OpensOnlyLoasAndAdtsWithOneLayer) {

@@ -8,39 +8,9 @@
 
 namespace TavoPlayer {
 
-void TransportBitReader::init(const uint8_t* data, uint32_t sizeBytes) {
-    mData = data;
-    mSizeBits = static_cast<uint64_t>(sizeBytes) * 8u;
-    mPositionBits = 0;
-    mOverrun = false;
-}
-
-void TransportBitReader::setSize(const uint8_t* data, uint32_t sizeBytes) {
-    mData = data;
-    mSizeBits = static_cast<uint64_t>(sizeBytes) * 8u;
-    if (mPositionBits > mSizeBits) {
-        mPositionBits = mSizeBits;
-        mOverrun = true;
-    }
-}
-
-uint32_t TransportBitReader::peekBits(unsigned int count) const {
-    if (count == 0 || count > 32 || count > mSizeBits - mPositionBits) {
-        return 0;
-    }
-    const uint8_t* at = mData + (mPositionBits >> 3);
-    const unsigned int offset = static_cast<unsigned int>(mPositionBits & 7u);
-#if __BYTE_ORDER__ == __ORDER_LITTLE_ENDIAN__
-    // With eight bytes left from here, one big-endian 64-bit load covers any field.
-    if ((mPositionBits >> 3) + 8 <= (mSizeBits >> 3)) {
-        uint64_t word;
-        std::memcpy(&word, at, sizeof(word));
-        word = __builtin_bswap64(word);
-        return static_cast<uint32_t>((word << offset) >> (64u - count));
-    }
-#endif
-    // Otherwise load only the bytes the field spans (at most 5 for 32 bits at an odd
-    // offset).
+uint32_t TransportBitReader::peekNearEnd(const uint8_t* at, unsigned int offset,
+                                         unsigned int count) {
+    // At most 5 bytes for 32 bits at an odd offset.
     const unsigned int spanBytes = (offset + count + 7u) >> 3;
     uint64_t word = 0;
     for (unsigned int i = 0; i < spanBytes; ++i) {
@@ -48,36 +18,6 @@ uint32_t TransportBitReader::peekBits(unsigned int count) const {
     }
     word >>= spanBytes * 8u - offset - count;
     return static_cast<uint32_t>(word & ((count == 32) ? 0xFFFFFFFFull : ((1ull << count) - 1)));
-}
-
-uint32_t TransportBitReader::readBits(unsigned int count) {
-    if (count == 0) {
-        return 0;
-    }
-    if (count > 32 || count > mSizeBits - mPositionBits) {
-        mOverrun = true;
-        return 0;
-    }
-    const uint32_t value = peekBits(count);
-    mPositionBits += count;
-    return value;
-}
-
-void TransportBitReader::skipBits(uint64_t count) {
-    if (count > mSizeBits - mPositionBits) {
-        mOverrun = true;
-        return;
-    }
-    mPositionBits += count;
-}
-
-void TransportBitReader::byteAlign() {
-    const uint64_t aligned = (mPositionBits + 7u) & ~uint64_t{7};
-    if (aligned > mSizeBits) {
-        mOverrun = true;
-        return;
-    }
-    mPositionBits = aligned;
 }
 
 void TransportBitReader::readBytes(uint8_t* out, uint32_t count) {
@@ -110,12 +50,21 @@ void TransportBitReader::readBytes(uint8_t* out, uint32_t count) {
         const __m128i shiftRight = _mm_cvtsi32_si128(static_cast<int>(back));
         const __m128i keepHigh = _mm_set1_epi8(static_cast<char>((0xFFu << offset) & 0xFFu));
         const __m128i keepLow = _mm_set1_epi8(static_cast<char>(0xFFu >> back));
-        for (; i + 16 <= count; i += 16) {
-            const __m128i head = _mm_loadu_si128(reinterpret_cast<const __m128i*>(at + i));
-            const __m128i tail = _mm_loadu_si128(reinterpret_cast<const __m128i*>(at + i + 1));
+        const auto shift16 = [&](uint32_t from) {
+            const __m128i head = _mm_loadu_si128(reinterpret_cast<const __m128i*>(at + from));
+            const __m128i tail = _mm_loadu_si128(reinterpret_cast<const __m128i*>(at + from + 1));
             const __m128i high = _mm_and_si128(_mm_sll_epi16(head, shiftLeft), keepHigh);
             const __m128i low = _mm_and_si128(_mm_srl_epi16(tail, shiftRight), keepLow);
-            _mm_storeu_si128(reinterpret_cast<__m128i*>(out + i), _mm_or_si128(high, low));
+            _mm_storeu_si128(reinterpret_cast<__m128i*>(out + from), _mm_or_si128(high, low));
+        };
+        for (; i + 16 <= count; i += 16) {
+            shift16(i);
+        }
+        if (i < count && count >= 16) {
+            // The last sixteen bytes once more, overlapping what is done, instead of a
+            // byte loop over the rest.
+            shift16(count - 16);
+            i = count;
         }
 #elif __BYTE_ORDER__ == __ORDER_LITTLE_ENDIAN__
         // Eight output bytes per step from a big-endian 64-bit load and the byte after
@@ -134,14 +83,6 @@ void TransportBitReader::readBytes(uint8_t* out, uint32_t count) {
         }
     }
     mPositionBits += bits;
-}
-
-void TransportBitReader::setBitPosition(uint64_t positionBits) {
-    if (positionBits > mSizeBits) {
-        mOverrun = true;
-        return;
-    }
-    mPositionBits = positionBits;
 }
 
 }  // namespace TavoPlayer

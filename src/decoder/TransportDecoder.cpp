@@ -50,9 +50,11 @@ TRANSPORTDEC_ERROR TransportDecoder::fillData(const uint8_t* buffer, uint32_t bu
         (buffer == nullptr && *bytesValid > 0)) {
         return TRANSPORTDEC_INVALID_PARAMETER;
     }
-    // Drop what has been framed already, keeping a frame still in use.
+    // Drop what has been framed already, keeping a frame still in use; only when the
+    // new bytes would not fit otherwise, so that the unframed tail of each fill (at
+    // least the held-back last frame) is not moved on every call.
     const uint32_t keepFrom = mInFrame ? mFrameStart : mReadPos;
-    if (keepFrom > 0) {
+    if (keepFrom > 0 && kBufferSizeBytes - mValid < *bytesValid) {
         const uint64_t position = mReader.bitPosition();
         const uint64_t shiftBits = static_cast<uint64_t>(keepFrom) * 8u;
         std::memmove(mBuffer.data(), mBuffer.data() + keepFrom, mValid - keepFrom);
@@ -105,7 +107,7 @@ TRANSPORTDEC_ERROR TransportDecoder::readAccessUnit() {
     return mType == TT_MP4_LOAS ? readLoasFrame() : readAdtsFrame();
 }
 
-bool TransportDecoder::syncAt(uint32_t offset) const {
+inline bool TransportDecoder::syncAt(uint32_t offset) const {
     if (offset + 2 > mValid) {
         return false;
     }
@@ -239,26 +241,36 @@ TRANSPORTDEC_ERROR TransportDecoder::readStreamMuxConfig(LatmConfig* latm,
 
 TRANSPORTDEC_ERROR TransportDecoder::readLatmSubFrame() {
     // ISO/IEC 14496-3, 1.7.3.1, PayloadLengthInfo() for one program and layer with
-    // frameLengthType 0: MuxSlotLengthBytes as a run of bytes ending below 255.
-    mReader.clearOverrun();
-    mReader.setBitPosition(mNextSubFrameBit);
+    // frameLengthType 0: MuxSlotLengthBytes as a run of bytes ending below 255. Every
+    // frame goes through here, so the run is read straight from the buffer at the
+    // subframe's bit offset (one bit past a byte boundary after useSameStreamMux);
+    // each byte is checked to lie within the frame before it is read.
+    const uint8_t* data = mBuffer.data();
+    const uint64_t endBit = static_cast<uint64_t>(mFrameEnd) * 8u;
+    const unsigned int offset = static_cast<unsigned int>(mNextSubFrameBit & 7u);
+    uint64_t bit = mNextSubFrameBit;
     uint32_t lengthBytes = 0;
     uint32_t part;
     do {
-        part = mReader.readBits(8);
+        if (bit + 8 > endBit) {
+            mReader.setBitPosition(bit);
+            return TRANSPORTDEC_PARSE_ERROR;
+        }
+        // With a non-zero offset the byte spans two buffer bytes, both before endBit.
+        const uint8_t* at = data + (bit >> 3);
+        part = offset == 0 ? at[0] : ((at[0] << offset) | (at[1] >> (8u - offset))) & 0xFFu;
         lengthBytes += part;
-    } while (part == 255 && !mReader.overrun());
-    if (mReader.overrun()) {
-        return TRANSPORTDEC_PARSE_ERROR;
-    }
-    const uint64_t start = mReader.bitPosition();
+        bit += 8;
+    } while (part == 255);
     const uint64_t bits = static_cast<uint64_t>(lengthBytes) * 8u;
-    if (start + bits > static_cast<uint64_t>(mFrameEnd) * 8u) {
+    mReader.clearOverrun();
+    mReader.setBitPosition(bit);
+    if (bit + bits > endBit) {
         return TRANSPORTDEC_PARSE_ERROR;
     }
-    mAuStartBit = start;
+    mAuStartBit = bit;
     mAuBits = static_cast<uint32_t>(bits);
-    mNextSubFrameBit = start + bits;
+    mNextSubFrameBit = bit + bits;
     return TRANSPORTDEC_OK;
 }
 
@@ -289,11 +301,13 @@ TRANSPORTDEC_ERROR TransportDecoder::readLoasFrame() {
     mReader.init(mBuffer.data(), frameEnd);
     mReader.setBitPosition(static_cast<uint64_t>(frameStart + kLoasHeaderBytes) * 8u);
 
-    // AudioMuxElement(1), Table 1.41.
-    const uint32_t useSameStreamMux = mReader.readBits(1);
-    if (mReader.overrun()) {
+    // AudioMuxElement(1), Table 1.41: useSameStreamMux is the first bit after the
+    // header, read from the byte itself (the frame is known to hold it unless empty).
+    if (muxLength == 0) {
         return mSynced ? dropFrame(frameEnd, TRANSPORTDEC_PARSE_ERROR) : loseSync(frameStart + 1);
     }
+    const uint32_t useSameStreamMux = mBuffer[frameStart + kLoasHeaderBytes] >> 7;
+    mReader.skipBits(1);
     if (useSameStreamMux == 0) {
         LatmConfig latm;
         CSAudioSpecificConfig config;

@@ -5,8 +5,46 @@
 #if defined(__SSE2__)
 #include <emmintrin.h>
 #endif
+#if defined(__x86_64__) && defined(__GNUC__)
+#include <immintrin.h>
+#define TAVO_BITREADER_AVX2 1
+#endif
 
 namespace TavoPlayer {
+
+namespace {
+
+#if defined(TAVO_BITREADER_AVX2)
+// The shifted copy of readBytes 32 bytes per step, for processors with AVX2 (chosen
+// at run time: the build targets the x86-64 baseline). Same scheme as the SSE2 loop
+// below; needs count >= 32 and reads at[0 .. count].
+__attribute__((target("avx2"))) void shiftedCopyAvx2(const uint8_t* at, uint8_t* out,
+                                                     uint32_t count, unsigned int offset) {
+    const unsigned int back = 8u - offset;
+    const __m128i shiftLeft = _mm_cvtsi32_si128(static_cast<int>(offset));
+    const __m128i shiftRight = _mm_cvtsi32_si128(static_cast<int>(back));
+    const __m256i keepHigh = _mm256_set1_epi8(static_cast<char>((0xFFu << offset) & 0xFFu));
+    const __m256i keepLow = _mm256_set1_epi8(static_cast<char>(0xFFu >> back));
+    // Not a lambda: it would not inherit the target attribute.
+    uint32_t i = 0;
+    while (i < count) {
+        const uint32_t from = i + 32 <= count ? i : count - 32;  // the rest overlaps
+        const __m256i head = _mm256_loadu_si256(reinterpret_cast<const __m256i*>(at + from));
+        const __m256i tail = _mm256_loadu_si256(reinterpret_cast<const __m256i*>(at + from + 1));
+        const __m256i high = _mm256_and_si256(_mm256_sll_epi16(head, shiftLeft), keepHigh);
+        const __m256i low = _mm256_and_si256(_mm256_srl_epi16(tail, shiftRight), keepLow);
+        _mm256_storeu_si256(reinterpret_cast<__m256i*>(out + from), _mm256_or_si256(high, low));
+        i = from + 32;
+    }
+}
+
+bool haveAvx2() {
+    static const bool have = __builtin_cpu_supports("avx2") != 0;
+    return have;
+}
+#endif
+
+}  // namespace
 
 uint32_t TransportBitReader::peekNearEnd(const uint8_t* at, unsigned int offset,
                                          unsigned int count) {
@@ -37,6 +75,13 @@ void TransportBitReader::readBytes(uint8_t* out, uint32_t count) {
         // Each output byte takes the low (8 - offset) bits of one input byte and the
         // high `offset` bits of the next; the last input byte touched is still inside
         // the data because the whole field is.
+#if defined(TAVO_BITREADER_AVX2)
+        if (count >= 32 && haveAvx2()) {
+            shiftedCopyAvx2(at, out, count, offset);
+            mPositionBits += bits;
+            return;
+        }
+#endif
         const unsigned int back = 8u - offset;
         uint32_t i = 0;
 #if defined(__SSE2__)

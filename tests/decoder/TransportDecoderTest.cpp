@@ -112,6 +112,15 @@ std::vector<HeaderCase> headerCases() {
     const Outcome syncError = err(TRANSPORTDEC_SYNC_ERROR);
     const LoasOptions same{.useSameStreamMux = true};
     const std::vector<uint8_t> plainC = loas({}, kC);
+    const std::vector<uint8_t> plainA = loas({}, kA);
+    const Outcome parseError = err(TRANSPORTDEC_PARSE_ERROR);
+    // The frame cut down to `muxLength` bytes after its header (audioMuxLengthBytes too).
+    const auto shortened = [](std::vector<uint8_t> frame, uint32_t muxLength) {
+        frame[1] = static_cast<uint8_t>(0xE0 | (muxLength >> 8));
+        frame[2] = static_cast<uint8_t>(muxLength & 0xFF);
+        frame.resize(3 + muxLength);
+        return frame;
+    };
     // clang-format off
     return {
         {"LoasVersion0", TT_MP4_LOAS, loas({}, kA), {ok(kA)}},
@@ -130,6 +139,15 @@ std::vector<HeaderCase> headerCases() {
          {ok(kA), ok(kC)}},
         {"LoasUseSameStreamMuxBeforeAnyConfig", TT_MP4_LOAS,
          concat({loas(same, kC), loas({}, kA)}), {err(TRANSPORTDEC_NO_CONFIGURATION), ok(kA)}},
+        // After useSameStreamMux the length run starts one bit into a byte.
+        {"LoasUseSameStreamMuxLongPayloadLength", TT_MP4_LOAS,
+         concat({plainA, loas(same, kB), loas(same, kC)}), {ok(kA), ok(kB), ok(kC)}},
+        {"LoasPayloadLongerThanItsFrame", TT_MP4_LOAS,
+         concat({plainA, shortened(loas(same, kB), 10), plainC}), {ok(kA), parseError, ok(kC)}},
+        {"LoasLengthRunPastItsFrame", TT_MP4_LOAS,
+         concat({plainA, shortened(loas(same, kB), 2), plainC}), {ok(kA), parseError, ok(kC)}},
+        {"LoasEmptyFrame", TT_MP4_LOAS, concat({plainA, {0x56, 0xE0, 0x00}, plainC}),
+         {ok(kA), parseError, ok(kC)}},
         {"LoasGarbageBeforeSync", TT_MP4_LOAS, concat({{0x00, 0x11, 0x56, 0x00, 0x22}, loas({}, kA)}),
          {syncError, ok(kA)}},
         {"LoasTwoProgramsUnsupported", TT_MP4_LOAS, concat({loas({.numProgram = 1}, kA), plainC}),

@@ -11,15 +11,11 @@ extern "C" {
 
 #include <cmath>
 
+#include "AvError.h"
+
 namespace TavoPlayer::tsgen {
 
 namespace {
-
-std::string avError(int code) {
-    char text[AV_ERROR_MAX_STRING_SIZE] = {};
-    av_strerror(code, text, sizeof text);
-    return text;
-}
 
 const char* encoderName(AudioCodec codec) {
     switch (codec) {

@@ -10,19 +10,11 @@ extern "C" {
 
 #include <cmath>
 
+#include "AvError.h"
+
 #include "H264SpsEditor.h"
 
 namespace TavoPlayer::tsgen {
-
-namespace {
-
-std::string avError(int code) {
-    char text[AV_ERROR_MAX_STRING_SIZE] = {};
-    av_strerror(code, text, sizeof text);
-    return text;
-}
-
-}  // namespace
 
 VideoEncoder::VideoEncoder(const Options& options)
     : mOptions(options), mPattern(options.width, options.height, options.seed) {

@@ -4,10 +4,13 @@
 // tavoplayer.video.sink. The surface is also the native window that the frame
 // capture dequeues the most recently shown picture from.
 //
-// This header is the contract between the codec and the surface: the codec uses
-// Surface::showPicture and native_window_set_crop only.
+// This header is the contract between the codec and capture on one side and the
+// surface on the other: the codec uses Surface::showPicture and
+// native_window_set_crop; the capture dequeues a buffer, maps it with
+// GraphicBufferMapper::lockYCbCr and queues it back.
 #pragma once
 
+#include <cstddef>
 #include <cstdint>
 
 #include <utils/RefBase.h>
@@ -36,10 +39,55 @@ struct SurfacePicture {
     bool topFieldFirst;
 };
 
+struct Rect {
+    int32_t left;
+    int32_t top;
+    int32_t right;  // exclusive
+    int32_t bottom;  // exclusive
+};
+
+// Where lockYCbCr puts a picture's planes; chroma_step 2 for interleaved chroma.
+struct android_ycbcr {
+    void* y;
+    void* cb;
+    void* cr;
+    size_t ystride;
+    size_t cstride;
+    size_t chroma_step;
+};
+
+// A picture buffer of a native window, mappable for the CPU.
+class ANativeWindowBuffer {
+public:
+    virtual ~ANativeWindowBuffer() = default;
+    // 0 or a negative status; the planes stay valid until unlock().
+    virtual int lockYCbCr(uint32_t usage, const Rect& bounds, android_ycbcr* ycbcr) = 0;
+    virtual int unlock() = 0;
+};
+
 class ANativeWindow {
 public:
     virtual ~ANativeWindow() = default;
     virtual int setCrop(const android_native_rect_t* crop) = 0;
+    // Hands out a buffer holding the most recently shown picture; 0 or a negative
+    // status. The buffer is the window's until queueBuffer gives it back.
+    virtual int dequeueBuffer(ANativeWindowBuffer** buffer) = 0;
+    // Gives a dequeued buffer back; fenceFd -1 for none. 0 or a negative status.
+    virtual int queueBuffer(ANativeWindowBuffer* buffer, int fenceFd) = 0;
+};
+
+// The process-wide mapper of picture buffers, as the platform has one.
+class GraphicBufferMapper {
+public:
+    static GraphicBufferMapper& get() {
+        static GraphicBufferMapper mapper;
+        return mapper;
+    }
+    int lockYCbCr(ANativeWindowBuffer* buffer, uint32_t usage, const Rect& bounds,
+                  android_ycbcr* ycbcr) {
+        return buffer->lockYCbCr(usage, bounds, ycbcr);
+    }
+    int unlock(ANativeWindowBuffer* buffer) { return buffer->unlock(); }
 };
 
 // Sets the rectangle of each picture that is shown; 0 or a negative status.

@@ -91,7 +91,9 @@ public:
 };
 
 // Sets the rectangle of each picture that is shown; 0 or a negative status.
-int native_window_set_crop(ANativeWindow* window, const android_native_rect_t* crop);
+inline int native_window_set_crop(ANativeWindow* window, const android_native_rect_t* crop) {
+    return window != nullptr ? window->setCrop(crop) : -22;  // -EINVAL, as the platform
+}
 
 class Surface : public ANativeWindow, public virtual RefBase {
 public:

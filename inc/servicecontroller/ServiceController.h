@@ -31,10 +31,12 @@
 #include <utils/Thread.h>
 
 #include "common/Uint33.h"
+#include "renderer/AudioRenderer.h"
 
 namespace TavoPlayer {
 
-class ServiceController : public virtual android::RefBase {
+class ServiceController : public virtual android::RefBase,
+                          public AudioRenderer::AudioRenderedListener {
 public:
     enum event_t : uint32_t {
         SIGNAL_UPDATE_EVENT = 0,
@@ -136,9 +138,9 @@ public:
     void onFrameRendered(int width, int height, Uint33 pts);
     void onFirstFrameRendered(int width, int height);
     // From the audio renderer's thread.
-    void onAudioRendered();
-    void onAudioReady(long waitToRender);
-    void onAudioSessionId(int id);
+    void onAudioRendered() override;
+    void onAudioReady(long waitToRender) override;
+    void onAudioSessionId(int id) override;
 
     // One pass of each polling thread's work. The threads call them; they are
     // public so that a pass can be run on its own.

@@ -99,10 +99,13 @@ uint32_t TSPacketParser::parse(const uint8_t* packet, TSParsedData* data) {
     mInPES = 0;
     if (!data->mPayloadUnitStartIndicator)
         return RESULT_ERROR;
-    // A unit start right after the break begins the next PES. The payload pointer
-    // and length are left as the previous packet set them, as this program always
-    // has; the module appends them to the fresh record.
+    // A unit start right after the break begins the next PES, whole: its own payload
+    // (the PES header) opens the fresh record. Leaving the previous packet's pointer
+    // here, as this program once did, lost that intact PES as well as the broken one
+    // and pointed at bytes the ring may already have handed back.
     mInPES = 1;
+    data->mPayload = payload;
+    data->mPayloadLength = payloadLength;
     mLastContinuityCounter = data->mContinuityCounter;
     return RESULT_ERROR | RESULT_PAYLOAD;
 }

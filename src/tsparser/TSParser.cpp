@@ -404,9 +404,12 @@ bool TSParser::threadLoop() {
         if ((r & TSPacketParser::RESULT_ERROR) || ts->mPayloadLength >= 185) {
             TAVO_LOGE("%s - TS parser error; discarding entire PES packet.", __func__);
             discardPES();
-            // After a continuity error on a unit start, the payload left in ts is the
-            // packet before's, not this one's: nothing of it is appended.
-            continue;
+            // A continuity error on a unit start (error and payload, nothing else)
+            // breaks only the PES before it: this packet's payload starts the next
+            // one, in a fresh record, like any unit start.
+            if (r != (TSPacketParser::RESULT_ERROR | TSPacketParser::RESULT_PAYLOAD) ||
+                ts->mPayloadLength >= 185)
+                continue;
         }
         if (!(r & TSPacketParser::RESULT_PAYLOAD))
             continue;

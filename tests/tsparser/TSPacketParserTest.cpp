@@ -165,7 +165,7 @@ const SequenceCase kSequences[] = {
 INSTANTIATE_TEST_SUITE_P(Counters, TSPacketParserSequenceTest, ::testing::ValuesIn(kSequences),
                          [](const auto& info) { return std::string(info.param.name); });
 
-TEST(TSPacketParserContinuityTest, StartAfterGapKeepsPreviousPayload) {
+TEST(TSPacketParserContinuityTest, StartAfterGapGivesItsOwnPayload) {
     TraceCapture trace;
     TSPacketParser parser;
     TSParsedData data;
@@ -173,9 +173,9 @@ TEST(TSPacketParserContinuityTest, StartAfterGapKeepsPreviousPayload) {
     const TsPacket b = TsPacketBuilder().continuity(7).unitStart().payload(ramp(100, 9)).build();
     ASSERT_EQ(parser.parse(a.data(), &data), kPayload);
     ASSERT_EQ(parser.parse(b.data(), &data), kError | kPayload);
-    // The pointer still designates the previous packet's payload, as designed.
-    EXPECT_EQ(data.mPayload, a.data() + 4);
-    EXPECT_EQ(data.mPayloadLength, 184u);
+    // The unit start opens the next PES, so its own payload is reported.
+    EXPECT_EQ(data.mPayload, b.data() + 88);
+    EXPECT_EQ(data.mPayloadLength, 100u);
     EXPECT_EQ(parser.lastContinuityCounter(), 7u);
 }
 

@@ -1,0 +1,113 @@
+// Packets lost just before a unit start break only the PES they belonged to: the PES
+// that starts in the packet after the gap comes out whole. A tsgen stream is run
+// through the TS parser module twice, intact and with such gaps cut into it; the
+// damaged run must give exactly the intact run's records less the broken ones.
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <set>
+#include <string>
+#include <vector>
+
+#include "support/TraceCapture.h"
+#include "support/TsTestUtil.h"
+#include "tsparser/TSParser.h"
+
+namespace TavoPlayer {
+namespace {
+
+struct GapCase {
+    const char* name;
+    uint16_t pid;
+    int kind;
+};
+void PrintTo(const GapCase& c, std::ostream* os) {
+    *os << c.name;
+}
+
+bool unitStart(const std::vector<uint8_t>& packets, size_t index) {
+    return (packets[index * 188 + 1] & 0x40) != 0;
+}
+// A packet without payload (a PCR alone) does not advance the continuity counter
+// (ISO/IEC 13818-1, 2.4.3.3): losing one is not a gap.
+bool hasPayload(const std::vector<uint8_t>& packets, size_t index) {
+    return (packets[index * 188 + 3] & 0x10) != 0;
+}
+
+std::vector<test::PesRecord> parse(const std::vector<uint8_t>& packets, int kind) {
+    auto input = test::makeRing("TS", 1 << 23);
+    auto output = test::makeRing("PES", 1 << 24);
+    android::sp<TSParser> parser = new TSParser(kind);
+    parser->setInput(input);
+    parser->addOutput(output, nullptr);
+    EXPECT_EQ(parser->start(), 0u);
+    EXPECT_TRUE(test::writeAll(*input, packets));
+    EXPECT_TRUE(test::waitConsumed(*input));
+    auto records = test::drainRecords(*output);
+    EXPECT_EQ(parser->stop(), 0u);
+    return records;
+}
+
+class TSParserContinuityGapTest : public ::testing::TestWithParam<GapCase> {};
+
+TEST_P(TSParserContinuityGapTest, OnlyThePesWithALostPacketIsMissing) {
+    const GapCase& c = GetParam();
+    const test::TempFile out({}, ".ts");
+    bool ok = false;
+    test::runCommand(std::string(TAVO_TSGEN_PATH) + " -d 3 --seed 7 -o " + out.path(), &ok);
+    ASSERT_TRUE(ok) << "tsgen failed";
+    const std::vector<uint8_t> intact = test::bytesOfPid(test::fileBytes(out.path()), c.pid);
+    const size_t count = intact.size() / 188;
+
+    // PES m spans the packets from its unit start up to the next one. Cut the packet
+    // just before every third unit start (when it carries payload and is not a unit
+    // start itself): PES m, the one that packet belonged to, breaks; PES m + 1 must
+    // survive.
+    std::vector<size_t> starts;
+    for (size_t i = 0; i < count; ++i)
+        if (unitStart(intact, i))
+            starts.push_back(i);
+    ASSERT_GT(starts.size(), 12u);
+    std::set<size_t> broken;
+    std::vector<uint8_t> damaged;
+    std::set<size_t> cut;
+    for (size_t m = 2; m + 1 < starts.size(); m += 3) {
+        const size_t before = starts[m + 1] - 1;
+        if (!unitStart(intact, before) && hasPayload(intact, before)) {
+            cut.insert(before);
+            broken.insert(m);
+        }
+    }
+    ASSERT_GE(broken.size(), 3u);
+    for (size_t i = 0; i < count; ++i)
+        if (!cut.count(i))
+            damaged.insert(damaged.end(), intact.begin() + i * 188, intact.begin() + (i + 1) * 188);
+
+    const auto reference = parse(intact, c.kind);
+    test::TraceCapture trace;
+    const auto records = parse(damaged, c.kind);
+
+    // The last PES has no later unit start to close it, in either run.
+    ASSERT_EQ(reference.size(), starts.size() - 1);
+    std::vector<const test::PesRecord*> expected;
+    for (size_t m = 0; m < reference.size(); ++m)
+        if (!broken.count(m))
+            expected.push_back(&reference[m]);
+    ASSERT_EQ(records.size(), expected.size()) << trace.all();
+    for (size_t i = 0; i < records.size(); ++i) {
+        EXPECT_EQ(records[i].pts, expected[i]->pts) << i;
+        EXPECT_EQ(records[i].pes, expected[i]->pes) << i;
+    }
+    // One continuity message and one discard for each gap, as before.
+    EXPECT_EQ(trace.count("continuity error! Discarding entire PES packet"), broken.size());
+    EXPECT_EQ(trace.count("TS parser error; discarding entire PES packet."), broken.size());
+    EXPECT_EQ(trace.count("start code not found"), 0u) << trace.all();
+}
+
+INSTANTIATE_TEST_SUITE_P(Tsgen, TSParserContinuityGapTest,
+                         ::testing::Values(GapCase{"Video", 0x111, TSParser::KIND_VIDEO},
+                                           GapCase{"Audio", 0x112, TSParser::KIND_AUDIO}),
+                         [](const auto& info) { return std::string(info.param.name); });
+
+}  // namespace
+}  // namespace TavoPlayer

@@ -1,0 +1,179 @@
+#include "decoder/ClosedCaptionDecoder.h"
+
+#include <gtest/gtest.h>
+
+#include <string>
+#include <vector>
+
+#include "support/CaptionBuilder.h"
+#include "support/TraceCapture.h"
+#include "support/TsTestUtil.h"
+
+namespace TavoPlayer {
+namespace {
+
+using namespace test;
+
+const char* const kOutOfScope =
+    "48 out of scope at void TavoPlayer::ClosedCaptionDecoder::handleCommands(uint8_t)";
+
+Bytes repeat(char c, size_t n) {
+    return Bytes(n, static_cast<uint8_t>(c));
+}
+Bytes cat(std::initializer_list<Bytes> parts) {
+    Bytes out;
+    for (const auto& p : parts)
+        out.insert(out.end(), p.begin(), p.end());
+    return out;
+}
+std::u32string u32(const std::string& ascii) {
+    return std::u32string(ascii.begin(), ascii.end());
+}
+
+struct DecodeCase {
+    const char* name;
+    Bytes es;
+    unsigned int result;
+    std::u32string text;      // the record's text when result is 1
+    const char* logged = "";  // a message that must have been logged
+};
+void PrintTo(const DecodeCase& c, std::ostream* os) {
+    *os << c.name;
+}
+
+std::vector<DecodeCase> decodeCases() {
+    CaptionUnitOptions timed;
+    timed.timeControlMode = 1;
+    CaptionUnitOptions notBody;
+    notBody.unitParameter = 0x30;
+    CaptionUnitOptions badIdentifier;
+    badIdentifier.dataIdentifier = 0x81;
+    CaptionUnitOptions noSeparator;
+    noSeparator.separator = 0x1E;
+    CaptionUnitOptions overrun;
+    overrun.declaredSize = 4;
+    CaptionUnitOptions withHeader;
+    withHeader.headerLength = 3;
+    const Bytes fourty = repeat('x', 40);
+    return {
+        {"Ola", captionEs({0x4F, 0x6C, 0x61}), 1, U"Ola\n"},
+        {"FortyCharactersFillRowZero", captionEs(fourty), 1,
+         std::u32string(32, U'x') + std::u32string(8, U'x') + U"\n"},
+        {"ExactlyFullRowHasNoLineFeed", captionEs(repeat('y', 32)), 1, std::u32string(32, U'y')},
+        {"FourthRowScrollsUp", captionEs(bytesOf("a\rb\rc\rd")), 1, U"b\nc\nd\n"},
+        {"HundredCharactersKeepLastThreeRows",
+         captionEs(cat({repeat('a', 32), repeat('b', 32), repeat('c', 32), repeat('d', 4)})), 1,
+         u32(std::string(32, 'b') + std::string(32, 'c') + "dddd\n")},
+        {"Ss3MusicNote", captionEs({0x1D, 0x21}), 1, U"\u266A\n"},
+        {"Ss3WholeSet",
+         captionEs({0x1D, 0x30, 0x1D, 0x37, 0x1D, 0x40, 0x1D, 0x4B, 0x1D, 0x22, 0x41}), 1,
+         U"\u00A4\u00BE\u2026\u215E\"A\n"},
+        {"Iso885915Replacements", captionEs({0xA4, 0xA6, 0xA8, 0xB4, 0xB8, 0xBC, 0xBD, 0xBE}), 1,
+         U"\u20AC\u0160\u0161\u017D\u017E\u0152\u0153\u0178\n"},
+        {"LatinAccents", captionEs({'A', 0xE7, 0xE3, 'o', ' ', 0xE0}), 1, U"Ação à\n"},
+        {"ClearScreen", captionEs(bytesOf("abc\fde")), 1, U"de\n"},
+        {"ControlsOnly", captionEs({0x0D, 0x0A, 0x80, 0x89, 0x0C}), 2, U""},
+        {"EmptyUnit", captionEs({}), 2, U""},
+        // An invalid row neither starts a row nor stops the column parameter.
+        {"ApsRowOutOfScope", captionEs({'a', 0x1C, 0x30, 0x41, 'x'}), 1, U"a\n", kOutOfScope},
+        {"ApsStartsNewRow", captionEs({'a', 0x1C, 0x41, 0x41, 'b'}), 1, U"a\nb\n"},
+        {"ColourParameterIsNotText", captionEs({0x90, 0x48, 'a'}), 1, U"a\n"},
+        {"ColourParameter58HidesText", captionEs({0x90, 0x58, 'a'}), 2, U""},
+        {"CsiSwallowsFollowingText",
+         captionEs(bytesOf("\x9B"
+                           "1;2 Vxy\rz")),
+         1, U"z\n"},
+        {"CsiBadFinalByte",
+         captionEs(bytesOf("\x9B"
+                           "1 !\rq")),
+         1, U"q\n", "CONTROLCODE not valid"},
+        {"NulInRowZeroEndsTheRow", captionEs({'a', 0x00, 'b'}), 1, U"a\n"},
+        {"TimedStatementSkipsPresentationTime", captionEs({'t'}, timed), 1, U"t\n"},
+        {"PesDataHeaderSkipped", captionEs({'h'}, withHeader), 1, U"h\n"},
+        {"NotStatementBody", captionEs({'a'}, notBody), 4, U""},
+        {"WrongDataIdentifier", captionEs({'a'}, badIdentifier), 0, U""},
+        {"NoUnitSeparator", captionEs({'a'}, noSeparator), 0, U""},
+        {"UnitPastTheRecord", captionEs({'a'}, overrun), 0, U""},
+        {"UnitOf256BytesDropped", captionEs(repeat('z', 256)), 0, U"", "256 bytes dropped"},
+        {"UnitOf255BytesDecoded", captionEs(repeat('z', 255)), 1, std::u32string(95, U'z') + U"\n"},
+        {"TruncatedBeforeUnit", Bytes{0x80, 0xFF, 0xF0, 0x04, 0x00, 0x00, 0x00}, 0, U""},
+    };
+}
+
+class ClosedCaptionDecodeTest : public testing::TestWithParam<DecodeCase> {};
+
+TEST_P(ClosedCaptionDecodeTest, DecodesOnePacket) {
+    const DecodeCase& c = GetParam();
+    TraceCapture trace;
+    setTraceLevel(TRACE_DEBUG);
+    android::sp<RingBuffer> output = test::makeRing("CCRaw", 1 << 16);
+    android::sp<ClosedCaptionDecoder> decoder = new ClosedCaptionDecoder();
+    decoder->addOutput(output, nullptr);
+    OwnedPesRecord record(c.es, 123456);
+
+    EXPECT_EQ(decoder->processPacket(record.get()), c.result);
+    const std::vector<CaptionRecord> written = drainCaptions(*output);
+    if (c.result == 1) {
+        ASSERT_EQ(written.size(), 1u);
+        EXPECT_EQ(written[0].text, c.text);
+        EXPECT_EQ(written[0].size, 32 + 4 * c.text.size());
+        EXPECT_EQ(written[0].pts, 123456u);
+        EXPECT_EQ(decoder->getCCSize(), 4 * c.text.size());
+    } else {
+        EXPECT_TRUE(written.empty());
+    }
+    if (*c.logged != '\0') {
+        EXPECT_TRUE(trace.contains(c.logged)) << trace.all();
+    }
+    setTraceLevel(TRACE_INFO);
+}
+
+INSTANTIATE_TEST_SUITE_P(Units, ClosedCaptionDecodeTest, testing::ValuesIn(decodeCases()),
+                         [](const auto& info) { return std::string(info.param.name); });
+
+// The worker thread: every PES starts on an empty screen, records keep their order
+// and PTS, and stop ends the thread while it waits for input.
+TEST(ClosedCaptionDecoderModuleTest, WorkerDecodesEachPesOnItsOwnScreen) {
+    android::sp<RingBuffer> input = test::makeRing("CCPES", 1 << 16);
+    android::sp<RingBuffer> output = test::makeRing("CCRaw", 1 << 16);
+    android::sp<ClosedCaptionDecoder> decoder = new ClosedCaptionDecoder();
+    EXPECT_EQ(decoder->start(), 1u);  // no rings yet
+    decoder->setInput(input);
+    decoder->addOutput(output, nullptr);
+    ASSERT_EQ(decoder->start(), 0u);
+
+    const std::vector<Bytes> units = {bytesOf("one"), bytesOf("\r"), bytesOf("two")};
+    for (size_t i = 0; i < units.size(); ++i) {
+        OwnedPesRecord record(captionEs(units[i]), 1000 * (i + 1));
+        const auto size = record.get()->mSize;
+        ASSERT_TRUE(input->waitForSpace(size));
+        memcpy(input->writePointer(), record.get(), size);
+        input->commitWrite(size);
+    }
+    ASSERT_TRUE(waitConsumed(*input));
+    EXPECT_EQ(decoder->stop(), 0u);
+    const std::vector<CaptionRecord> written = drainCaptions(*output);
+    ASSERT_EQ(written.size(), 2u);
+    EXPECT_EQ(written[0].text, U"one\n");
+    EXPECT_EQ(written[0].pts, 1000u);
+    EXPECT_EQ(written[1].text, U"two\n");  // not "one" again: the screen was cleared
+    EXPECT_EQ(written[1].pts, 3000u);
+}
+
+TEST(ClosedCaptionDecoderModuleTest, GetCcCopiesOnlyWhenItFits) {
+    android::sp<RingBuffer> output = test::makeRing("CCRaw", 1 << 16);
+    android::sp<ClosedCaptionDecoder> decoder = new ClosedCaptionDecoder();
+    decoder->addOutput(output, nullptr);
+    OwnedPesRecord record(captionEs(bytesOf("Hi")), 0);
+    ASSERT_EQ(decoder->processPacket(record.get()), 1u);
+    ASSERT_EQ(decoder->getCCSize(), 12u);
+    std::vector<unsigned char> small(11, 0xEE), exact(12, 0xEE);
+    decoder->getCC(small.data(), 11);
+    EXPECT_EQ(small, std::vector<unsigned char>(11, 0xEE));
+    decoder->getCC(exact.data(), 12);
+    EXPECT_EQ(toU32(exact.data(), 12), U"Hi\n");
+    decoder->getCC(nullptr, 100);  // ignored
+}
+
+}  // namespace
+}  // namespace TavoPlayer

@@ -32,10 +32,12 @@
 
 #include "common/Uint33.h"
 #include "renderer/AudioRenderer.h"
+#include "renderer/VideoRenderer.h"
 
 namespace TavoPlayer {
 
 class ServiceController : public virtual android::RefBase,
+                          public VideoRenderer::FrameRenderedListener,
                           public AudioRenderer::AudioRenderedListener {
 public:
     enum event_t : uint32_t {
@@ -135,8 +137,8 @@ public:
     int getFrameRate() const { return mFrameRate.load(); }
 
     // From the video renderer's thread, for every shown frame.
-    void onFrameRendered(int width, int height, Uint33 pts);
-    void onFirstFrameRendered(int width, int height);
+    void onFrameRendered(int width, int height, Uint33 pts) override;
+    void onFirstFrameRendered(int width, int height) override;
     // From the audio renderer's thread.
     void onAudioRendered() override;
     void onAudioReady(long waitToRender) override;

@@ -10,6 +10,7 @@
 #include <vector>
 
 #include "support/CaptionBuilder.h"
+#include "support/CaptionTestDoubles.h"
 #include "support/TraceCapture.h"
 #include "support/TsTestUtil.h"
 
@@ -17,54 +18,6 @@ namespace TavoPlayer {
 namespace {
 
 using namespace test;
-
-// A monotonic clock that moves only when told to.
-struct ManualClock {
-    std::atomic<int64_t> nowMs{1'000'000};
-    std::atomic<int> reads{0};
-    android::sp<Synchronization> make() {
-        return new Synchronization([this](timespec* ts) {
-            const int64_t ms = nowMs.load();
-            ts->tv_sec = ms / 1000;
-            ts->tv_nsec = (ms % 1000) * 1'000'000;
-            reads.fetch_add(1);
-            return true;
-        });
-    }
-};
-
-class RecordingListener : public ClosedCaptionListener {
-public:
-    void onClosedCaptionReceived(unsigned char* text, int length) override {
-        std::lock_guard<std::mutex> lock(mMutex);
-        mTexts.push_back(toU32(text, length));
-    }
-    std::vector<std::u32string> texts() {
-        std::lock_guard<std::mutex> lock(mMutex);
-        return mTexts;
-    }
-
-private:
-    std::mutex mMutex;
-    std::vector<std::u32string> mTexts;
-};
-
-// Records the waits instead of sleeping, and lets the clock run through them.
-class WaitRecordingRenderer : public ClosedCaptionRenderer {
-public:
-    WaitRecordingRenderer(android::sp<Synchronization> clock, ManualClock& manual)
-        : ClosedCaptionRenderer(std::move(clock)), mManual(manual) {}
-    std::vector<int64_t> waits;
-
-protected:
-    void waitFor_l(std::unique_lock<std::mutex>&, int64_t waitMs) override {
-        waits.push_back(waitMs);
-        mManual.nowMs.fetch_add(waitMs);
-    }
-
-private:
-    ManualClock& mManual;
-};
 
 constexpr uint64_t kClockPcr = 900'000;
 

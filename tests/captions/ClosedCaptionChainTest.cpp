@@ -1,0 +1,201 @@
+// The caption chain as the broadcast controller builds it: "CCTS" -> TSParser (kind
+// 3) -> "CCPES" -> ClosedCaptionDecoder -> "CCRaw" -> ClosedCaptionRenderer ->
+// listener, on streams written by tsgen; and the decoder on real Japanese caption
+// streams, which share the data group and data unit framing.
+#include <dirent.h>
+#include <gtest/gtest.h>
+#include <unistd.h>
+
+#include <cstdio>
+#include <cstdlib>
+#include <map>
+#include <string>
+#include <vector>
+
+#include "decoder/ClosedCaptionDecoder.h"
+#include "support/CaptionBuilder.h"
+#include "support/CaptionTestDoubles.h"
+#include "support/TraceCapture.h"
+#include "support/TsTestUtil.h"
+#include "tsparser/TSParser.h"
+
+namespace TavoPlayer {
+namespace {
+
+using namespace test;
+
+constexpr uint16_t kCaptionPid = 0x130;
+constexpr uint64_t kFirstPts = 126000;  // tsgen's first picture PTS
+
+struct Caption {
+    double sec;
+    std::string argument;  // as given to tsgen
+    std::u32string text;   // what the listener must receive
+};
+
+// What the viewer is promised: accented Portuguese, the euro sign, the SS3 set,
+// APR starting a row, CS wiping what came before, APS placing text on a new row.
+const std::vector<Caption> kCaptions = {
+    {1.0, "Ação, você, à noite - 50€", U"Ação, você, à noite - 50€\n"},
+    {2.0, "\\x1D\\x21 Lá\\nFim", U"\u266A Lá\nFim\n"},
+    {3.0, "apagado\\fCS ok", U"CS ok\n"},
+    {4.0, "topo\\x1C\\x42\\x41baixo", U"topo\nbaixo\n"},
+    {4.5, "\\x1D\\x30\\x1D\\x40\\x1D\\x47 Œœ", U"\u00A4\u2026\u2122 \u0152\u0153\n"},
+};
+
+Bytes tsgenCaptionStream(const std::vector<Caption>& captions) {
+#ifndef TAVO_TSGEN_PATH
+    return {};
+#else
+    const std::string path = "/tmp/tavo_cc_chain_" + std::to_string(getpid()) + ".ts";
+    std::string command = std::string(TAVO_TSGEN_PATH) + " -o " + path +
+                          " -d 6 --size 64x64 --audio none --mux-rate 600000";
+    for (const auto& c : captions)
+        command += " --caption '" + std::to_string(c.sec) + ":" + c.argument + "'";
+    bool ok = false;
+    runCommand(command + " 2>&1", &ok);
+    Bytes ts = ok ? fileBytes(path) : Bytes{};
+    unlink(path.c_str());
+    return ts;
+#endif
+}
+
+TEST(ClosedCaptionChainTest, TsgenCaptionsReachTheListenerOnTime) {
+    const Bytes ts = tsgenCaptionStream(kCaptions);
+    ASSERT_FALSE(ts.empty()) << "tsgen did not produce the stream";
+
+    ManualClock manual;
+    android::sp<Synchronization> clock = manual.make();
+    // The clock starts 200 ms before the first caption; from then on it moves only
+    // by the renderer's waits, so each caption must arrive exactly at its PTS.
+    const uint64_t firstCaptionPts = kFirstPts + 90000;
+    clock->setBasePCR(firstCaptionPts - 200 * 90, Synchronization::RealPCR);
+
+    android::sp<RingBuffer> ccts = makeRing("CCTS", 1 << 18);
+    android::sp<RingBuffer> ccpes = makeRing("CCPES", 1 << 16);
+    android::sp<RingBuffer> ccraw = makeRing("CCRaw", 1 << 16);
+    android::sp<TSParser> parser = new TSParser(3);
+    parser->setInput(ccts);
+    parser->addOutput(ccpes, nullptr);
+    parser->configure(clock);
+    android::sp<ClosedCaptionDecoder> decoder = new ClosedCaptionDecoder();
+    decoder->setInput(ccpes);
+    decoder->addOutput(ccraw, nullptr);
+    android::sp<WaitRecordingRenderer> renderer = new WaitRecordingRenderer(clock, manual);
+    RecordingListener listener(clock);
+    renderer->setInput(ccraw);
+    renderer->registerListener(&listener);
+    renderer->setEnabled(1);
+    ASSERT_EQ(renderer->start(), 0u);
+    ASSERT_EQ(decoder->start(), 0u);
+    ASSERT_EQ(parser->start(), 0u);
+
+    Bytes captionPackets;
+    for (size_t at = 0; at + 188 <= ts.size(); at += 188) {
+        if ((((ts[at + 1] & 0x1F) << 8) | ts[at + 2]) == kCaptionPid)
+            captionPackets.insert(captionPackets.end(), ts.begin() + static_cast<long>(at),
+                                  ts.begin() + static_cast<long>(at + 188));
+    }
+    ASSERT_TRUE(writeAll(*ccts, captionPackets));
+    EXPECT_TRUE(waitUntil([&] { return listener.deliveries().size() >= kCaptions.size(); }));
+    parser->stop();
+    decoder->stop();
+    renderer->stop();
+
+    const auto deliveries = listener.deliveries();
+    ASSERT_EQ(deliveries.size(), kCaptions.size());
+    for (size_t i = 0; i < kCaptions.size(); ++i) {
+        SCOPED_TRACE(kCaptions[i].argument);
+        EXPECT_EQ(deliveries[i].text, kCaptions[i].text);
+        const auto pts = static_cast<uint64_t>(kFirstPts + kCaptions[i].sec * 90000);
+        EXPECT_EQ(deliveries[i].pcr, pts);
+    }
+    EXPECT_EQ(renderer->waits, (std::vector<int64_t>{200, 1000, 1000, 1000, 500}));
+}
+
+struct EsYield {
+    size_t units = 0;
+    std::map<unsigned int, size_t> results;
+    size_t longUnits = 0;
+};
+
+// The caption text's shape: at most three rows of at most 32 code points, no zero.
+bool wellFormed(const std::u32string& text) {
+    int rows = 0;
+    size_t inRow = 0;
+    for (char32_t c : text) {
+        if (c == 0)
+            return false;
+        if (c == U'\n' || inRow == 32) {
+            ++rows;
+            inRow = c == U'\n' ? 0 : 1;
+        } else {
+            ++inRow;
+        }
+    }
+    return rows + (inRow > 0 ? 1 : 0) <= 3;
+}
+
+TEST(ClosedCaptionChainTest, JapaneseCaptionStreamsDecodeWithoutFault) {
+    const std::string dir = std::string(TAVO_SHARED_STREAMS_DIR) + "/arib_caption_es";
+    std::vector<std::string> files;
+    if (DIR* d = opendir(dir.c_str())) {
+        while (dirent* e = readdir(d)) {
+            const std::string name = e->d_name;
+            if (name.size() > 3 && name.compare(name.size() - 3, 3, ".es") == 0)
+                files.push_back(name);
+        }
+        closedir(d);
+    }
+    if (files.empty())
+        GTEST_SKIP() << "no caption streams (*.es) in " << dir;
+
+    for (const std::string& name : files) {
+        SCOPED_TRACE(name);
+        const std::vector<Bytes> units = splitCaptionEs(fileBytes(dir + "/" + name));
+        ASSERT_FALSE(units.empty());
+        TraceCapture trace;
+        android::sp<RingBuffer> output = makeRing("CCRaw", 1 << 16);
+        android::sp<ClosedCaptionDecoder> decoder = new ClosedCaptionDecoder();
+        decoder->addOutput(output, nullptr);
+        EsYield yield;
+        // One exact-size record per unit, so that a read past a record is a read past
+        // its allocation (seen by the address sanitizer build).
+        for (const Bytes& unit : units) {
+            OwnedPesRecord record(unit, 90000);
+            ++yield.results[decoder->processPacket(record.get())];
+            decoder->clearScreenData();
+            for (const CaptionRecord& r : drainCaptions(*output))
+                EXPECT_TRUE(wellFormed(r.text));
+        }
+        yield.units = units.size();
+        yield.longUnits = trace.count("dropped");
+        EXPECT_LE(yield.longUnits, yield.results[0]);  // dropped units give 0
+        printf(
+            "%s: %zu units: %zu written, %zu empty, %zu not a statement body, "
+            "%zu nothing (management groups, malformed; %zu units of 256 bytes or more)\n",
+            name.c_str(), yield.units, yield.results[1], yield.results[2], yield.results[4],
+            yield.results[0], yield.longUnits);
+
+        // The same units through the worker thread: every one is consumed.
+        android::sp<RingBuffer> input = makeRing("CCPES", 1 << 20);
+        decoder->setInput(input);
+        ASSERT_EQ(decoder->start(), 0u);
+        for (const Bytes& unit : units) {
+            OwnedPesRecord record(unit, 90000);
+            const uint32_t size = record.get()->mSize;
+            ASSERT_TRUE(waitUntil([&] { return input->waitForSpace(RingBuffer::roundUp4(size)); }));
+            memcpy(input->writePointer(), record.get(), size);
+            input->commitWrite(size);
+            drainCaptions(*output);
+        }
+        EXPECT_TRUE(waitUntil([&] {
+            drainCaptions(*output);
+            return input->usedSpace() == 0;
+        })) << "the worker stalled";
+        EXPECT_EQ(decoder->stop(), 0u);
+    }
+}
+
+}  // namespace
+}  // namespace TavoPlayer

@@ -1,0 +1,4 @@
+# The caption chain tests write their streams with tsgen.
+if(TARGET tsgen)
+    add_dependencies(${TEST_TARGET} tsgen)
+endif()

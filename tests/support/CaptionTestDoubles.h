@@ -1,0 +1,80 @@
+// Test doubles for the caption renderer: a monotonic clock that moves only when
+// told to, a listener that keeps what it receives (and the stream clock at that
+// moment), and a renderer whose timed waits are recorded and run the clock forward
+// instead of sleeping. Header-only: only tests that link the renderer include it.
+#pragma once
+
+#include <time.h>
+
+#include <atomic>
+#include <mutex>
+#include <utility>
+#include <vector>
+
+#include "renderer/ClosedCaptionRenderer.h"
+#include "support/CaptionBuilder.h"
+
+namespace TavoPlayer::test {
+
+struct ManualClock {
+    std::atomic<int64_t> nowMs{1'000'000};
+    std::atomic<int> reads{0};
+    android::sp<Synchronization> make() {
+        return new Synchronization([this](timespec* ts) {
+            const int64_t ms = nowMs.load();
+            ts->tv_sec = ms / 1000;
+            ts->tv_nsec = (ms % 1000) * 1'000'000;
+            reads.fetch_add(1);
+            return true;
+        });
+    }
+};
+
+class RecordingListener : public ClosedCaptionListener {
+public:
+    struct Delivery {
+        std::u32string text;
+        uint64_t pcr;  // the stream clock when the caption arrived (0 without a clock)
+    };
+    explicit RecordingListener(android::sp<Synchronization> clock = nullptr)
+        : mClock(std::move(clock)) {}
+    void onClosedCaptionReceived(unsigned char* text, int length) override {
+        const uint64_t pcr = mClock != nullptr ? mClock->getPCR() : 0;
+        std::lock_guard<std::mutex> lock(mMutex);
+        mDeliveries.push_back({toU32(text, length), pcr});
+    }
+    std::vector<Delivery> deliveries() {
+        std::lock_guard<std::mutex> lock(mMutex);
+        return mDeliveries;
+    }
+    std::vector<std::u32string> texts() {
+        std::vector<std::u32string> out;
+        for (const auto& d : deliveries())
+            out.push_back(d.text);
+        return out;
+    }
+
+private:
+    android::sp<Synchronization> mClock;
+    std::mutex mMutex;
+    std::vector<Delivery> mDeliveries;
+};
+
+class WaitRecordingRenderer : public ClosedCaptionRenderer {
+public:
+    WaitRecordingRenderer(android::sp<Synchronization> clock, ManualClock& manual)
+        : ClosedCaptionRenderer(std::move(clock)), mManual(manual) {}
+    // Written by the renderer's thread; read once it has stopped.
+    std::vector<int64_t> waits;
+
+protected:
+    void waitFor_l(std::unique_lock<std::mutex>&, int64_t waitMs) override {
+        waits.push_back(waitMs);
+        mManual.nowMs.fetch_add(waitMs);
+    }
+
+private:
+    ManualClock& mManual;
+};
+
+}  // namespace TavoPlayer::test

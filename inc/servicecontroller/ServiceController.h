@@ -154,6 +154,9 @@ public:
     void updateSignalTimer();
 
     uint8_t getSignalStatus() const { return mSignalStatus.load(); }
+    // Set at construction and when the signal is lost: the next shown frame
+    // announces itself with START_VIDEO_TASK_EVENT.
+    bool isFirstFrameFlagSet() const { return mFirstFrame.load(); }
 
 private:
     // Monotonic now in ms (seconds x 1000 + nanoseconds / 10^6, truncated).

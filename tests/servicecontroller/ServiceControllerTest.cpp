@@ -243,6 +243,14 @@ size_t pollingThreads() {
     return n;
 }
 
+// libutils threads are detached: a joined thread may linger in /proc for a moment
+// after its loop ended. Waits (generously) for the count to settle.
+size_t pollingThreadsSettlingAt(size_t expected) {
+    for (int i = 0; i < 500 && pollingThreads() != expected; ++i)
+        std::this_thread::sleep_for(std::chrono::milliseconds(10));
+    return pollingThreads();
+}
+
 // Real threads and the real clock: assertions are on what happens, with
 // generous deadlines, never on when.
 class ServiceControllerThreadsTest : public ::testing::Test {
@@ -262,9 +270,7 @@ TEST_F(ServiceControllerThreadsTest, EndOfContentComesOnceAndTheCheckerEnds) {
         controller->onFrameRendered(16, 16, 0);
     ASSERT_TRUE(listener.waitFor(SC::EOC_EVENT, 1));
     // The checker ended itself: no second event, and its thread is gone.
-    for (int i = 0; i < 500 && pollingThreads() > before; ++i)
-        std::this_thread::sleep_for(std::chrono::milliseconds(10));
-    EXPECT_EQ(pollingThreads(), before);
+    EXPECT_EQ(pollingThreadsSettlingAt(before), before);
     EXPECT_EQ(listener.count(SC::EOC_EVENT), 1u);
     controller->stopCheckEndOfContent();
 }
@@ -275,13 +281,11 @@ TEST_F(ServiceControllerThreadsTest, CheckersRunAsPollingThreadsAndStopAllLeaves
     controller->startCheckSignal();
     controller->startCheckFrameRate();
     controller->startCheckEndOfContent();
-    for (int i = 0; i < 500 && pollingThreads() < before + 4; ++i)
-        std::this_thread::sleep_for(std::chrono::milliseconds(10));
-    EXPECT_EQ(pollingThreads(), before + 4);
+    EXPECT_EQ(pollingThreadsSettlingAt(before + 4), before + 4);
     controller->onAudioReady(40);
     ASSERT_TRUE(listener.waitFor(SC::BUFFERING_EVENT, 1));
     controller->stopAll();
-    EXPECT_EQ(pollingThreads(), before);
+    EXPECT_EQ(pollingThreadsSettlingAt(before), before);
     EXPECT_EQ(listener.count(SC::BUFFERING_END_EVENT), 1u);
     // A second stop has no buffering check to end and sends nothing.
     controller->stopAll();
@@ -294,7 +298,7 @@ TEST_F(ServiceControllerThreadsTest, DestroyingWhileCheckingLeavesNoThread) {
     controller->startCheckSignal();  // a restart must not leave the first polling
     controller->startCheckFrameRate();
     controller.clear();
-    EXPECT_EQ(pollingThreads(), before);
+    EXPECT_EQ(pollingThreadsSettlingAt(before), before);
 }
 
 }  // namespace

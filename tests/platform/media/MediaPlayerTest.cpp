@@ -1,0 +1,378 @@
+#include "platform/media/MediaPlayer.h"
+
+#include <arpa/inet.h>
+#include <gtest/gtest.h>
+#include <netinet/in.h>
+#include <pthread.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <condition_variable>
+#include <future>
+#include <mutex>
+#include <thread>
+#include <vector>
+
+#include "platform/media/MediaPlayerOutputs.h"
+#include "support/MediaTestFiles.h"
+#include "support/TraceCapture.h"
+#include "support/TsTestUtil.h"
+
+namespace TavoPlayer::test {
+namespace {
+
+using android::MediaPlayer;
+using android::sp;
+
+struct Note {
+    int msg;
+    int ext1;
+    int ext2;
+    std::string thread;
+};
+
+class RecordingListener : public android::MediaPlayerListener {
+public:
+    void notify(int msg, int ext1, int ext2, const android::Parcel*) override {
+        char name[16] = {};
+        pthread_getname_np(pthread_self(), name, sizeof name);
+        std::lock_guard<std::mutex> lock(mMutex);
+        mNotes.push_back({msg, ext1, ext2, name});
+        mChanged.notify_all();
+    }
+    // Index of the first note `msg` (and `ext1` unless -1), waiting for it; -1 if none.
+    int waitFor(int msg, int ext1 = -1, std::chrono::milliseconds deadline = kDeadline) {
+        std::unique_lock<std::mutex> lock(mMutex);
+        int found = -1;
+        mChanged.wait_for(lock, deadline, [&] { return (found = find_l(msg, ext1)) >= 0; });
+        return found;
+    }
+    int count(int msg, int ext1 = -1) {
+        std::lock_guard<std::mutex> lock(mMutex);
+        int n = 0;
+        for (const Note& note : mNotes)
+            n += note.msg == msg && (ext1 == -1 || note.ext1 == ext1);
+        return n;
+    }
+    std::vector<Note> notes() {
+        std::lock_guard<std::mutex> lock(mMutex);
+        return mNotes;
+    }
+
+private:
+    int find_l(int msg, int ext1) const {
+        for (size_t i = 0; i < mNotes.size(); ++i) {
+            if (mNotes[i].msg == msg && (ext1 == -1 || mNotes[i].ext1 == ext1))
+                return static_cast<int>(i);
+        }
+        return -1;
+    }
+    std::mutex mMutex;
+    std::condition_variable mChanged;
+    std::vector<Note> mNotes;
+};
+
+int position(const sp<MediaPlayer>& player) {
+    int ms = -1;
+    EXPECT_EQ(player->getCurrentPosition(&ms), android::OK);
+    return ms;
+}
+
+class MediaPlayerTest : public ::testing::Test {
+protected:
+    static void SetUpTestSuite() { sFiles = new MediaTestFiles(); }
+    static void TearDownTestSuite() { delete sFiles; }
+    void SetUp() override {
+        ASSERT_TRUE(sFiles->ok()) << sFiles->error();
+        mPlayer = new MediaPlayer();
+        mListener = new RecordingListener();
+        mPlayer->setListener(mListener);
+    }
+    void TearDown() override { mPlayer->disconnect(); }
+    void open(const std::string& url) {
+        ASSERT_EQ(mPlayer->setDataSource(nullptr, url.c_str(), nullptr), android::OK);
+    }
+
+    static MediaTestFiles* sFiles;
+    sp<MediaPlayer> mPlayer;
+    sp<RecordingListener> mListener;
+};
+MediaTestFiles* MediaPlayerTest::sFiles = nullptr;
+
+struct PlaybackCase {
+    const char* name;
+    std::string (MediaTestFiles::*file)() const;
+    int width;  // 0: no video
+    int height;
+    bool intact;  // the whole file is there: its duration is the encoded one
+};
+
+class MediaPlayerPlaybackTest : public MediaPlayerTest,
+                                public ::testing::WithParamInterface<PlaybackCase> {};
+
+TEST_P(MediaPlayerPlaybackTest, PreparesPlaysToTheEndAndNotifiesInOrder) {
+    const PlaybackCase& c = GetParam();
+    open((sFiles->*c.file)());
+    ASSERT_EQ(mPlayer->prepare(), android::OK);
+    const int size = mListener->waitFor(android::MEDIA_SET_VIDEO_SIZE);
+    ASSERT_GE(size, 0);
+    EXPECT_EQ(mListener->notes()[size].ext1, c.width);
+    EXPECT_EQ(mListener->notes()[size].ext2, c.height);
+    int durationMs = 0;
+    ASSERT_EQ(mPlayer->getDuration(&durationMs), android::OK);
+    if (c.intact) {
+        EXPECT_NEAR(durationMs, MediaTestFiles::kSeconds * 1000, 100);
+    }
+    EXPECT_EQ(mListener->count(android::MEDIA_INFO, android::MEDIA_INFO_RENDERING_START), 0)
+        << "nothing is rendered before start";
+
+    ASSERT_EQ(mPlayer->start(), android::OK);
+    EXPECT_TRUE(mPlayer->isPlaying());
+    const int complete = mListener->waitFor(android::MEDIA_PLAYBACK_COMPLETE);
+    ASSERT_GE(complete, 0);
+    EXPECT_FALSE(mPlayer->isPlaying());
+    // Delivered in order: a first frame shown is reported before the end is.
+    const int rendering =
+        mListener->waitFor(android::MEDIA_INFO, android::MEDIA_INFO_RENDERING_START, {});
+    if (c.width > 0) {
+        EXPECT_GT(rendering, size);
+        EXPECT_LT(rendering, complete);
+        EXPECT_EQ(mListener->count(android::MEDIA_INFO, android::MEDIA_INFO_RENDERING_START), 1);
+    } else {
+        EXPECT_EQ(rendering, -1);
+    }
+    EXPECT_EQ(mListener->count(android::MEDIA_SET_VIDEO_SIZE), 1);
+    EXPECT_EQ(mListener->count(android::MEDIA_ERROR), 0);
+    if (c.intact) {
+        EXPECT_NEAR(position(mPlayer), durationMs, 100);
+    }
+    for (const Note& note : mListener->notes())
+        EXPECT_EQ(note.thread, "MediaPlayerCB") << "message " << note.msg;
+    EXPECT_EQ(mPlayer->stop(), android::OK);
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Files, MediaPlayerPlaybackTest,
+    ::testing::Values(PlaybackCase{"Mp4", &MediaTestFiles::mp4, 320, 240, true},
+                      PlaybackCase{"Mkv", &MediaTestFiles::mkv, 176, 144, true},
+                      PlaybackCase{"AudioOnly", &MediaTestFiles::audioOnly, 0, 0, true},
+                      PlaybackCase{"Truncated", &MediaTestFiles::truncated, 320, 240, false}),
+    [](const auto& info) { return std::string(info.param.name); });
+
+TEST_F(MediaPlayerTest, PauseHoldsThePositionAndStartResumes) {
+    open(sFiles->mp4());
+    ASSERT_EQ(mPlayer->prepare(), android::OK);
+    ASSERT_EQ(mPlayer->start(), android::OK);
+    ASSERT_TRUE(waitUntil([&] { return position(mPlayer) >= 300; }));
+    ASSERT_EQ(mPlayer->pause(), android::OK);
+    EXPECT_FALSE(mPlayer->isPlaying());
+    const int paused = position(mPlayer);
+    std::this_thread::sleep_for(std::chrono::milliseconds(300));
+    EXPECT_EQ(position(mPlayer), paused);
+    ASSERT_EQ(mPlayer->start(), android::OK);
+    EXPECT_TRUE(waitUntil([&] { return position(mPlayer) > paused; }));
+}
+
+struct SeekCase {
+    const char* name;
+    android::MediaPlayerSeekMode mode;
+    int targetMs;
+    int expectedMs;  // key frames every second
+};
+
+class MediaPlayerSeekTest : public MediaPlayerTest,
+                            public ::testing::WithParamInterface<SeekCase> {};
+
+TEST_P(MediaPlayerSeekTest, LandsWhereTheModeSaysAndReportsCompletion) {
+    const SeekCase& c = GetParam();
+    open(sFiles->mp4());
+    ASSERT_EQ(mPlayer->prepare(), android::OK);
+    ASSERT_EQ(mPlayer->seekTo(c.targetMs, c.mode), android::OK);
+    ASSERT_GE(mListener->waitFor(android::MEDIA_SEEK_COMPLETE), 0);
+    EXPECT_NEAR(position(mPlayer), c.expectedMs, 45);
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Modes, MediaPlayerSeekTest,
+    ::testing::Values(SeekCase{"PreviousSync", android::SEEK_PREVIOUS_SYNC, 1500, 1000},
+                      SeekCase{"PreviousSyncJustBeforeKey", android::SEEK_PREVIOUS_SYNC, 990, 0},
+                      SeekCase{"Closest", android::SEEK_CLOSEST, 1500, 1500}),
+    [](const auto& info) { return std::string(info.param.name); });
+
+// A TCP port on the loopback that nobody listens on: bound, then closed.
+int closedPort() {
+    const int fd = socket(AF_INET, SOCK_STREAM, 0);
+    sockaddr_in addr{};
+    addr.sin_family = AF_INET;
+    addr.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+    socklen_t len = sizeof addr;
+    bind(fd, reinterpret_cast<sockaddr*>(&addr), len);
+    getsockname(fd, reinterpret_cast<sockaddr*>(&addr), &len);
+    close(fd);
+    return ntohs(addr.sin_port);
+}
+
+struct BadSourceCase {
+    const char* name;
+    std::function<std::string(const MediaTestFiles&)> url;
+    android::status_t status;
+};
+
+class MediaPlayerBadSourceTest : public MediaPlayerTest,
+                                 public ::testing::WithParamInterface<BadSourceCase> {};
+
+TEST_P(MediaPlayerBadSourceTest, PrepareFailsWithTheStatusAndTellsTheListener) {
+    TraceCapture trace;
+    open(GetParam().url(*sFiles));
+    EXPECT_EQ(mPlayer->prepare(), GetParam().status);
+    const int error = mListener->waitFor(android::MEDIA_ERROR);
+    ASSERT_GE(error, 0);
+    EXPECT_EQ(mListener->notes()[error].ext1, android::MEDIA_ERROR_UNKNOWN);
+    EXPECT_EQ(mListener->notes()[error].ext2, GetParam().status);
+    EXPECT_EQ(trace.count(TRACE_ERROR, "Error preparing"), 1u) << trace.all();
+    EXPECT_EQ(mPlayer->start(), android::INVALID_OPERATION);
+    EXPECT_EQ(position(mPlayer), 0);
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Sources, MediaPlayerBadSourceTest,
+    ::testing::Values(
+        BadSourceCase{"Missing", [](auto& f) { return f.missing(); }, android::MEDIA_ERROR_IO},
+        BadSourceCase{"Empty", [](auto&) { return std::string(); }, android::MEDIA_ERROR_IO},
+        BadSourceCase{"Directory", [](auto& f) { return f.dir(); },
+                      android::MEDIA_ERROR_UNSUPPORTED},
+        BadSourceCase{"BrokenHeader", [](auto& f) { return f.brokenHeader(); },
+                      android::MEDIA_ERROR_UNSUPPORTED},
+        BadSourceCase{"NotMedia", [](auto& f) { return f.notMedia(); },
+                      android::MEDIA_ERROR_UNSUPPORTED},
+        BadSourceCase{
+            "ClosedPort",
+            [](auto&) { return "http://127.0.0.1:" + std::to_string(closedPort()) + "/a.mp4"; },
+            android::MEDIA_ERROR_IO},
+        BadSourceCase{"UnresolvableHost",
+                      [](auto&) { return std::string("http://tavoplayer-test.invalid/a.mp4"); },
+                      android::MEDIA_ERROR_IO}),
+    [](const auto& info) { return std::string(info.param.name); });
+
+// A server that accepts the connection and never answers: prepare waits on it.
+class SilentServer {
+public:
+    SilentServer() {
+        mListen = socket(AF_INET, SOCK_STREAM, 0);
+        sockaddr_in addr{};
+        addr.sin_family = AF_INET;
+        addr.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+        socklen_t len = sizeof addr;
+        bind(mListen, reinterpret_cast<sockaddr*>(&addr), len);
+        listen(mListen, 4);
+        getsockname(mListen, reinterpret_cast<sockaddr*>(&addr), &len);
+        mUrl = "http://127.0.0.1:" + std::to_string(ntohs(addr.sin_port)) + "/a.mp4";
+    }
+    ~SilentServer() {
+        if (mClient >= 0)
+            close(mClient);
+        close(mListen);
+    }
+    void acceptOne() { mClient = accept(mListen, nullptr, nullptr); }
+    const std::string& url() const { return mUrl; }
+
+private:
+    int mListen = -1;
+    int mClient = -1;
+    std::string mUrl;
+};
+
+class MediaPlayerInterruptTest : public MediaPlayerTest,
+                                 public ::testing::WithParamInterface<bool> {};
+
+TEST_P(MediaPlayerInterruptTest, StopOrDisconnectEndsAPrepareThatWaitsOnTheNetwork) {
+    const bool disconnect = GetParam();
+    TraceCapture trace;
+    SilentServer server;
+    open(server.url());
+    auto prepared = std::async(std::launch::async, [&] { return mPlayer->prepare(); });
+    server.acceptOne();  // the player is connected and waiting for an answer
+    if (disconnect)
+        mPlayer->disconnect();
+    else
+        EXPECT_EQ(mPlayer->stop(), android::OK);
+    ASSERT_EQ(prepared.wait_for(kDeadline), std::future_status::ready);
+    EXPECT_EQ(prepared.get(), android::INVALID_OPERATION);
+    EXPECT_TRUE(trace.contains("stopped before it was prepared")) << trace.all();
+    EXPECT_EQ(mListener->count(android::MEDIA_ERROR), 0);
+    EXPECT_EQ(mPlayer->start(), disconnect ? android::NO_INIT : android::INVALID_OPERATION);
+}
+
+INSTANTIATE_TEST_SUITE_P(By, MediaPlayerInterruptTest, ::testing::Values(false, true),
+                         [](const auto& info) { return info.param ? "Disconnect" : "Stop"; });
+
+struct OutputsCase {
+    const char* name;
+    const char* videoSink;
+    const char* audioSink;
+    bool surface;
+    bool display;
+    bool soundCard;
+    const char* vo;
+    const char* ao;
+    std::vector<std::pair<std::string, std::string>> options;
+    bool note;  // a sink had no counterpart: null stands in, and says so
+};
+
+class MediaPlayerOutputsTest : public ::testing::TestWithParam<OutputsCase> {};
+
+TEST_P(MediaPlayerOutputsTest, FollowTheSinksAndTheMachine) {
+    const OutputsCase& c = GetParam();
+    const auto out = android::MediaPlayerOutputs::choose(c.videoSink, c.audioSink, c.surface,
+                                                         c.display, c.soundCard);
+    EXPECT_EQ(out.vo, c.vo);
+    EXPECT_EQ(out.ao, c.ao);
+    EXPECT_EQ(out.options, c.options);
+    EXPECT_EQ(!out.note.empty(), c.note) << out.note;
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Sinks, MediaPlayerOutputsTest,
+    ::testing::Values(
+        OutputsCase{"Headless", "", "", true, false, false, "null", "null", {}, false},
+        OutputsCase{"DefaultsOnADesktop", "", "", true, true, true, "sdl", "alsa", {}, false},
+        OutputsCase{"NoSurface", "sdl", "", false, true, true, "null", "alsa", {}, false},
+        OutputsCase{"NullSinks", "null", "null", true, true, true, "null", "null", {}, false},
+        OutputsCase{
+            "SdlWithoutDisplay", "sdl", "alsa", true, false, false, "null", "null", {}, true},
+        OutputsCase{"AlsaDevice",
+                    "null",
+                    "alsa:hw:1,0",
+                    true,
+                    true,
+                    true,
+                    "null",
+                    "alsa",
+                    {{"audio-device", "alsa/hw:1,0"}},
+                    false},
+        OutputsCase{"Wav",
+                    "null",
+                    "wav:/tmp/a.wav",
+                    true,
+                    false,
+                    false,
+                    "null",
+                    "pcm",
+                    {{"ao-pcm-file", "/tmp/a.wav"}, {"ao-pcm-waveheader", "yes"}},
+                    false},
+        OutputsCase{"Y4mHasNoCounterpart",
+                    "y4m:/tmp/v.y4m",
+                    "null",
+                    true,
+                    true,
+                    false,
+                    "null",
+                    "null",
+                    {},
+                    true},
+        OutputsCase{"Unknown", "vga", "alsamixer", true, true, true, "null", "null", {}, true}),
+    [](const auto& info) { return std::string(info.param.name); });
+
+}  // namespace
+}  // namespace TavoPlayer::test

@@ -1,0 +1,65 @@
+#include "support/MediaTestFiles.h"
+
+#include <stdlib.h>
+
+#include <filesystem>
+#include <fstream>
+#include <vector>
+
+#include "support/TsTestUtil.h"
+
+namespace TavoPlayer::test {
+
+MediaTestFiles::MediaTestFiles() {
+    setenv("TAVOPLAYER_PROP_tavoplayer_video_sink", "null", 1);
+    setenv("TAVOPLAYER_PROP_tavoplayer_audio_sink", "null", 1);
+    std::string templ = std::filesystem::temp_directory_path() / "tavo-media-XXXXXX";
+    std::vector<char> name(templ.begin(), templ.end());
+    name.push_back('\0');
+    if (mkdtemp(name.data()) == nullptr) {
+        mError = "mkdtemp failed";
+        return;
+    }
+    mDir = name.data();
+
+    const std::string d = std::to_string(kSeconds);
+    const std::string ff = "ffmpeg -nostdin -hide_banner -loglevel error -y ";
+    const std::string video = " -f lavfi -i testsrc2=rate=25:size=";
+    const std::string tone = " -f lavfi -i sine=frequency=440:sample_rate=48000";
+    const std::string h264 = " -c:v libx264 -preset ultrafast -g 25 -pix_fmt yuv420p";
+    const std::string aac = " -c:a aac -b:a 64k";
+    const std::string commands[] = {
+        ff + video + "320x240" + tone + " -t " + d + h264 + aac +
+            " -movflags +faststart -shortest '" + mp4() + "' 2>&1",
+        ff + video + "176x144" + tone + " -t " + d + h264 + aac + " -shortest '" + mkv() + "' 2>&1",
+        ff + tone + " -t " + d + aac + " '" + audioOnly() + "' 2>&1",
+    };
+    for (const std::string& command : commands) {
+        bool ok = false;
+        const std::string out = runCommand(command, &ok);
+        if (!ok) {
+            mError = "ffmpeg failed: " + command + "\n" + out;
+            return;
+        }
+    }
+    std::vector<uint8_t> bytes = fileBytes(mp4());
+    auto write = [](const std::string& path, const uint8_t* data, size_t size) {
+        std::ofstream(path, std::ios::binary).write(reinterpret_cast<const char*>(data), size);
+    };
+    write(truncated(), bytes.data(), bytes.size() * 6 / 10);
+    // With faststart the movie box follows the 32-byte file-type box: overwrite both.
+    for (size_t i = 0; i < 256 && i < bytes.size(); ++i)
+        bytes[i] = static_cast<uint8_t>(0xA5 ^ i);
+    write(brokenHeader(), bytes.data(), bytes.size());
+    const std::string text = "This is not a media file.\n";
+    write(notMedia(), reinterpret_cast<const uint8_t*>(text.data()), text.size());
+}
+
+MediaTestFiles::~MediaTestFiles() {
+    if (!mDir.empty()) {
+        std::error_code ignored;
+        std::filesystem::remove_all(mDir, ignored);
+    }
+}
+
+}  // namespace TavoPlayer::test

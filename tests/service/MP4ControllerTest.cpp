@@ -1,0 +1,320 @@
+#include "service/MP4Controller.h"
+
+#include <gtest/gtest.h>
+
+#include <chrono>
+#include <mutex>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "support/MediaTestFiles.h"
+#include "support/TraceCapture.h"
+#include "support/TsTestUtil.h"
+
+namespace TavoPlayer::test {
+namespace {
+
+using android::sp;
+
+// Every listener the controller reports to, recording what arrives on any thread.
+class Listeners : public IPlayerListener,
+                  public ErrorListener,
+                  public AudioRenderer::AudioRenderedListener,
+                  public VideoRenderer::FrameRenderedListener {
+public:
+    void onTimeUpdate(int seconds) override { add(&mTimes, seconds); }
+    void onEndOfContent() override { add(&mEnds, 1); }
+    void onError(unsigned int code, const Module*) const override {
+        const_cast<Listeners*>(this)->add(&const_cast<Listeners*>(this)->mErrors, int(code));
+    }
+    void onAudioRendered() override {}
+    void onAudioReady(long) override {}
+    void onAudioSessionId(int id) override { add(&mSessions, id); }
+    void onFrameRendered(int, int, Uint33) override {}
+    void onFirstFrameRendered(int width, int height) override {
+        add(&mFirstFrames, width);
+        add(&mFirstFrames, height);
+    }
+
+    std::vector<int> times() const { return get(mTimes); }
+    std::vector<int> ends() const { return get(mEnds); }
+    std::vector<int> errors() const { return get(mErrors); }
+    std::vector<int> sessions() const { return get(mSessions); }
+    std::vector<int> firstFrames() const { return get(mFirstFrames); }
+
+private:
+    void add(std::vector<int>* to, int value) {
+        std::lock_guard<std::mutex> lock(mMutex);
+        to->push_back(value);
+    }
+    std::vector<int> get(const std::vector<int>& from) const {
+        std::lock_guard<std::mutex> lock(mMutex);
+        return from;
+    }
+    mutable std::mutex mMutex;
+    std::vector<int> mTimes, mEnds, mErrors, mSessions, mFirstFrames;
+};
+
+void attach(MP4Controller& controller, Listeners& listeners) {
+    controller.setPlayerListener(&listeners);
+    controller.setErrorListener(&listeners);
+    controller.setAudioRenderedListener(&listeners);
+    controller.setVideoRenderedListener(&listeners);
+}
+
+class MP4ControllerFileTest : public ::testing::Test {
+protected:
+    static void SetUpTestSuite() { sFiles = new MediaTestFiles(); }
+    static void TearDownTestSuite() { delete sFiles; }
+    void SetUp() override {
+        ASSERT_TRUE(sFiles->ok()) << sFiles->error();
+        mController = new MP4Controller();
+        attach(*mController, mListeners);
+    }
+    void TearDown() override {
+        mController->stop();
+        mController.clear();
+    }
+    unsigned int open(std::map<std::string, std::string> config) {
+        const unsigned int result = mController->configure(config);
+        mController->setAudioEnable(1);  // as the service does right after open
+        return result;
+    }
+
+    static MediaTestFiles* sFiles;
+    TraceCapture mTrace;
+    Listeners mListeners;
+    sp<MP4Controller> mController;
+};
+MediaTestFiles* MP4ControllerFileTest::sFiles = nullptr;
+
+TEST_F(MP4ControllerFileTest, PlaysAFileAndReportsFrameTimeAndEnd) {
+    ASSERT_EQ(open({{"path", sFiles->mp4()}}), 0u);
+    ASSERT_EQ(mController->start(), 0u);
+    ASSERT_TRUE(waitUntil([&] { return !mListeners.ends().empty(); }));
+    EXPECT_EQ(mListeners.sessions().size(), 1u);
+    EXPECT_GT(mListeners.sessions().at(0), 0);
+    EXPECT_EQ(mListeners.firstFrames(), (std::vector<int>{320, 240}));
+    EXPECT_EQ(mTrace.count("Video size: 320 x 240"), 1u);
+    // Seconds rounded up, never going back, up to the file's length.
+    const std::vector<int> times = mListeners.times();
+    ASSERT_FALSE(times.empty());
+    for (size_t i = 1; i < times.size(); ++i)
+        EXPECT_LE(times[i - 1], times[i]) << "at " << i;
+    EXPECT_EQ(times.back(), MediaTestFiles::kSeconds);
+    EXPECT_TRUE(mListeners.errors().empty());
+}
+
+TEST_F(MP4ControllerFileTest, PauseStopsTheTimeAndResumeAndSeekMoveIt) {
+    ASSERT_EQ(open({{"path", sFiles->mp4()}}), 0u);
+    ASSERT_EQ(mController->start(), 0u);
+    ASSERT_TRUE(waitUntil([&] { return !mListeners.times().empty(); }));
+    ASSERT_EQ(mController->pause(), 0u);
+    std::this_thread::sleep_for(std::chrono::milliseconds(150));  // a trigger under way ends
+    const size_t paused = mListeners.times().size();
+    std::this_thread::sleep_for(std::chrono::milliseconds(400));
+    EXPECT_EQ(mListeners.times().size(), paused) << "no time update while paused";
+    ASSERT_EQ(mController->resume(), 0u);
+    ASSERT_TRUE(waitUntil([&] { return mListeners.times().back() == 2; }));
+    // Back to the start: the time goes back to 1 s or less, then the end still comes.
+    ASSERT_EQ(mController->seek(0), 0u);
+    EXPECT_TRUE(waitUntil([&] { return mListeners.times().back() <= 1; }));
+    EXPECT_TRUE(waitUntil([&] { return !mListeners.ends().empty(); }));
+}
+
+struct BadPathCase {
+    const char* name;
+    std::function<std::map<std::string, std::string>(const MediaTestFiles&)> config;
+};
+
+class MP4ControllerBadPathTest : public MP4ControllerFileTest,
+                                 public ::testing::WithParamInterface<BadPathCase> {};
+
+TEST_P(MP4ControllerBadPathTest, ConfigureAcceptsAndStartEndsInErrorOne) {
+    std::map<std::string, std::string> config = GetParam().config(*sFiles);
+    EXPECT_EQ(mController->configure(config), 0u);
+    EXPECT_EQ(config.count("path"), 1u) << "looked up with the map's subscript";
+    EXPECT_EQ(mController->start(), 0u);
+    ASSERT_TRUE(waitUntil([&] { return !mListeners.errors().empty(); }));
+    EXPECT_EQ(mListeners.errors(), std::vector<int>{1});
+    EXPECT_EQ(mTrace.count(TRACE_ERROR, "Received MEDIA_ERROR"), 1u) << mTrace.all();
+    EXPECT_TRUE(mListeners.firstFrames().empty());
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Paths, MP4ControllerBadPathTest,
+    ::testing::Values(
+        BadPathCase{"Missing",
+                    [](auto& f) {
+                        return std::map<std::string, std::string>{{"path", f.missing()}};
+                    }},
+        BadPathCase{"NoPathKey", [](auto&) { return std::map<std::string, std::string>{}; }},
+        BadPathCase{"NotMedia",
+                    [](auto& f) {
+                        return std::map<std::string, std::string>{{"path", f.notMedia()}};
+                    }}),
+    [](const auto& info) { return std::string(info.param.name); });
+
+// A media player that plays nothing: it records the calls made to it and reports the
+// position it is given.
+class FakeMediaPlayer : public android::MediaPlayer {
+public:
+    android::status_t prepare() override { return record("prepare"); }
+    android::status_t start() override { return record("start"); }
+    android::status_t stop() override { return record("stop"); }
+    android::status_t pause() override { return record("pause"); }
+    android::status_t seekTo(int, android::MediaPlayerSeekMode) override {
+        return record("seekTo");
+    }
+    android::status_t setVolume(float left, float) override {
+        return record(left > 0 ? "volume on" : "volume off");
+    }
+    android::status_t setListener(const sp<android::MediaPlayerListener>& l) override {
+        return record(l != nullptr ? "listener" : "no listener");
+    }
+    android::status_t getCurrentPosition(int* msec) override {
+        *msec = positionMs;
+        return android::OK;
+    }
+    std::vector<std::string> calls() {
+        std::lock_guard<std::mutex> lock(mMutex);
+        return mCalls;
+    }
+    std::atomic<int> positionMs{0};
+
+private:
+    android::status_t record(const char* call) {
+        std::lock_guard<std::mutex> lock(mMutex);
+        mCalls.push_back(call);
+        return android::OK;
+    }
+    std::mutex mMutex;
+    std::vector<std::string> mCalls;
+};
+
+class MP4ControllerFakeTest : public ::testing::Test {
+protected:
+    void SetUp() override {
+        mPlayer = new FakeMediaPlayer();
+        mController = new MP4Controller(mPlayer);
+        attach(*mController, mListeners);
+    }
+    void TearDown() override {
+        mController->stop();
+        mController.clear();
+    }
+    TraceCapture mTrace;
+    Listeners mListeners;
+    sp<FakeMediaPlayer> mPlayer;
+    sp<MP4Controller> mController;
+};
+
+TEST_F(MP4ControllerFakeTest, StartsMutedUntilAudioIsEnabledAndStopClearsTheListener) {
+    mController->start();
+    mController->stop();
+    mController->setAudioEnable(1);
+    mController->start();
+    mController->setAudioEnable(0);
+    EXPECT_EQ(mPlayer->calls(),
+              (std::vector<std::string>{"listener", "volume off", "prepare", "start", "stop",
+                                        "no listener", "volume on", "listener", "volume on",
+                                        "prepare", "start", "volume off"}));
+}
+
+class MP4ControllerTimeTest : public MP4ControllerFakeTest,
+                              public ::testing::WithParamInterface<std::pair<int, int>> {};
+
+TEST_P(MP4ControllerTimeTest, ReportsWholeSecondsRoundedUp) {
+    mPlayer->positionMs = GetParam().first;
+    mController->start();
+    ASSERT_TRUE(waitUntil([&] { return mListeners.times().size() >= 2; }));
+    for (int seconds : mListeners.times())
+        EXPECT_EQ(seconds, GetParam().second);
+}
+
+INSTANTIATE_TEST_SUITE_P(PositionsMs, MP4ControllerTimeTest,
+                         ::testing::Values(std::pair{0, 0}, std::pair{1, 1}, std::pair{999, 1},
+                                           std::pair{1000, 1}, std::pair{1001, 2},
+                                           std::pair{59999, 60}, std::pair{60000, 60}));
+
+struct Notification {
+    int msg, ext1, ext2;
+};
+
+struct NotifyCase {
+    const char* name;
+    std::vector<Notification> notifications;
+    std::vector<int> firstFrames, ends, errors;
+    std::vector<std::pair<std::string, size_t>> logged;  // fragment, times
+};
+
+class MP4ControllerNotifyTest : public MP4ControllerFakeTest,
+                                public ::testing::WithParamInterface<NotifyCase> {};
+
+TEST_P(MP4ControllerNotifyTest, TurnsNotificationsIntoListenerCallsAndLogs) {
+    for (const Notification& n : GetParam().notifications)
+        mController->notify(n.msg, n.ext1, n.ext2, nullptr);
+    EXPECT_EQ(mListeners.firstFrames(), GetParam().firstFrames);
+    EXPECT_EQ(mListeners.ends(), GetParam().ends);
+    EXPECT_EQ(mListeners.errors(), GetParam().errors);
+    for (const auto& [fragment, times] : GetParam().logged)
+        EXPECT_EQ(mTrace.count(fragment), times) << fragment << "\n" << mTrace.all();
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Messages, MP4ControllerNotifyTest,
+    ::testing::Values(
+        NotifyCase{"SameSizeTwiceLoggedOnce",
+                   {{5, 320, 240}, {5, 320, 240}, {200, 3, 0}},
+                   {320, 240},
+                   {},
+                   {},
+                   {{"Video size: 320 x 240", 1}, {"Received MEDIA_SET_VIDEO_SIZE", 2}}},
+        NotifyCase{"NewSizeReplacesTheOld",
+                   {{5, 320, 240}, {5, 640, 480}, {200, 3, 0}},
+                   {640, 480},
+                   {},
+                   {},
+                   {{"Video size: 640 x 480", 1}}},
+        NotifyCase{"EmptySizeOfAudioOnlyNotLogged",
+                   {{5, 0, 0}, {200, 3, 0}},
+                   {0, 0},
+                   {},
+                   {},
+                   {{"Video size", 0}}},
+        NotifyCase{"InfoOtherThanRenderingStart",
+                   {{200, 701, 0}, {200, 1, 0}},
+                   {},
+                   {},
+                   {},
+                   {{"Received MEDIA_INFO", 2}, {"MEDIA_INFO_RENDERING_START", 0}}},
+        NotifyCase{"PlaybackComplete", {{2, 0, 0}}, {}, {1}, {}, {{"MEDIA_PLAYBACK_COMPLETE", 1}}},
+        NotifyCase{"ErrorIsFatal", {{100, 1, -1004}}, {}, {}, {1}, {{"Received MEDIA_ERROR", 1}}},
+        NotifyCase{"Buffering", {{3, 42, 0}}, {}, {}, {}, {{"Buffering at: 42", 1}}},
+        NotifyCase{"Unknown", {{4, 0, 0}, {7, 1, 2}}, {}, {}, {}, {{"msg 7, ext1 1, ext2 2", 1}}}),
+    [](const auto& info) { return std::string(info.param.name); });
+
+TEST_F(MP4ControllerFakeTest, BroadcastOnlyOperationsAreRefusedAndDoNothing) {
+    const std::vector<std::pair<const char*, std::function<unsigned int()>>> refused = {
+        {"getFrame", [&] { return mController->getFrame(1, 100); }},
+        {"setAVSync", [&] { return mController->setAVSync(100); }},
+        {"setAudioOnlyMode", [&] { return mController->setAudioOnlyMode(1); }},
+        {"setAudioPID", [&] { return mController->setAudioPID(0x101); }},
+        {"setCCPID", [&] { return mController->setCCPID(0x102); }},
+        {"setCaptionSync", [&] { return mController->setCaptionSync(100); }},
+        {"setCropRect", [&] { return mController->setCropRect(0, 0, 0, 10, 10); }},
+        {"startRecord", [&] { return mController->startRecord(nullptr); }},
+        {"stopRecord", [&] { return mController->stopRecord(true); }},
+        {"dump", [&] { return mController->dump(stderr, {}, 0); }},
+    };
+    for (const auto& [name, call] : refused)
+        EXPECT_EQ(call(), 1u) << name;
+    EXPECT_EQ(mController->getFrameRate(), -1);
+    EXPECT_EQ(mController->getPCRValue(), 0);
+    EXPECT_EQ(mController->setSoundEffect(3), 0u);
+    EXPECT_TRUE(mPlayer->calls().empty());
+}
+
+}  // namespace
+}  // namespace TavoPlayer::test

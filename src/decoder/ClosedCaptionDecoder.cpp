@@ -257,9 +257,9 @@ unsigned int ClosedCaptionDecoder::processPacket(PESData* record) {
     if (length < 1)
         return RESULT_NOTHING;
 
-    const android::sp<RingBuffer>& output = mOutputs.front();
-    if (output == nullptr)
+    if (mOutputs.empty() || mOutputs.front() == nullptr)
         return RESULT_NOTHING;
+    const android::sp<RingBuffer>& output = mOutputs.front();
     const uint32_t recordSize = ClosedCaptionFragmentData::kHeaderSize + length;
     if (!output->waitForSpace(recordSize))
         return RESULT_NOTHING;

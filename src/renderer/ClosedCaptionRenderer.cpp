@@ -129,7 +129,20 @@ void ClosedCaptionRenderer::renderFrame() {
 
     const int64_t delayMs = delayUntil(caption->mPTS);
     if (delayMs >= 1 && delayMs < kMaxWaitMs) {
+        // The input's read lock is let go for the wait: the wait gives the render lock
+        // back and retakes it, so holding the read lock across it would order the two
+        // locks both ways. This thread is the ring's only reader, so the record stays.
+        const uint32_t tail = mInput->tail();
+        mInput->abortRead();
         waitFor_l(lock, delayMs + mCaptionSync.load());
+        if (!mInput->waitForData(RingBuffer::roundUp4(size)))
+            return;
+        if (mInput->tail() != tail) {
+            // The ring was reset meanwhile: the record is gone.
+            mInput->abortRead();
+            return;
+        }
+        caption = reinterpret_cast<ClosedCaptionFragmentData*>(mInput->readPointer());
     }
 
     ClosedCaptionListener* listener = mListener.load();

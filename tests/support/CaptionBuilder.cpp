@@ -92,24 +92,14 @@ bool writeCaption(RingBuffer& ring, const std::u32string& text, uint64_t pts) {
 
 std::vector<Bytes> splitCaptionEs(const Bytes& es) {
     std::vector<Bytes> units;
-    size_t at = 0;
-    while (at + 3 <= es.size()) {
-        size_t end = es.size();
-        const size_t group = at + 3 + (es[at + 2] & 0x0F);
-        if (es[at] == 0x80 && group + 5 <= es.size()) {
-            const size_t groupSize = static_cast<size_t>(es[group + 3]) << 8 | es[group + 4];
-            end = std::min(es.size(), group + 5 + groupSize + 2);
-        }
-        // Where the sizes do not lead to the next packet, resynchronise on 80 FF.
-        if (end < es.size() && !(es[end] == 0x80 && end + 1 < es.size() && es[end + 1] == 0xFF)) {
-            end = at + 1;
-            while (end + 1 < es.size() && !(es[end] == 0x80 && es[end + 1] == 0xFF))
-                ++end;
-            if (end + 1 >= es.size())
-                end = es.size();
-        }
+    for (size_t at = 0, end = 0; at < es.size(); at = end) {
+        const size_t group = at + 3 + (es.size() > at + 2 ? es[at + 2] & 0x0F : 0);
+        end = es.size();
+        // PES_data_packet header, data group header with its 16-bit size, CRC_16; what
+        // does not parse is the last unit.
+        if (es[at] == 0x80 && group + 5 <= es.size())
+            end = std::min(end, group + 5 + (size_t{es[group + 3]} << 8 | es[group + 4]) + 2);
         units.emplace_back(es.begin() + static_cast<long>(at), es.begin() + static_cast<long>(end));
-        at = end;
     }
     return units;
 }

@@ -52,7 +52,7 @@ bool writeCaption(RingBuffer& ring, const std::u32string& text, uint64_t pts);
 std::u32string toU32(const unsigned char* bytes, int length);
 
 // Splits a caption elementary stream of concatenated PES_data_packets (each starting
-// 80 FF F0) at the data group sizes; a unit that does not parse ends at the next 80 FF.
+// 80 FF F0) at the data group sizes.
 std::vector<Bytes> splitCaptionEs(const Bytes& es);
 
 }  // namespace TavoPlayer::test

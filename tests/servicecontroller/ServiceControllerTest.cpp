@@ -4,6 +4,7 @@
 
 #include <dirent.h>
 
+#include <algorithm>
 #include <chrono>
 #include <condition_variable>
 #include <fstream>
@@ -30,114 +31,82 @@ public:
     }
     std::vector<Event> take() {
         std::lock_guard<std::mutex> lock(mMutex);
-        std::vector<Event> out;
-        out.swap(mEvents);
-        return out;
+        return std::exchange(mEvents, {});
     }
-    // Generous deadline on behaviour, never on timing.
-    bool waitFor(unsigned int event, size_t count) {
+    // How many `event`s have come, once at least `atLeast` have (or the generous
+    // deadline passed: behaviour, never timing, is asserted).
+    size_t count(unsigned int event, size_t atLeast = 0) {
         std::unique_lock<std::mutex> lock(mMutex);
-        return mChanged.wait_for(lock, std::chrono::seconds(10),
-                                 [&] { return countLocked(event) >= count; });
-    }
-    size_t count(unsigned int event) {
-        std::lock_guard<std::mutex> lock(mMutex);
-        return countLocked(event);
+        auto n = [&] {
+            return static_cast<size_t>(std::count_if(
+                mEvents.begin(), mEvents.end(), [&](auto& e) { return std::get<0>(e) == event; }));
+        };
+        mChanged.wait_for(lock, std::chrono::seconds(10), [&] { return n() >= atLeast; });
+        return n();
     }
 
 private:
-    size_t countLocked(unsigned int event) const {
-        size_t n = 0;
-        for (const Event& e : mEvents)
-            n += std::get<0>(e) == event ? 1 : 0;
-        return n;
-    }
     std::mutex mMutex;
     std::condition_variable mChanged;
     std::vector<Event> mEvents;
 };
 
-struct FakeClock {
-    uint64_t nowMs = 0;
-    bool readable = true;
-    SC::MonotonicClock reader() {
-        return [this](timespec* ts) {
-            if (!readable)
-                return false;
-            ts->tv_sec = static_cast<time_t>(nowMs / 1000);
-            ts->tv_nsec = static_cast<long>((nowMs % 1000) * 1'000'000);
-            return true;
-        };
-    }
-};
-
 class ServiceControllerTest : public ::testing::Test {
 protected:
     void SetUp() override {
-        controller = new SC(clock.reader());
+        controller = new SC([this](timespec* ts) {
+            ts->tv_sec = static_cast<time_t>(nowMs / 1000);
+            ts->tv_nsec = static_cast<long>((nowMs % 1000) * 1'000'000);
+            return readable;
+        });
         controller->setListener(&listener);
     }
-    void TearDown() override { controller.clear(); }
-
-    FakeClock clock;
+    uint64_t nowMs = 0;
+    bool readable = true;
     RecordingListener listener;
     android::sp<SC> controller;
 };
 
-// --- signal status --------------------------------------------------------------
-
 enum class Do { Check, Frame, Audio };
-struct SignalStep {
-    uint64_t atMs;
-    Do action;
-    std::vector<Event> expected;
-    uint8_t statusAfter;
-};
 
 TEST_F(ServiceControllerTest, SignalGoesLateThenLostAndRecovers) {
-    const Event late{SC::SIGNAL_UPDATE_EVENT, 0, 1};
-    const Event lost{SC::SIGNAL_UPDATE_EVENT, 1, 2};
-    const Event again{SC::SIGNAL_UPDATE_EVENT, 2, 2};
-    const Event back{SC::SIGNAL_UPDATE_EVENT, 2, 0};
-    const SignalStep steps[] = {
-        {0, Do::Frame, {{SC::START_VIDEO_TASK_EVENT, 1920, 1080}}, 0},
+    const Event late{SC::SIGNAL_UPDATE_EVENT, 0, 1}, lost{SC::SIGNAL_UPDATE_EVENT, 1, 2},
+        again{SC::SIGNAL_UPDATE_EVENT, 2, 2};
+    const Event picture{SC::START_VIDEO_TASK_EVENT, 720, 480};
+    const struct {
+        uint64_t atMs;
+        Do action;
+        std::vector<Event> expected;
+        uint8_t statusAfter;
+    } steps[] = {
+        {0, Do::Frame, {picture}, 0},
         {2999, Do::Check, {}, 0},
         {3000, Do::Check, {late}, 1},
         // Late restarted the clock: 3 s later it is still only late...
-        {6000, Do::Check, {}, 1},
         {7999, Do::Check, {}, 1},
-        // ...and lost 5 s after being declared late.
+        // ...and lost 5 s after being declared late, then re-announced every 3 s.
         {8000, Do::Check, {lost}, 2},
         {10999, Do::Check, {}, 2},
         {11000, Do::Check, {again}, 2},
         {14000, Do::Check, {again}, 2},
         // The next picture brings the signal back and announces itself again.
-        {14100, Do::Frame, {back, {SC::START_VIDEO_TASK_EVENT, 720, 480}}, 0},
+        {14100, Do::Frame, {{SC::SIGNAL_UPDATE_EVENT, 2, 0}, picture}, 0},
         {14200, Do::Frame, {}, 0},
         {17199, Do::Check, {}, 0},
         // Audio readiness alone also keeps the signal good.
         {17200, Do::Audio, {}, 0},
-        {20199, Do::Check, {}, 0},
         {20200, Do::Check, {late}, 1},
         {20300, Do::Audio, {{SC::SIGNAL_UPDATE_EVENT, 1, 0}}, 0},
     };
-    unsigned int width = 1920, height = 1080;
-    for (const SignalStep& step : steps) {
+    for (const auto& step : steps) {
         SCOPED_TRACE(step.atMs);
-        clock.nowMs = step.atMs;
-        switch (step.action) {
-            case Do::Check:
-                controller->checkSignalStrength();
-                break;
-            case Do::Frame:
-                controller->onFrameRendered(static_cast<int>(width), static_cast<int>(height), 0);
-                width = 720;
-                height = 480;
-                break;
-            case Do::Audio:
-                controller->onAudioReady(100);
-                break;
-        }
+        nowMs = step.atMs;
+        if (step.action == Do::Check)
+            controller->checkSignalStrength();
+        else if (step.action == Do::Frame)
+            controller->onFrameRendered(720, 480, 0);
+        else
+            controller->onAudioReady(100);
         EXPECT_EQ(listener.take(), step.expected);
         EXPECT_EQ(controller->getSignalStatus(), step.statusAfter);
     }
@@ -145,160 +114,113 @@ TEST_F(ServiceControllerTest, SignalGoesLateThenLostAndRecovers) {
 
 TEST_F(ServiceControllerTest, ClockFailureOrNoListenerSkipsThePass) {
     test::TraceCapture trace;
-    clock.nowMs = 0;
     controller->onFrameRendered(1, 1, 0);
     listener.take();
-    clock.nowMs = 10'000;
-    clock.readable = false;
+    nowMs = 10'000;
+    readable = false;
     controller->checkSignalStrength();
     controller->onAudioReady(10);
-    EXPECT_EQ(trace.count(TRACE_ERROR, "checkSignalStrength: Error getting system time"), 1u);
-    EXPECT_EQ(trace.count(TRACE_ERROR, "updateSignalTimer: Error getting system time."), 1u);
-    clock.readable = true;
+    readable = true;
     controller->setListener(nullptr);
     controller->checkSignalStrength();
     EXPECT_EQ(trace.count(TRACE_ERROR, "checkSignalStrength: Error getting system time"), 2u);
-    EXPECT_EQ(controller->getSignalStatus(), 0);
+    EXPECT_EQ(trace.count(TRACE_ERROR, "updateSignalTimer: Error getting system time."), 1u);
+    // None of the skipped passes moved the last signal time or the status.
     controller->setListener(&listener);
-    // Neither failed pass moved the last signal time.
     controller->checkSignalStrength();
     EXPECT_EQ(listener.take(), (std::vector<Event>{{SC::SIGNAL_UPDATE_EVENT, 0, 1}}));
 }
 
-// --- buffering progress ---------------------------------------------------------
-
 TEST_F(ServiceControllerTest, BufferingProgressOnlyGrows) {
-    struct Case {
+    const struct {
         std::vector<long> waits;  // one buffering pass after each
-        std::vector<unsigned int> sent;
+        std::vector<Event> sent;
+    } cases[] = {
+        {{200}, {{SC::BUFFERING_EVENT, 25, 0}}},
+        {{40}, {{SC::BUFFERING_EVENT, 100, 0}}},
+        {{51}, {{SC::BUFFERING_EVENT, 98, 0}}},
+        {{0, -5}, {}},
+        {{166, 250}, {{SC::BUFFERING_EVENT, 30, 0}}},
+        {{5001, 4000, 1000, 1000, 10},
+         {{SC::BUFFERING_EVENT, 1, 0}, {SC::BUFFERING_EVENT, 5, 0}, {SC::BUFFERING_EVENT, 100, 0}}},
     };
-    const Case cases[] = {
-        {{200}, {25}},      {{40}, {100}},
-        {{50}, {100}},      {{51}, {98}},
-        {{0}, {}},          {{-5}, {}},
-        {{166, 250}, {30}}, {{5001, 4000, 1000, 1000, 10}, {1, 5, 100}},
-    };
-    for (const Case& c : cases) {
+    for (const auto& c : cases) {
         controller->startBuffering();  // resets progress and wait to render
         controller->stopBuffering();
         listener.take();
-        std::vector<unsigned int> sent;
         for (long wait : c.waits) {
             controller->onAudioReady(wait);
             controller->bufferingProcess();
-            for (const Event& e : listener.take()) {
-                EXPECT_EQ(std::get<0>(e), SC::BUFFERING_EVENT);
-                EXPECT_EQ(std::get<2>(e), 0u);
-                sent.push_back(std::get<1>(e));
-            }
         }
-        EXPECT_EQ(sent, c.sent) << "first wait " << c.waits.front();
+        EXPECT_EQ(listener.take(), c.sent) << "first wait " << c.waits.front();
     }
 }
-
-// --- frame rate -----------------------------------------------------------------
 
 TEST_F(ServiceControllerTest, FrameRateReadsMinusOneFromTheFifthEmptySecond) {
     EXPECT_EQ(controller->getFrameRate(), -1);  // before the first tick
-    struct Second {
-        int frames;
-        int rate;
-    };
-    const Second seconds[] = {
-        {30, 30}, {0, 0}, {0, 0}, {0, 0}, {0, 0}, {0, -1}, {0, -1}, {1, 1}, {0, 0}, {29, 29},
-    };
-    int index = 0;
-    for (const Second& s : seconds) {
-        for (int i = 0; i < s.frames; ++i)
+    const int frames[] = {30, 0, 0, 0, 0, 0, 0, 1, 0, 29};
+    const int rates[] = {30, 0, 0, 0, 0, -1, -1, 1, 0, 29};
+    for (size_t second = 0; second < std::size(frames); ++second) {
+        for (int i = 0; i < frames[second]; ++i)
             controller->onFrameRendered(16, 16, 0);
         controller->updateFrameRate();
-        EXPECT_EQ(controller->getFrameRate(), s.rate) << "second " << index;
-        ++index;
+        EXPECT_EQ(controller->getFrameRate(), rates[second]) << "second " << second;
     }
 }
 
-// --- the polling threads ----------------------------------------------------------
-
-std::vector<std::string> threadNames() {
-    std::vector<std::string> names;
-    DIR* dir = opendir("/proc/self/task");
-    if (dir == nullptr)
-        return names;
-    while (dirent* entry = readdir(dir)) {
-        if (entry->d_name[0] == '.')
-            continue;
-        std::ifstream comm(std::string("/proc/self/task/") + entry->d_name + "/comm");
-        std::string name;
-        std::getline(comm, name);
-        names.push_back(name);
-    }
-    closedir(dir);
-    return names;
-}
-
-size_t pollingThreads() {
+// Threads named "PollingThread" in this process, once the count stops changing
+// towards `expected` (libutils threads are detached: a joined one may linger in
+// /proc for a moment).
+size_t pollingThreads(size_t expected) {
     size_t n = 0;
-    for (const std::string& name : threadNames())
-        n += name == "PollingThread" ? 1 : 0;
+    for (int tries = 0; tries < 500; ++tries) {
+        n = 0;
+        if (DIR* dir = opendir("/proc/self/task")) {
+            while (dirent* entry = readdir(dir)) {
+                std::string name;
+                std::getline(
+                    std::ifstream(std::string("/proc/self/task/") + entry->d_name + "/comm"), name);
+                n += name == "PollingThread" ? 1 : 0;
+            }
+            closedir(dir);
+        }
+        if (n == expected)
+            break;
+        std::this_thread::sleep_for(std::chrono::milliseconds(10));
+    }
     return n;
 }
 
-// libutils threads are detached: a joined thread may linger in /proc for a moment
-// after its loop ended. Waits (generously) for the count to settle.
-size_t pollingThreadsSettlingAt(size_t expected) {
-    for (int i = 0; i < 500 && pollingThreads() != expected; ++i)
-        std::this_thread::sleep_for(std::chrono::milliseconds(10));
-    return pollingThreads();
-}
-
-// Real threads and the real clock: assertions are on what happens, with
-// generous deadlines, never on when.
-class ServiceControllerThreadsTest : public ::testing::Test {
-protected:
-    void SetUp() override {
-        controller = new SC();
-        controller->setListener(&listener);
-    }
+// Real threads and the real clock.
+TEST(ServiceControllerThreadsTest, CheckersRunAsPollingThreadsAndStopWithoutLeftovers) {
     RecordingListener listener;
-    android::sp<SC> controller;
-};
-
-TEST_F(ServiceControllerThreadsTest, EndOfContentComesOnceAndTheCheckerEnds) {
-    const size_t before = pollingThreads();
-    controller->startCheckEndOfContent();
-    for (int i = 0; i < 3; ++i)
-        controller->onFrameRendered(16, 16, 0);
-    ASSERT_TRUE(listener.waitFor(SC::EOC_EVENT, 1));
-    // The checker ended itself: no second event, and its thread is gone.
-    EXPECT_EQ(pollingThreadsSettlingAt(before), before);
-    EXPECT_EQ(listener.count(SC::EOC_EVENT), 1u);
-    controller->stopCheckEndOfContent();
-}
-
-TEST_F(ServiceControllerThreadsTest, CheckersRunAsPollingThreadsAndStopAllLeavesNone) {
-    const size_t before = pollingThreads();
+    android::sp<SC> controller = new SC();
+    controller->setListener(&listener);
+    const size_t before = pollingThreads(0);
     controller->startBuffering();
     controller->startCheckSignal();
+    controller->startCheckSignal();  // a restart must not leave the first one polling
     controller->startCheckFrameRate();
     controller->startCheckEndOfContent();
-    EXPECT_EQ(pollingThreadsSettlingAt(before + 4), before + 4);
-    controller->onAudioReady(40);
-    ASSERT_TRUE(listener.waitFor(SC::BUFFERING_EVENT, 1));
-    controller->stopAll();
-    EXPECT_EQ(pollingThreadsSettlingAt(before), before);
-    EXPECT_EQ(listener.count(SC::BUFFERING_END_EVENT), 1u);
-    // A second stop has no buffering check to end and sends nothing.
-    controller->stopAll();
-    EXPECT_EQ(listener.count(SC::BUFFERING_END_EVENT), 1u);
-}
+    EXPECT_EQ(pollingThreads(before + 4), before + 4);
 
-TEST_F(ServiceControllerThreadsTest, DestroyingWhileCheckingLeavesNoThread) {
-    const size_t before = pollingThreads();
+    // No frames: end of content comes once and that checker ends itself.
+    EXPECT_EQ(listener.count(SC::EOC_EVENT, 1), 1u);
+    EXPECT_EQ(pollingThreads(before + 3), before + 3);
+    controller->onAudioReady(40);
+    EXPECT_GE(listener.count(SC::BUFFERING_EVENT, 1), 1u);
+
+    controller->stopAll();
+    EXPECT_EQ(pollingThreads(before), before);
+    EXPECT_EQ(listener.count(SC::BUFFERING_END_EVENT), 1u);
+    controller->stopAll();  // no buffering check left to end: nothing sent
+    EXPECT_EQ(listener.count(SC::BUFFERING_END_EVENT), 1u);
+    EXPECT_EQ(listener.count(SC::EOC_EVENT), 1u);
+
     controller->startCheckSignal();
-    controller->startCheckSignal();  // a restart must not leave the first polling
     controller->startCheckFrameRate();
-    controller.clear();
-    EXPECT_EQ(pollingThreadsSettlingAt(before), before);
+    controller.clear();  // destruction stops what still runs
+    EXPECT_EQ(pollingThreads(before), before);
 }
 
 }  // namespace

@@ -91,6 +91,7 @@ private:
     };
 
     Connection(int fd, const sp<IBinder>& root);
+    void onLastStrongRef(const void* id) override;
 
     void ioLoop();
     bool readFrames();

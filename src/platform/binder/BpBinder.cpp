@@ -94,6 +94,8 @@ void BpBinder::sendObituary() {
         sp<DeathRecipient> recipient = obituary.recipient.promote();
         if (recipient != nullptr)
             recipient->binderDied(who);
+        recipient.clear();
+        refsync::published();
     }
 }
 

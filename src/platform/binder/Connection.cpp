@@ -105,6 +105,10 @@ Connection::~Connection() {
         close(mWakeFd);
 }
 
+void Connection::onLastStrongRef(const void* /*id*/) {
+    refsync::observed();
+}
+
 sp<Connection> Connection::create(int fd, const sp<IBinder>& root) {
     if (fd < 0)
         return nullptr;
@@ -148,6 +152,7 @@ status_t Connection::start() {
     mThread = std::thread([self] {
         pthread_setname_np(pthread_self(), "BinderIO");
         self->ioLoop();
+        refsync::published();
     });
     mThreadId = mThread.get_id();
     ProcessState::self()->addConnection(self);
@@ -645,6 +650,7 @@ bool Connection::readFrames() {
             return false;
         }
         closeAll(fds);
+        refsync::published();
     }
     return true;
 }
@@ -713,6 +719,8 @@ void Connection::die() {
                 proxy->sendObituary();
         });
     }
+    proxies.clear();
+    refsync::published();
     ProcessState::self()->removeConnection(this);
 }
 

@@ -25,6 +25,7 @@
 #include <condition_variable>
 #include <cstdint>
 #include <cstdio>
+#include <functional>
 #include <memory>
 #include <mutex>
 #include <string>
@@ -53,6 +54,14 @@ public:
     Demux& operator=(const Demux&) = delete;
 
     int startFiltering(uint16_t pid, int filterKind);
+    // One filter on several PIDs: a single queue that keeps their packets in the
+    // order of the multiplex (a recording needs that order, not one order per PID).
+    // `queuePackets` 0 takes the source's queue size. Returns a handle, or a negative
+    // value as startFiltering does; stopFiltering ends it.
+    int startTap(const std::vector<uint16_t>& pids, size_t queuePackets);
+    // Changes the PIDs a filter takes; what it queued stays. Returns 0, or a negative
+    // value for an unknown handle or an invalid PID.
+    int setFilterPids(int handle, const std::vector<uint16_t>& pids);
     int stopFiltering(int handle);
     int select(DemuxHandleSet* set, int timeoutMs);
     int readData(int handle, uint8_t* buffer, int size);
@@ -77,13 +86,33 @@ public:
 
     void dump(FILE* stream, int indent);
 
+    // Where the next source comes from instead of the property: called at each open
+    // (under the control lock: it must not call back into the demux); a null result
+    // falls back to the property. An empty provider removes it. Any thread.
+    using SourceProvider = std::function<std::unique_ptr<DemuxSource>()>;
+    void setSourceProvider(SourceProvider provider);
+
+    // Stops the source thread, lets `change` act on the open source while nothing
+    // reads it, drops the packets queued in every filter and held by the pacing, and
+    // reads on with a fresh time line (a clip moved to another position). Filters
+    // stay open. Returns 0, or -ENODEV when no source is open.
+    int restartSource(const std::function<void(DemuxSource&)>& change);
+
+    // Holds the open source (no packet is handed out and its pacing stands still)
+    // or lets it go on. Holding returns once the source thread has stopped handing
+    // out packets (0), or -ETIMEDOUT after a second when it is stuck waiting for a
+    // full filter. A newly opened source starts unheld.
+    int setPaused(bool paused);
+
 private:
     class SourceThread;
     friend class SourceThread;
 
     struct Filter {
-        Filter(uint16_t pid, int kind, size_t capacity) : pid(pid), kind(kind), queue(capacity) {}
-        uint16_t pid;
+        Filter(std::vector<uint16_t> pids, int kind, size_t capacity)
+            : pid(pids.front()), pids(std::move(pids)), kind(kind), queue(capacity) {}
+        uint16_t pid;                // the first PID, for diagnostics
+        std::vector<uint16_t> pids;  // every PID this filter takes
         int kind;
         PacketQueue queue;
         bool overflowLogged = false;
@@ -92,6 +121,11 @@ private:
 
     int openSource_c();
     void closeSource_c();
+    int startThread_c();
+    void stopThread_c();
+    int addFilter(std::vector<uint16_t> pids, int kind, size_t queuePackets);
+    // Source thread: it holds (true) or hands out packets again (false).
+    void noteHolding(bool holding);
     int allocateHandle_l() const;
     // Source thread: hands `count` aligned packets to the filters.
     void deliver(const uint8_t* packets, size_t count);
@@ -116,6 +150,10 @@ private:
     bool mStopping = false;                                          // mLock
     bool mEnded = false;                                             // mLock
     bool mReaderArrived = false;                                     // mLock
+    bool mHolding = false;  // mLock: the source thread observed mPaused
+    std::condition_variable mHoldingChanged;
+    std::atomic<bool> mPaused{false};
+    SourceProvider mProvider;  // mControlLock
 
     std::atomic<uint64_t> mPackets{0};
     std::atomic<uint64_t> mSyncLosses{0};

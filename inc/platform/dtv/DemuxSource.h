@@ -52,6 +52,10 @@ public:
     // Ends a read() that is waiting; the next read() waits normally again.
     void interrupt();
 
+    // Source thread: every packet of the stream has been handed to the filters
+    // (`packets` of them), or reading failed (`failed`). The source reads no more.
+    virtual void onEnded(uint64_t packets, bool failed);
+
 protected:
     // Waits until `fd` is readable, the time-out passes or interrupt() is called.
     // Returns 1 readable, 0 time-out or interrupted, negative errno on error (logged).

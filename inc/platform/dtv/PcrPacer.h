@@ -57,6 +57,9 @@ public:
     size_t takeDue(int64_t nowNs, std::vector<uint8_t>& out);
     // Forgets the held packets and the time line.
     void reset();
+    // Moves the whole time line `ns` later: the held packets and the anchor keep
+    // their spacing, so a pause of the feed costs neither a burst nor a gap.
+    void shift(int64_t ns);
 
     size_t heldPackets() const { return mDue.size() - mFirst; }
     // -1 until a PCR has been seen.

@@ -6,10 +6,11 @@
 // Events come back on the recording service's own thread through the event
 // function given at creation, with the user data given there.
 //
-// Implemented so far: RecPlayerBinder_NotifyAudioPTS only, which records the time
-// where the recording service reads it (RecPlayerBinder_GetLastNotifiedAudioPTS).
-// The other operations are declared for their callers and have no definition yet:
-// a call to one of them does not link.
+// On Linux the recording service runs inside the process (docs/recording.md): a
+// recording writes the live packets of its PIDs from the demux to a TS file in the
+// folder named by the property tavoplayer.recordings.dir, with an SQLite catalog of
+// the recordings beside the files; a recorded clip is fed back into the demux at
+// the pace of its PCR.
 #pragma once
 
 #include <cstdint>
@@ -18,6 +19,21 @@ namespace TavoPlayer {
 
 // Event function of a recording or a clip player: (event, user data).
 using RecPlayerEventCallback = void (*)(int event, void* userData);
+
+// Events of a recording, given to the event function of CreateTSRecorder. Each
+// one ends the writing; the file keeps what was written, whole packets only.
+constexpr int kRecEventDiskFull = 0;           // no space left for the file
+constexpr int kRecEventFileError = 1;          // the file or folder cannot be written
+constexpr int kRecEventDemuxLost = 2;          // the demux stopped delivering
+constexpr int kRecEventTooManyRecordings = 3;  // a recording is already running
+// Events of a clip player, given to the event function of IsTSPlayerActive.
+constexpr int kClipEventReadError = 4;  // the clip file cannot be read any more
+constexpr int kClipEventNotTs = 5;      // the clip holds no transport stream
+constexpr int kClipEventEnd = 6;        // every packet of the clip has been fed
+
+// The property naming the recordings folder; unset: $XDG_DATA_HOME/tavoplayer/
+// recordings, or ~/.local/share/tavoplayer/recordings without XDG_DATA_HOME.
+constexpr const char* kRecordingsDirProperty = "tavoplayer.recordings.dir";
 
 // The 96-byte record that describes a recording (little-endian, natural alignment).
 // The service allocates it with the C allocator; the caller frees it, and the two

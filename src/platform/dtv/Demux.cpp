@@ -3,6 +3,7 @@
 #include <pthread.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <chrono>
 #include <cstring>
@@ -69,6 +70,22 @@ private:
     bool threadLoop() override {
         if (exitPending())
             return false;
+        if (mDemux.mPaused.load(std::memory_order_acquire)) {
+            const int64_t now = monotonicNs();
+            if (!mHeld) {
+                mHeld = true;
+                mHeldSinceNs = now;
+                mDemux.noteHolding(true);
+            }
+            sleepUntil(now + kMaxSleepNs);
+            return true;
+        }
+        if (mHeld) {
+            // The packets held for pacing keep their spacing, moved past the pause.
+            mHeld = false;
+            mPacer.shift(monotonicNs() - mHeldSinceNs);
+            mDemux.noteHolding(false);
+        }
         if (mSource.paced() && mPacer.nextKnown()) {
             const int64_t now = monotonicNs();
             const int64_t due = mPacer.nextDueNs();
@@ -112,6 +129,7 @@ private:
             return true;
         }
         mFinished = true;  // the paced packets still held go out first
+        mFailed = n == DemuxSource::kFailed;
         return true;
     }
 
@@ -158,6 +176,7 @@ private:
                       mSource.describe().c_str(), static_cast<unsigned long long>(packets));
         }
         mDemux.noteEnded();
+        mSource.onEnded(packets, mFailed);
     }
 
     void sleepUntil(int64_t deadlineNs) {
@@ -174,6 +193,9 @@ private:
     PacketAligner mAligner;
     PcrPacer mPacer;
     bool mFinished = false;
+    bool mFailed = false;
+    bool mHeld = false;
+    int64_t mHeldSinceNs = 0;
     uint64_t mReportedSkipped = 0;
     int64_t mLastSyncLogNs = 0;
     std::mutex mSleepLock;
@@ -195,6 +217,24 @@ Demux::~Demux() {
 }
 
 int Demux::openSource_c() {
+    if (mProvider) {
+        std::unique_ptr<DemuxSource> provided = mProvider();
+        if (provided) {
+            const int rc = provided->open();
+            if (rc < 0) {
+                TAVO_LOGE("%s: cannot open demux source %s\n", "DemuxBinder_StartFiltering",
+                          provided->describe().c_str());
+                return rc;
+            }
+            {
+                std::lock_guard<std::mutex> lock(mLock);
+                mConfig = DemuxSourceConfig();
+                mConfig.kind = DemuxSourceConfig::Kind::kFile;
+            }
+            mSource = std::move(provided);
+            return startThread_c();
+        }
+    }
     const std::string text = propertyGetString(kSourceProperty, "");
     if (text.empty()) {
         TAVO_LOGE("%s: no demux source: set %s (file:PATH, udp://GROUP:PORT, stdin or dvb:N)\n",
@@ -218,27 +258,37 @@ int Demux::openSource_c() {
     {
         std::lock_guard<std::mutex> lock(mLock);
         mConfig = config;
+    }
+    mSource = std::move(source);
+    return startThread_c();
+}
+
+int Demux::startThread_c() {
+    {
+        std::lock_guard<std::mutex> lock(mLock);
         mStopping = false;
         mEnded = false;
         mReaderArrived = false;
+        mHolding = false;
     }
+    mPaused = false;
     mPackets = 0;
     mSyncLosses = 0;
     mBytesSkipped = 0;
     mDiscontinuities = 0;
-    android::sp<SourceThread> thread = new SourceThread(*this, *source);
+    android::sp<SourceThread> thread = new SourceThread(*this, *mSource);
     if (thread->run("DemuxSource") != android::OK) {
         TAVO_LOGE("%s: cannot start the demux source thread\n", "DemuxBinder_StartFiltering");
+        mSource.reset();
         return -EAGAIN;
     }
-    mSource = std::move(source);
     mThread = thread;
     TAVO_LOGI("%s: demux source %s opened\n", "DemuxBinder_StartFiltering",
               mSource->describe().c_str());
     return 0;
 }
 
-void Demux::closeSource_c() {
+void Demux::stopThread_c() {
     {
         std::lock_guard<std::mutex> lock(mLock);
         mStopping = true;
@@ -256,9 +306,64 @@ void Demux::closeSource_c() {
         usleep(100);
     mThread->isRunning();  // takes the thread's lock: orders its last unlock before us
     mThread.clear();
+}
+
+void Demux::closeSource_c() {
+    stopThread_c();
     TAVO_LOGI("%s: demux source %s closed\n", "DemuxBinder_StopFiltering",
               mSource->describe().c_str());
     mSource.reset();
+}
+
+void Demux::setSourceProvider(SourceProvider provider) {
+    std::lock_guard<std::mutex> control(mControlLock);
+    mProvider = std::move(provider);
+}
+
+int Demux::restartSource(const std::function<void(DemuxSource&)>& change) {
+    std::lock_guard<std::mutex> control(mControlLock);
+    if (!mSource || !mThread)
+        return -ENODEV;
+    stopThread_c();
+    if (change)
+        change(*mSource);
+    bool readerArrived = false;
+    {
+        std::lock_guard<std::mutex> lock(mLock);
+        for (auto& filter : mFilters) {
+            if (filter)
+                filter->queue.clear();
+        }
+        readerArrived = mReaderArrived;
+    }
+    const int rc = startThread_c();
+    if (rc == 0 && readerArrived) {
+        // The reader is already selecting: the new thread need not wait for it.
+        std::lock_guard<std::mutex> lock(mLock);
+        mReaderArrived = true;
+        mFlowing.notify_all();
+    }
+    return rc;
+}
+
+int Demux::setPaused(bool paused) {
+    std::lock_guard<std::mutex> control(mControlLock);
+    mPaused.store(paused, std::memory_order_release);
+    if (!mThread)
+        return 0;
+    mThread->wake();
+    if (!paused)
+        return 0;
+    std::unique_lock<std::mutex> lock(mLock);
+    const bool held = mHoldingChanged.wait_for(lock, std::chrono::seconds(1),
+                                               [this] { return mHolding || mEnded || mStopping; });
+    return held ? 0 : -ETIMEDOUT;
+}
+
+void Demux::noteHolding(bool holding) {
+    std::lock_guard<std::mutex> lock(mLock);
+    mHolding = holding;
+    mHoldingChanged.notify_all();
 }
 
 int Demux::allocateHandle_l() const {
@@ -278,43 +383,120 @@ int Demux::startFiltering(uint16_t pid, int filterKind) {
                   filterKind);
         return -EINVAL;
     }
+    const int handle = addFilter({pid}, filterKind, 0);
+    if (handle >= 0) {
+        TAVO_LOGD("%s: PID %d kind %d -> handle %d\n", "DemuxBinder_StartFiltering", pid,
+                  filterKind, handle);
+    }
+    return handle;
+}
+
+int Demux::startTap(const std::vector<uint16_t>& pids, size_t queuePackets) {
+    std::vector<uint16_t> unique;
+    for (uint16_t pid : pids) {
+        if (pid > kMaxPid) {
+            TAVO_LOGE("%s: invalid PID %d\n", "Demux::startTap", pid);
+            return -EINVAL;
+        }
+        if (std::find(unique.begin(), unique.end(), pid) == unique.end())
+            unique.push_back(pid);
+    }
+    if (unique.empty())
+        return -EINVAL;
+    return addFilter(std::move(unique), kDemuxFilterPes, queuePackets);
+}
+
+int Demux::setFilterPids(int handle, const std::vector<uint16_t>& pids) {
+    std::vector<uint16_t> unique;
+    for (uint16_t pid : pids) {
+        if (pid > kMaxPid)
+            return -EINVAL;
+        if (std::find(unique.begin(), unique.end(), pid) == unique.end())
+            unique.push_back(pid);
+    }
+    if (unique.empty())
+        return -EINVAL;
+    std::lock_guard<std::mutex> control(mControlLock);
+    std::vector<uint16_t> old;
+    {
+        std::lock_guard<std::mutex> lock(mLock);
+        if (handle < 0 || handle >= kDemuxMaxHandles || !mFilters[handle])
+            return -EBADF;
+        old = mFilters[handle]->pids;
+    }
+    auto has = [](const std::vector<uint16_t>& list, uint16_t pid) {
+        return std::find(list.begin(), list.end(), pid) != list.end();
+    };
+    for (uint16_t pid : unique) {
+        if (!has(old, pid) && mSource)
+            mSource->addPid(pid);
+    }
+    {
+        std::lock_guard<std::mutex> lock(mLock);
+        Filter* filter = mFilters[handle].get();
+        for (uint16_t pid : old) {
+            if (!has(unique, pid))
+                std::erase(mPidFilters[pid], filter);
+        }
+        for (uint16_t pid : unique) {
+            if (!has(old, pid))
+                mPidFilters[pid].push_back(filter);
+        }
+        filter->pids = unique;
+        filter->pid = unique.front();
+    }
+    for (uint16_t pid : old) {
+        if (!has(unique, pid) && mSource)
+            mSource->removePid(pid);
+    }
+    return 0;
+}
+
+int Demux::addFilter(std::vector<uint16_t> pids, int kind, size_t queuePackets) {
     std::lock_guard<std::mutex> control(mControlLock);
     if (!mSource) {
         const int rc = openSource_c();
         if (rc < 0)
             return rc;
     }
-    const int rc = mSource->addPid(pid);
+    int rc = 0;
+    size_t added = 0;
+    for (; added < pids.size() && rc >= 0; ++added)
+        rc = mSource->addPid(pids[added]);
+    if (rc < 0)
+        --added;  // the PID that failed was not added
     int handle = -1;
     size_t filters = 0;
     if (rc >= 0) {
         std::lock_guard<std::mutex> lock(mLock);
         handle = allocateHandle_l();
         if (handle >= 0) {
-            mFilters[handle] = std::make_unique<Filter>(pid, filterKind, mConfig.queuePackets);
-            mPidFilters[pid].push_back(mFilters[handle].get());
+            const size_t capacity = queuePackets > 0 ? queuePackets : mConfig.queuePackets;
+            mFilters[handle] = std::make_unique<Filter>(pids, kind, capacity);
+            for (uint16_t pid : pids)
+                mPidFilters[pid].push_back(mFilters[handle].get());
             ++mFilterCount;
             mNextHandle = (handle + 1) % kDemuxMaxHandles;
         }
         filters = mFilterCount;
     }
     if (handle < 0) {
-        if (rc >= 0) {
-            TAVO_LOGE("%s: no free demux handle for PID %d\n", "DemuxBinder_StartFiltering", pid);
-            mSource->removePid(pid);
-        }
+        if (rc >= 0)
+            TAVO_LOGE("%s: no free demux handle for PID %d\n", "DemuxBinder_StartFiltering",
+                      pids.front());
+        for (size_t i = 0; i < added; ++i)
+            mSource->removePid(pids[i]);
         if (filters == 0)
             closeSource_c();
         return rc < 0 ? rc : -EMFILE;
     }
-    TAVO_LOGD("%s: PID %d kind %d -> handle %d\n", "DemuxBinder_StartFiltering", pid, filterKind,
-              handle);
     return handle;
 }
 
 int Demux::stopFiltering(int handle) {
     std::lock_guard<std::mutex> control(mControlLock);
     uint16_t pid = 0;
+    std::vector<uint16_t> pids;
     uint64_t dropped = 0;
     size_t remaining = 0;
     {
@@ -325,9 +507,10 @@ int Demux::stopFiltering(int handle) {
         }
         Filter* filter = mFilters[handle].get();
         pid = filter->pid;
+        pids = filter->pids;
         dropped = filter->queue.dropped();
-        auto& list = mPidFilters[pid];
-        std::erase(list, filter);
+        for (uint16_t p : pids)
+            std::erase(mPidFilters[p], filter);
         mFilters[handle].reset();
         remaining = --mFilterCount;
         mRoomReady.notify_all();
@@ -338,7 +521,8 @@ int Demux::stopFiltering(int handle) {
                   static_cast<unsigned long long>(dropped));
     }
     if (mSource) {
-        mSource->removePid(pid);
+        for (uint16_t p : pids)
+            mSource->removePid(p);
         if (remaining == 0)
             closeSource_c();
     }

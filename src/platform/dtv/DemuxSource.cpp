@@ -44,6 +44,8 @@ int DemuxSource::addPid(uint16_t) {
 
 void DemuxSource::removePid(uint16_t) {}
 
+void DemuxSource::onEnded(uint64_t, bool) {}
+
 void DemuxSource::interrupt() {
     const uint64_t one = 1;
     if (mWakeFd >= 0) {

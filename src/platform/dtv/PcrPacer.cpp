@@ -145,6 +145,17 @@ size_t PcrPacer::takeDue(int64_t nowNs, std::vector<uint8_t>& out) {
     return taken;
 }
 
+void PcrPacer::shift(int64_t ns) {
+    for (size_t i = mFirst; i < mDue.size(); ++i) {
+        if (mDue[i] != kUnknown)
+            mDue[i] += ns;
+    }
+    if (mHaveRef)
+        mRefDueNs += ns;
+    if (mLastDueNs != INT64_MIN)
+        mLastDueNs += ns;
+}
+
 void PcrPacer::reset() {
     *this = PcrPacer();
 }

@@ -1,0 +1,397 @@
+#include <fcntl.h>
+#include <signal.h>
+#include <spawn.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <condition_variable>
+#include <cstdlib>
+#include <filesystem>
+#include <mutex>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "platform/dtv/Demux.h"
+#include "platform/dtv/DemuxBinder.h"
+#include "platform/dtv/PcrPacer.h"
+#include "platform/dtv/RecPlayerBinder.h"
+#include "platform/dtv/RecPlayerService.h"
+#include "platform/dtv/RecordingCatalog.h"
+#include "support/TraceCapture.h"
+#include "support/TsTestUtil.h"
+
+extern char** environ;
+
+namespace TavoPlayer {
+namespace {
+
+using namespace std::chrono_literals;
+using namespace test;
+namespace fs = std::filesystem;
+
+constexpr uint16_t kVideo = 0x111;
+constexpr uint16_t kAudio = 0x112;
+constexpr uint16_t kCaptions = 0x130;
+
+// A tsgen stream of `seconds`, made once per test program.
+const std::string& tsgenStream(int seconds) {
+    static std::map<int, std::string> made;
+    auto it = made.find(seconds);
+    if (it != made.end())
+        return it->second;
+    const std::string path = (fs::temp_directory_path() / ("tavo_rec_" + std::to_string(getpid()) +
+                                                           "_" + std::to_string(seconds) + ".ts"))
+                                 .string();
+    bool ok = false;
+    runCommand(std::string(TAVO_TSGEN_PATH) + " -o " + path + " -d " + std::to_string(seconds) +
+                   " --size 320x240 --caption 2:Hello --caption 12:World 2>&1",
+               &ok);
+    EXPECT_TRUE(ok) << "tsgen failed";
+    static struct Cleanup {
+        ~Cleanup() {
+            for (auto& [s, p] : made)
+                unlink(p.c_str());
+        }
+    } cleanup;
+    return made[seconds] = path;
+}
+
+class ScopedEnv {
+public:
+    ScopedEnv(std::string name, const std::string& value) : mName(std::move(name)) {
+        const char* old = getenv(mName.c_str());
+        mHad = old != nullptr;
+        if (mHad)
+            mOld = old;
+        setenv(mName.c_str(), value.c_str(), 1);
+    }
+    ~ScopedEnv() {
+        if (mHad)
+            setenv(mName.c_str(), mOld.c_str(), 1);
+        else
+            unsetenv(mName.c_str());
+    }
+
+private:
+    std::string mName, mOld;
+    bool mHad = false;
+};
+
+// Events from the service, as the recorder and the clip player receive them.
+struct EventLog {
+    static void callback(int event, void* userData) {
+        auto* self = static_cast<EventLog*>(userData);
+        std::lock_guard<std::mutex> lock(self->lock);
+        self->events.push_back(event);
+        self->changed.notify_all();
+    }
+    bool waitFor(int event, std::chrono::milliseconds deadline = kDeadline) {
+        std::unique_lock<std::mutex> lock(this->lock);
+        return changed.wait_for(lock, deadline, [&] {
+            return std::find(events.begin(), events.end(), event) != events.end();
+        });
+    }
+    std::vector<int> all() {
+        std::lock_guard<std::mutex> l(lock);
+        return events;
+    }
+    std::mutex lock;
+    std::condition_variable changed;
+    std::vector<int> events;
+};
+
+std::vector<TsPacket> packetsOf(const std::vector<uint8_t>& ts, uint16_t pid) {
+    return toPackets(bytesOfPid(ts, pid));
+}
+
+std::string probe(const std::string& path) {
+    bool ok = false;
+    const std::string out = runCommand(
+        "ffprobe -v error -show_entries format=duration:stream=codec_name -of compact=nk=1 " +
+            path + " 2>&1",
+        &ok);
+    return ok ? out : "ffprobe failed: " + out;
+}
+
+double probedDuration(const std::string& path) {
+    bool ok = false;
+    const std::string out = runCommand(
+        "ffprobe -v error -show_entries format=duration -of default=nw=1:nk=1 " + path, &ok);
+    return ok ? std::atof(out.c_str()) : -1.0;
+}
+
+void freeDetails(RecDetails* d) {
+    if (d == nullptr)
+        return;
+    free(d->stationName);
+    free(d->prgName);
+    free(d);
+}
+
+// Every test has a recordings folder of its own and leaves the service idle.
+class RecordingServiceTest : public ::testing::Test {
+protected:
+    void SetUp() override {
+        char name[] = "/tmp/tavo_recordings_XXXXXX";
+        ASSERT_NE(mkdtemp(name), nullptr);
+        dir = name;
+        recordingsDir =
+            std::make_unique<ScopedEnv>("TAVOPLAYER_PROP_tavoplayer_recordings_dir", dir);
+    }
+    void TearDown() override {
+        RecPlayerBinder_DeleteTSRecorder();
+        EXPECT_TRUE(RecPlayerService::instance().events().drain(kDeadline));
+        EXPECT_FALSE(Demux::instance().sourceStats().open);
+        fs::remove_all(dir);
+    }
+    // Creates and starts a recording of the tsgen PIDs; returns its number.
+    int record(EventLog& events, const std::string& station = "TV Tavo",
+               const std::string& programme = "News") {
+        EXPECT_EQ(
+            RecPlayerBinder_CreateTSRecorder(0, 2, kVideo, kAudio, 1, EventLog::callback, &events),
+            1);
+        EXPECT_EQ(RecPlayerBinder_AnyMoreRecordings(), 1);
+        EXPECT_EQ(RecPlayerBinder_StartTSRecorder(), 1);
+        RecDetails* d = RecPlayerBinder_GetCurrTSRecDetails();
+        EXPECT_NE(d, nullptr);
+        if (d == nullptr)
+            return 0;
+        // As the recorder fills it in.
+        RecDetails copy = *d;
+        copy.stationName = strdup(station.c_str());
+        copy.stationNameLength = static_cast<uint32_t>(station.size());
+        copy.prgName = strdup(programme.c_str());
+        copy.prgNameLength = static_cast<uint32_t>(programme.size());
+        copy.recMode = 0;
+        copy.recLocation = 2;
+        copy.bCanPlay = 1;
+        EXPECT_EQ(RecPlayerBinder_SetCurrTSRecDetails(&copy), 1);
+        free(copy.stationName);
+        free(copy.prgName);
+        const int number = d->fileNumName;
+        freeDetails(d);
+        return number;
+    }
+    RecordingCatalog::Entry row(int number) {
+        RecordingCatalog catalog(dir);
+        EXPECT_EQ(catalog.open(), RecordingCatalog::Status::kOk);
+        auto e = catalog.get(number);
+        EXPECT_TRUE(e.has_value()) << "no row " << number;
+        return e.value_or(RecordingCatalog::Entry());
+    }
+    std::string dir;
+    std::unique_ptr<ScopedEnv> recordingsDir;
+};
+
+TEST_F(RecordingServiceTest, RecordsTheLivePacketsOfItsPidsUnchangedInOrderInAPlayableFile) {
+    const std::string& source = tsgenStream(20);
+    ScopedDemuxSource demux("file:" + source + "?pace=none");
+    EventLog events;
+    const int number = record(events);
+    ASSERT_GT(number, 0);
+    // The whole file flows; its end is the demux ending under the recording.
+    ASSERT_TRUE(events.waitFor(kRecEventDemuxLost));
+    EXPECT_EQ(RecPlayerBinder_StopTSRecorder(), 1);
+    EXPECT_EQ(RecPlayerBinder_DeleteTSRecorder(), 1);
+
+    const std::string path = dir + "/" + std::to_string(number) + ".ts";
+    const std::vector<uint8_t> live = fileBytes(source);
+    const std::vector<uint8_t> recorded = fileBytes(path);
+    ASSERT_EQ(recorded.size() % 188, 0u);
+    // PID by PID, the recording holds the live packets from the moment it started
+    // to the end, unchanged; the PAT and PMT are the recording's own.
+    for (uint16_t pid : {kVideo, kAudio, kCaptions}) {
+        const auto want = summary(packetsOf(live, pid));
+        const auto got = summary(packetsOf(recorded, pid));
+        ASSERT_FALSE(got.empty()) << "PID " << pid;
+        const auto start = std::find(want.begin(), want.end(), got.front());
+        ASSERT_NE(start, want.end()) << "PID " << pid;
+        // Only what passed before the programme's tables were read is missing.
+        EXPECT_LE(start - want.begin(), std::max<long>(2, static_cast<long>(want.size() / 10)))
+            << "PID " << pid;
+        EXPECT_EQ(got, std::vector<std::string>(start, want.end())) << "PID " << pid;
+    }
+    for (const TsPacket& p : toPackets(recorded)) {
+        const uint16_t pid = pidOf(p.data());
+        ASSERT_TRUE(pid == 0 || pid == 0x1000 || pid == kVideo || pid == kAudio || pid == kCaptions)
+            << "PID " << pid;
+    }
+    EXPECT_EQ(pidOf(recorded.data()), 0) << "the file starts with its PAT";
+
+    const std::string streams = probe(path);
+    EXPECT_NE(streams.find("h264"), std::string::npos) << streams;
+    EXPECT_NE(streams.find("aac_latm"), std::string::npos) << streams;
+    EXPECT_NE(streams.find("arib_caption"), std::string::npos) << streams;
+    EXPECT_NEAR(probedDuration(path), probedDuration(source), 1.0);
+
+    const RecordingCatalog::Entry e = row(number);
+    EXPECT_EQ(e.stationName, "TV Tavo");
+    EXPECT_EQ(e.prgName, "News");
+    EXPECT_EQ(e.recLocation, 2);
+    EXPECT_EQ(e.bCanPlay, 1u);
+    EXPECT_EQ(e.videoPid, kVideo);
+    EXPECT_EQ(e.audioPid, kAudio);
+    EXPECT_EQ(e.captionPid, kCaptions);
+    EXPECT_EQ(e.isLATM, 1);
+    EXPECT_EQ(e.state, RecordingCatalog::kComplete);
+    EXPECT_EQ(e.sizeBytes, recorded.size());
+    EXPECT_EQ(e.sizeOfRec, recorded.size() / 1024);
+    EXPECT_NEAR(e.playbackDuration, 20000, 1000);
+    EXPECT_EQ(e.durationOfRec, e.playbackDuration / 1000);
+    EXPECT_GT(e.recEndTime, 0u);
+    EXPECT_GE(e.recEndTime, e.recStartTime);
+    RecordingCatalog catalog(dir);
+    ASSERT_EQ(catalog.open(), RecordingCatalog::Status::kOk);
+    const auto index = catalog.loadIndex(number);
+    ASSERT_GT(index.size(), 100u);
+    for (const IndexPoint& p : index) {
+        // Every point leads to the tables or to a PCR of the video PID.
+        const uint8_t* packet = &recorded[p.offset];
+        uint64_t pcr = 0;
+        bool discontinuity = false;
+        ASSERT_TRUE(pidOf(packet) == 0 || PcrPacer::readPcr(packet, &pcr, &discontinuity))
+            << p.offset;
+    }
+}
+
+TEST_F(RecordingServiceTest, CancelLeavesNoFileAndNoRow) {
+    ScopedDemuxSource demux("file:" + tsgenStream(20) + "?pace=pcr");
+    EventLog events;
+    const int number = record(events);
+    ASSERT_GT(number, 0);
+    const std::string path = dir + "/" + std::to_string(number) + ".ts";
+    ASSERT_TRUE(waitUntil([&] { return fs::exists(path) && fs::file_size(path) > 0; }));
+    EXPECT_EQ(RecPlayerBinder_CancelTSRecorder(), 1);
+    EXPECT_EQ(RecPlayerBinder_DeleteTSRecorder(), 1);
+    EXPECT_FALSE(fs::exists(path));
+    RecordingCatalog catalog(dir);
+    ASSERT_EQ(catalog.open(), RecordingCatalog::Status::kOk);
+    EXPECT_FALSE(catalog.get(number).has_value());
+    EXPECT_TRUE(catalog.loadIndex(number).empty());
+}
+
+TEST_F(RecordingServiceTest, ASecondRecordingIsRefusedAndTheFirstGoesOn) {
+    ScopedDemuxSource demux("file:" + tsgenStream(20) + "?pace=pcr");
+    EventLog first, second;
+    const int number = record(first);
+    ASSERT_GT(number, 0);
+    EXPECT_EQ(
+        RecPlayerBinder_CreateTSRecorder(0, 0, kVideo, kAudio, 1, EventLog::callback, &second), 0);
+    EXPECT_EQ(RecPlayerBinder_AnyMoreRecordings(), 0);
+    EXPECT_EQ(RecPlayerBinder_StartTSRecorder(), 0);
+    EXPECT_EQ(RecPlayerBinder_GetCurrTSRecDetails(), nullptr);
+    EXPECT_TRUE(second.waitFor(kRecEventTooManyRecordings));
+    // The refused recorder's stop reaches nothing; the first recording goes on.
+    EXPECT_EQ(RecPlayerBinder_StopTSRecorder(), 0);
+    const std::string path = dir + "/" + std::to_string(number) + ".ts";
+    const auto size = fs::file_size(path);
+    EXPECT_TRUE(waitUntil([&] { return fs::file_size(path) > size; }));
+    EXPECT_EQ(RecPlayerBinder_StopTSRecorder(), 1);
+    EXPECT_EQ(row(number).state, RecordingCatalog::kComplete);
+    EXPECT_TRUE(first.all().empty() || first.all() == std::vector<int>{kRecEventDemuxLost});
+}
+
+// A recording in a child process of its own, started from a demux source.
+class ChildRecording {
+public:
+    ChildRecording(const std::string& mode, const std::string& dir, const std::string& source) {
+        int fds[2];
+        EXPECT_EQ(pipe(fds), 0);
+        posix_spawn_file_actions_t actions;
+        posix_spawn_file_actions_init(&actions);
+        posix_spawn_file_actions_adddup2(&actions, fds[1], STDOUT_FILENO);
+        posix_spawn_file_actions_addclose(&actions, fds[0]);
+        std::vector<std::string> env;
+        for (char** e = environ; *e != nullptr; ++e) {
+            if (strncmp(*e, "TAVOPLAYER_PROP_tavoplayer_", 27) != 0)
+                env.emplace_back(*e);
+        }
+        env.push_back("TAVOPLAYER_PROP_tavoplayer_recordings_dir=" + dir);
+        env.push_back("TAVOPLAYER_PROP_tavoplayer_demux_source=" + source);
+        std::vector<char*> envp;
+        for (auto& e : env)
+            envp.push_back(e.data());
+        envp.push_back(nullptr);
+        std::string program = TAVO_RECORDING_CHILD_PATH;
+        std::string arg = mode;
+        char* argv[] = {program.data(), arg.data(), nullptr};
+        EXPECT_EQ(posix_spawn(&mPid, program.c_str(), &actions, nullptr, argv, envp.data()), 0);
+        posix_spawn_file_actions_destroy(&actions);
+        close(fds[1]);
+        mOut = fdopen(fds[0], "r");
+    }
+    ~ChildRecording() {
+        if (mPid > 0) {
+            kill(mPid, SIGKILL);
+            wait();
+        }
+        if (mOut != nullptr)
+            fclose(mOut);
+    }
+    std::string line() {
+        char buffer[256] = {};
+        return fgets(buffer, sizeof buffer, mOut) != nullptr ? std::string(buffer) : std::string();
+    }
+    int wait() {
+        int status = 0;
+        waitpid(mPid, &status, 0);
+        mPid = -1;
+        return status;
+    }
+    void killNow() {
+        kill(mPid, SIGKILL);
+        wait();
+    }
+
+private:
+    pid_t mPid = -1;
+    FILE* mOut = nullptr;
+};
+
+TEST_F(RecordingServiceTest, AKilledRecordingLeavesAPlayableFileMarkedIncomplete) {
+    ChildRecording child("kill", dir, "file:" + tsgenStream(20) + "?pace=pcr");
+    const int number = std::atoi(child.line().c_str());
+    ASSERT_GT(number, 0);
+    const std::string path = dir + "/" + std::to_string(number) + ".ts";
+    // A few seconds in: past the first catalog updates.
+    ASSERT_TRUE(waitUntil([&] { return fs::exists(path) && fs::file_size(path) > 600'000; }));
+    child.killNow();
+
+    RecordingCatalog catalog(dir);  // as the next start of the service opens it
+    ASSERT_EQ(catalog.open(), RecordingCatalog::Status::kOk);
+    const auto e = catalog.get(number);
+    ASSERT_TRUE(e.has_value());
+    EXPECT_EQ(e->state, RecordingCatalog::kIncomplete);
+    EXPECT_EQ(e->sizeBytes, fs::file_size(path));
+    EXPECT_EQ(fs::file_size(path) % 188, 0u);
+    EXPECT_GT(e->playbackDuration, 1000u);
+    const std::string streams = probe(path);
+    EXPECT_NE(streams.find("h264"), std::string::npos) << streams;
+    EXPECT_NEAR(probedDuration(path) * 1000, e->playbackDuration, 1000);
+}
+
+TEST_F(RecordingServiceTest, AFullDiskStopsTheRecordingCleanlyWithItsEvent) {
+    constexpr uint64_t kLimit = 1'000'000;
+    ChildRecording child("fsize=" + std::to_string(kLimit), dir,
+                         "file:" + tsgenStream(20) + "?pace=none");
+    const int number = std::atoi(child.line().c_str());
+    ASSERT_GT(number, 0);
+    EXPECT_EQ(child.line(), "event " + std::to_string(kRecEventDiskFull) + "\n");
+    EXPECT_EQ(WEXITSTATUS(child.wait()), 0) << "the stop after the event succeeds";
+    const std::string path = dir + "/" + std::to_string(number) + ".ts";
+    EXPECT_LE(fs::file_size(path), kLimit);
+    EXPECT_EQ(fs::file_size(path) % 188, 0u);
+    const auto e = row(number);
+    EXPECT_EQ(e.state, RecordingCatalog::kComplete);
+    EXPECT_EQ(e.endReason, "disk full");
+    EXPECT_EQ(e.sizeBytes, fs::file_size(path));
+    EXPECT_NE(probe(path).find("h264"), std::string::npos);
+}
+
+}  // namespace
+}  // namespace TavoPlayer

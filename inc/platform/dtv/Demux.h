@@ -56,12 +56,17 @@ public:
     int startFiltering(uint16_t pid, int filterKind);
     // One filter on several PIDs: a single queue that keeps their packets in the
     // order of the multiplex (a recording needs that order, not one order per PID).
-    // `queuePackets` 0 takes the source's queue size. Returns a handle, or a negative
-    // value as startFiltering does; stopFiltering ends it.
-    int startTap(const std::vector<uint16_t>& pids, size_t queuePackets);
-    // Changes the PIDs a filter takes; what it queued stays. Returns 0, or a negative
-    // value for an unknown handle or an invalid PID.
+    // `queuePackets` 0 takes the source's queue size. With `everyPid` the filter
+    // takes every packet but the null packets, while only `pids` are asked of the
+    // source (a tuner filters in hardware). Returns a handle, or a negative value as
+    // startFiltering does; stopFiltering ends it.
+    int startTap(const std::vector<uint16_t>& pids, size_t queuePackets, bool everyPid = false);
+    // Makes a filter take exactly `pids` from now on; what it queued stays. Returns
+    // 0, or a negative value for an unknown handle or an invalid PID.
     int setFilterPids(int handle, const std::vector<uint16_t>& pids);
+    // Asks the source for one more PID on behalf of an every-PID filter (a tuner
+    // delivers only the PIDs it was asked for). Returns 0 or a negative value.
+    int addSourcePid(int handle, uint16_t pid);
     int stopFiltering(int handle);
     int select(DemuxHandleSet* set, int timeoutMs);
     int readData(int handle, uint8_t* buffer, int size);
@@ -110,9 +115,14 @@ private:
 
     struct Filter {
         Filter(std::vector<uint16_t> pids, int kind, size_t capacity)
-            : pid(pids.front()), pids(std::move(pids)), kind(kind), queue(capacity) {}
-        uint16_t pid;                // the first PID, for diagnostics
-        std::vector<uint16_t> pids;  // every PID this filter takes
+            : pid(pids.front()),
+              pids(pids),
+              sourcePids(std::move(pids)),
+              kind(kind),
+              queue(capacity) {}
+        uint16_t pid;                      // the first PID, for diagnostics
+        std::vector<uint16_t> pids;        // every PID this filter takes
+        std::vector<uint16_t> sourcePids;  // the PIDs it asked of the source
         int kind;
         PacketQueue queue;
         bool overflowLogged = false;
@@ -123,7 +133,7 @@ private:
     void closeSource_c();
     int startThread_c();
     void stopThread_c();
-    int addFilter(std::vector<uint16_t> pids, int kind, size_t queuePackets);
+    int addFilter(std::vector<uint16_t> pids, int kind, size_t queuePackets, bool everyPid);
     // Source thread: it holds (true) or hands out packets again (false).
     void noteHolding(bool holding);
     int allocateHandle_l() const;

@@ -383,7 +383,7 @@ int Demux::startFiltering(uint16_t pid, int filterKind) {
                   filterKind);
         return -EINVAL;
     }
-    const int handle = addFilter({pid}, filterKind, 0);
+    const int handle = addFilter({pid}, filterKind, 0, false);
     if (handle >= 0) {
         TAVO_LOGD("%s: PID %d kind %d -> handle %d\n", "DemuxBinder_StartFiltering", pid,
                   filterKind, handle);
@@ -391,7 +391,7 @@ int Demux::startFiltering(uint16_t pid, int filterKind) {
     return handle;
 }
 
-int Demux::startTap(const std::vector<uint16_t>& pids, size_t queuePackets) {
+int Demux::startTap(const std::vector<uint16_t>& pids, size_t queuePackets, bool everyPid) {
     std::vector<uint16_t> unique;
     for (uint16_t pid : pids) {
         if (pid > kMaxPid) {
@@ -403,7 +403,7 @@ int Demux::startTap(const std::vector<uint16_t>& pids, size_t queuePackets) {
     }
     if (unique.empty())
         return -EINVAL;
-    return addFilter(std::move(unique), kDemuxFilterPes, queuePackets);
+    return addFilter(std::move(unique), kDemuxFilterPes, queuePackets, everyPid);
 }
 
 int Demux::setFilterPids(int handle, const std::vector<uint16_t>& pids) {
@@ -416,43 +416,56 @@ int Demux::setFilterPids(int handle, const std::vector<uint16_t>& pids) {
     }
     if (unique.empty())
         return -EINVAL;
+    auto has = [](const std::vector<uint16_t>& list, uint16_t pid) {
+        return std::find(list.begin(), list.end(), pid) != list.end();
+    };
     std::lock_guard<std::mutex> control(mControlLock);
-    std::vector<uint16_t> old;
+    std::vector<uint16_t> oldSource;
     {
         std::lock_guard<std::mutex> lock(mLock);
         if (handle < 0 || handle >= kDemuxMaxHandles || !mFilters[handle])
             return -EBADF;
-        old = mFilters[handle]->pids;
+        oldSource = mFilters[handle]->sourcePids;
     }
-    auto has = [](const std::vector<uint16_t>& list, uint16_t pid) {
-        return std::find(list.begin(), list.end(), pid) != list.end();
-    };
     for (uint16_t pid : unique) {
-        if (!has(old, pid) && mSource)
+        if (!has(oldSource, pid) && mSource)
             mSource->addPid(pid);
     }
     {
         std::lock_guard<std::mutex> lock(mLock);
         Filter* filter = mFilters[handle].get();
-        for (uint16_t pid : old) {
-            if (!has(unique, pid))
-                std::erase(mPidFilters[pid], filter);
-        }
-        for (uint16_t pid : unique) {
-            if (!has(old, pid))
-                mPidFilters[pid].push_back(filter);
-        }
+        for (uint16_t pid : filter->pids)
+            std::erase(mPidFilters[pid], filter);
+        for (uint16_t pid : unique)
+            mPidFilters[pid].push_back(filter);
         filter->pids = unique;
+        filter->sourcePids = unique;
         filter->pid = unique.front();
     }
-    for (uint16_t pid : old) {
+    for (uint16_t pid : oldSource) {
         if (!has(unique, pid) && mSource)
             mSource->removePid(pid);
     }
     return 0;
 }
 
-int Demux::addFilter(std::vector<uint16_t> pids, int kind, size_t queuePackets) {
+int Demux::addSourcePid(int handle, uint16_t pid) {
+    if (pid > kMaxPid)
+        return -EINVAL;
+    std::lock_guard<std::mutex> control(mControlLock);
+    {
+        std::lock_guard<std::mutex> lock(mLock);
+        if (handle < 0 || handle >= kDemuxMaxHandles || !mFilters[handle])
+            return -EBADF;
+        auto& pids = mFilters[handle]->sourcePids;
+        if (std::find(pids.begin(), pids.end(), pid) != pids.end())
+            return 0;
+        pids.push_back(pid);
+    }
+    return mSource ? mSource->addPid(pid) : 0;
+}
+
+int Demux::addFilter(std::vector<uint16_t> pids, int kind, size_t queuePackets, bool everyPid) {
     std::lock_guard<std::mutex> control(mControlLock);
     if (!mSource) {
         const int rc = openSource_c();
@@ -473,8 +486,14 @@ int Demux::addFilter(std::vector<uint16_t> pids, int kind, size_t queuePackets) 
         if (handle >= 0) {
             const size_t capacity = queuePackets > 0 ? queuePackets : mConfig.queuePackets;
             mFilters[handle] = std::make_unique<Filter>(pids, kind, capacity);
-            for (uint16_t pid : pids)
-                mPidFilters[pid].push_back(mFilters[handle].get());
+            Filter* filter = mFilters[handle].get();
+            if (everyPid) {
+                filter->pids.clear();
+                for (uint16_t pid = 0; pid < kMaxPid; ++pid)
+                    filter->pids.push_back(pid);
+            }
+            for (uint16_t pid : filter->pids)
+                mPidFilters[pid].push_back(filter);
             ++mFilterCount;
             mNextHandle = (handle + 1) % kDemuxMaxHandles;
         }
@@ -507,10 +526,10 @@ int Demux::stopFiltering(int handle) {
         }
         Filter* filter = mFilters[handle].get();
         pid = filter->pid;
-        pids = filter->pids;
-        dropped = filter->queue.dropped();
-        for (uint16_t p : pids)
+        pids = filter->sourcePids;
+        for (uint16_t p : filter->pids)
             std::erase(mPidFilters[p], filter);
+        dropped = filter->queue.dropped();
         mFilters[handle].reset();
         remaining = --mFilterCount;
         mRoomReady.notify_all();

@@ -88,14 +88,16 @@ int TSRecording::open(int tablesWaitMs) {
     }
     std::vector<uint16_t> watching = av;
     watching.push_back(0);
-    mHandle = demux.startTap(watching, kQueuePackets);
+    // Every PID until the programme is known: its PCR and caption packets are then
+    // kept from this moment too, however fast the source runs.
+    mHandle = demux.startTap(watching, kQueuePackets, true);
     if (mHandle < 0) {
         TAVO_LOGE("%s: cannot filter the recorded PIDs on the demux (%d)\n", kName, mHandle);
         return mHandle;
     }
     ProgramFinder finder(av.front());
     std::vector<uint8_t> buffer(kReadPackets * kPacket);
-    size_t pmtPidsWatched = 0;
+    size_t pmtPidsAsked = 0;
     bool prebufferFull = false;
     const auto deadline =
         std::chrono::steady_clock::now() + std::chrono::milliseconds(tablesWaitMs);
@@ -110,21 +112,17 @@ int TSRecording::open(int tablesWaitMs) {
             break;
         for (int i = 0; i + static_cast<int>(kPacket) <= n; i += static_cast<int>(kPacket)) {
             const uint8_t* packet = &buffer[static_cast<size_t>(i)];
-            const uint16_t pid = pidOf(packet);
-            if (std::find(av.begin(), av.end(), pid) != av.end()) {
-                if (mPrebuffer.size() < kMaxPrebufferBytes)
-                    mPrebuffer.insert(mPrebuffer.end(), packet, packet + kPacket);
-                else
-                    prebufferFull = true;
-            } else {
-                finder.push(packet);
-            }
+            finder.push(packet);
+            if (mPrebuffer.size() < kMaxPrebufferBytes)
+                mPrebuffer.insert(mPrebuffer.end(), packet, packet + kPacket);
+            else
+                prebufferFull = true;
         }
-        if (finder.pmtPids().size() != pmtPidsWatched) {
-            pmtPidsWatched = finder.pmtPids().size();
-            std::vector<uint16_t> pids = watching;
-            pids.insert(pids.end(), finder.pmtPids().begin(), finder.pmtPids().end());
-            demux.setFilterPids(mHandle, pids);
+        if (finder.pmtPids().size() != pmtPidsAsked) {
+            // A tuner must be asked for the PMT PIDs the PAT named.
+            pmtPidsAsked = finder.pmtPids().size();
+            for (uint16_t pid : finder.pmtPids())
+                demux.addSourcePid(mHandle, pid);
         }
         if (n == 0) {
             Demux::FilterStats stats;

@@ -1,0 +1,214 @@
+// The surface and its headless sinks: what the codec shows is cropped, recorded
+// and logged; the capture's buffer holds the most recently shown picture; the y4m
+// file is a stream that FFmpeg reads back with the right size and frame count.
+#include <unistd.h>
+
+#include <cstdio>
+#include <sstream>
+
+#include <gtest/gtest.h>
+
+#include "SurfaceTestUtil.h"
+#include "platform/gui/SinkSurface.h"
+
+namespace android::test {
+namespace {
+
+std::string tempPath(const std::string& name) {
+    return testing::TempDir() + "/" + std::to_string(getpid()) + "_" + name;
+}
+
+sp<SinkSurface> createSurface(const std::string& sink, const std::string& logPath = "") {
+    ScopedSinkProperties properties(sink, logPath);
+    sp<Surface> surface = Surface::create();
+    return static_cast<SinkSurface*>(surface.get());
+}
+
+class NullSinkTest : public testing::Test {
+protected:
+    // A 1920 x 1088 coded picture shown with the SPS's crop to 1920 x 1080 is the
+    // broadcast case; here a smaller one with a crop that is off the origin.
+    static constexpr android_native_rect_t kCrop{4, 2, 68, 50};  // 64 x 48 at (4, 2)
+    const std::string mLogPath = tempPath("null.log");
+};
+
+TEST_F(NullSinkTest, CountsCropsAndLogsEveryPicture) {
+    sp<SinkSurface> surface = createSurface("null", mLogPath);
+    ASSERT_NE(surface, nullptr);
+    EXPECT_STREQ(surface->sinkName(), "null");
+    ASSERT_EQ(native_window_set_crop(surface.get(), &kCrop), 0);
+
+    const int64_t ptsUs[] = {1'000'000, 1'033'366, 95'443'717'700};  // the last wraps 2^33 ticks
+    for (int i = 0; i < 3; ++i) {
+        TestPicture picture(80, 64, i, ptsUs[i]);
+        ASSERT_EQ(surface->showPicture(picture.picture()), 0);
+        if (i != 2)
+            continue;
+        {
+            std::shared_ptr<const SinkPicture> last = surface->lastPicture();
+            ASSERT_NE(last, nullptr);
+            ASSERT_EQ(last->width, 64);
+            ASSERT_EQ(last->height, 48);
+            for (int row = 0; row < 48; ++row) {
+                for (int col = 0; col < 64; ++col)
+                    ASSERT_EQ(last->y()[row * 64 + col], picture.lumaAt(row + 2, col + 4));
+            }
+            for (int row = 0; row < 24; ++row) {
+                for (int byte = 0; byte < 64; ++byte)
+                    ASSERT_EQ(last->uv()[row * 64 + byte], picture.chromaAt(row + 1, byte + 4));
+            }
+        }
+    }
+
+    const uint64_t expectedPts[] = {90000, 93002, 1};  // the last: 2^33 + 1 ticks
+    EXPECT_EQ(surface->showLog().shownCount(), 3u);
+    const std::vector<ShowLog::Entry> history = surface->showLog().history();
+    ASSERT_EQ(history.size(), 3u);
+    std::istringstream log(readFile(mLogPath));
+    for (int i = 0; i < 3; ++i) {
+        EXPECT_EQ(history[i].pts90k, expectedPts[i]);
+        EXPECT_EQ(history[i].width, 64);
+        EXPECT_EQ(history[i].height, 48);
+        if (i > 0) {
+            EXPECT_GE(history[i].monotonicNs, history[i - 1].monotonicNs);
+        }
+        long long ns = 0;
+        unsigned long long pts = 0;
+        int width = 0;
+        int height = 0;
+        log >> ns >> pts >> width >> height;
+        EXPECT_EQ(ns, history[i].monotonicNs);
+        EXPECT_EQ(pts, expectedPts[i]);
+        EXPECT_EQ(width, 64);
+        EXPECT_EQ(height, 48);
+    }
+    unlink(mLogPath.c_str());
+}
+
+TEST_F(NullSinkTest, RejectsMalformedPicturesAndUnknownSinks) {
+    sp<SinkSurface> surface = createSurface("null");
+    ASSERT_NE(surface, nullptr);
+    TestPicture picture(32, 16, 0, 0);
+    SurfacePicture noChroma = picture.picture();
+    noChroma.uv = nullptr;
+    SurfacePicture shortStride = picture.picture();
+    shortStride.yStride = 16;
+    EXPECT_LT(surface->showPicture(noChroma), 0);
+    EXPECT_LT(surface->showPicture(shortStride), 0);
+    EXPECT_EQ(surface->showLog().shownCount(), 0u);
+
+    EXPECT_EQ(createSurface("vga"), nullptr);
+    EXPECT_EQ(createSurface("y4m:/nonexistent-dir/out.y4m"), nullptr);
+}
+
+class CaptureBufferTest : public testing::Test {
+protected:
+    void SetUp() override {
+        mSurface = createSurface("null");
+        ASSERT_NE(mSurface, nullptr);
+    }
+    sp<SinkSurface> mSurface;
+    GraphicBufferMapper& mMapper = GraphicBufferMapper::get();
+};
+
+TEST_F(CaptureBufferTest, NothingToDequeueBeforeTheFirstPicture) {
+    ANativeWindowBuffer* buffer = nullptr;
+    EXPECT_LT(mSurface->dequeueBuffer(&buffer), 0);
+    EXPECT_EQ(mSurface->dequeuedCount(), 0u);
+}
+
+TEST_F(CaptureBufferTest, MapsTheLastPictureAsNV12AndKeepsItWhileDequeued) {
+    TestPicture first(48, 32, 1, 0);
+    ASSERT_EQ(mSurface->showPicture(first.picture()), 0);
+    ANativeWindowBuffer* buffer = nullptr;
+    ASSERT_EQ(mSurface->dequeueBuffer(&buffer), 0);
+
+    // Pictures shown while the capture holds the buffer must not change it.
+    for (int seed = 2; seed < 12; ++seed) {
+        TestPicture later(48, 32, seed, 0);
+        ASSERT_EQ(mSurface->showPicture(later.picture()), 0);
+    }
+
+    android_ycbcr ycbcr{};
+    ASSERT_EQ(mMapper.lockYCbCr(buffer, 3, Rect{0, 0, 48, 32}, &ycbcr), 0);
+    EXPECT_EQ(ycbcr.ystride, 48u);
+    EXPECT_EQ(ycbcr.cstride, 48u);
+    EXPECT_EQ(ycbcr.chroma_step, 2u);
+    EXPECT_EQ(static_cast<uint8_t*>(ycbcr.cr), static_cast<uint8_t*>(ycbcr.cb) + 1);
+    // The capture reads width x height luma bytes, then width x height / 2 chroma
+    // bytes straight after them.
+    const auto* y = static_cast<const uint8_t*>(ycbcr.y);
+    const auto* cb = static_cast<const uint8_t*>(ycbcr.cb);
+    EXPECT_EQ(cb, y + 48 * 32);
+    for (int row = 0; row < 32; ++row) {
+        for (int col = 0; col < 48; ++col)
+            ASSERT_EQ(y[row * 48 + col], first.lumaAt(row, col));
+    }
+    for (int row = 0; row < 16; ++row) {
+        for (int byte = 0; byte < 48; ++byte)
+            ASSERT_EQ(cb[row * 48 + byte], first.chromaAt(row, byte));
+    }
+    EXPECT_EQ(mMapper.unlock(buffer), 0);
+
+    // A part of the picture comes packed at its own width.
+    ASSERT_EQ(mMapper.lockYCbCr(buffer, 3, Rect{0, 0, 16, 8}, &ycbcr), 0);
+    y = static_cast<const uint8_t*>(ycbcr.y);
+    cb = static_cast<const uint8_t*>(ycbcr.cb);
+    EXPECT_EQ(ycbcr.ystride, 16u);
+    EXPECT_EQ(y[3 * 16 + 5], first.lumaAt(3, 5));
+    EXPECT_EQ(cb, y + 16 * 8);
+    EXPECT_EQ(cb[2 * 16 + 7], first.chromaAt(2, 7));
+    EXPECT_EQ(mMapper.unlock(buffer), 0);
+
+    EXPECT_LT(mMapper.lockYCbCr(buffer, 3, Rect{0, 0, 50, 32}, &ycbcr), 0);
+    EXPECT_EQ(mSurface->queueBuffer(buffer, -1), 0);
+    EXPECT_EQ(mSurface->dequeuedCount(), 0u);
+    EXPECT_LT(mSurface->queueBuffer(buffer, -1), 0);  // not ours any more
+
+    // A new dequeue sees the latest picture.
+    ASSERT_EQ(mSurface->dequeueBuffer(&buffer), 0);
+    ASSERT_EQ(mMapper.lockYCbCr(buffer, 3, Rect{0, 0, 48, 32}, &ycbcr), 0);
+    TestPicture latest(48, 32, 11, 0);
+    EXPECT_EQ(static_cast<const uint8_t*>(ycbcr.y)[100], latest.lumaAt(100 / 48, 100 % 48));
+    mMapper.unlock(buffer);
+    EXPECT_EQ(mSurface->queueBuffer(buffer, -1), 0);
+}
+
+TEST(Y4mSinkTest, FFprobeReadsEveryPictureAtTheFirstPicturesSize) {
+    const std::string path = tempPath("out.y4m");
+    {
+        sp<SinkSurface> surface = createSurface("y4m:" + path);
+        ASSERT_NE(surface, nullptr);
+        EXPECT_STREQ(surface->sinkName(), "y4m");
+        for (int i = 0; i < 5; ++i) {
+            TestPicture picture(96, 64, i, i * 33'367);
+            ASSERT_EQ(surface->showPicture(picture.picture()), 0);
+        }
+        // A stream that changes size midway: scaled to the file's size.
+        TestPicture larger(128, 96, 9, 200'000);
+        ASSERT_EQ(surface->showPicture(larger.picture()), 0);
+        EXPECT_EQ(surface->showLog().shownCount(), 6u);
+    }
+    const std::string probe = runCommand(
+        "ffprobe -v error -count_frames -select_streams v:0 -show_entries "
+        "stream=width,height,nb_read_frames -of csv=p=0 '" +
+        path + "'");
+    EXPECT_EQ(probe, "96,64,6\n");
+
+    // The first picture's planes, read back by FFmpeg itself.
+    const std::string firstFrame =
+        runCommand("ffmpeg -v error -i '" + path + "' -frames:v 1 -f rawvideo -pix_fmt yuv420p -");
+    ASSERT_EQ(firstFrame.size(), 96u * 64u * 3 / 2);
+    TestPicture first(96, 64, 0, 0);
+    for (int row = 0; row < 64; row += 7) {
+        for (int col = 0; col < 96; col += 5)
+            ASSERT_EQ(static_cast<uint8_t>(firstFrame[row * 96 + col]), first.lumaAt(row, col));
+    }
+    // Cr plane (after Y and Cb): the second byte of each chroma pair.
+    const size_t crPlane = 96 * 64 + 48 * 32;
+    EXPECT_EQ(static_cast<uint8_t>(firstFrame[crPlane + 5 * 48 + 3]), first.chromaAt(5, 7));
+    unlink(path.c_str());
+}
+
+}  // namespace
+}  // namespace android::test

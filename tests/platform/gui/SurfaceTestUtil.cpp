@@ -1,0 +1,69 @@
+#include "SurfaceTestUtil.h"
+
+#include <cstdio>
+#include <cstdlib>
+#include <fstream>
+#include <sstream>
+
+namespace android::test {
+
+TestPicture::TestPicture(int32_t w, int32_t h, int seed, int64_t pts)
+    : width(w), height(h), stride(w + 32), ptsUs(pts) {
+    y.resize(static_cast<size_t>(stride) * h);
+    uv.resize(static_cast<size_t>(stride) * h / 2);
+    for (size_t i = 0; i < y.size(); ++i)
+        y[i] = static_cast<uint8_t>((i * 7 + seed * 13) & 0xFF);
+    for (size_t i = 0; i < uv.size(); ++i)
+        uv[i] = static_cast<uint8_t>((i * 5 + seed * 29 + 1) & 0xFF);
+}
+
+TestPicture::TestPicture(int32_t w, int32_t h, uint8_t luma, uint8_t cb, uint8_t cr)
+    : width(w), height(h), stride(w), ptsUs(0) {
+    y.assign(static_cast<size_t>(w) * h, luma);
+    uv.resize(static_cast<size_t>(w) * h / 2);
+    for (size_t i = 0; i < uv.size(); i += 2) {
+        uv[i] = cb;
+        uv[i + 1] = cr;
+    }
+}
+
+SurfacePicture TestPicture::picture() const {
+    return SurfacePicture{y.data(), stride, uv.data(), stride, width, height, ptsUs, false, true};
+}
+
+ScopedSinkProperties::ScopedSinkProperties(const std::string& sink, const std::string& logPath,
+                                           const std::string& deinterlace) {
+    setenv("TAVOPLAYER_PROPERTIES", "/dev/null", 1);
+    setenv("TAVOPLAYER_PROP_tavoplayer_video_sink", sink.c_str(), 1);
+    setenv("TAVOPLAYER_PROP_tavoplayer_video_log", logPath.c_str(), 1);
+    setenv("TAVOPLAYER_PROP_tavoplayer_video_deinterlace", deinterlace.c_str(), 1);
+}
+
+ScopedSinkProperties::~ScopedSinkProperties() {
+    unsetenv("TAVOPLAYER_PROPERTIES");
+    unsetenv("TAVOPLAYER_PROP_tavoplayer_video_sink");
+    unsetenv("TAVOPLAYER_PROP_tavoplayer_video_log");
+    unsetenv("TAVOPLAYER_PROP_tavoplayer_video_deinterlace");
+}
+
+std::string readFile(const std::string& path) {
+    std::ifstream in(path, std::ios::binary);
+    std::ostringstream text;
+    text << in.rdbuf();
+    return text.str();
+}
+
+std::string runCommand(const std::string& command) {
+    std::string output;
+    FILE* pipe = popen(command.c_str(), "r");
+    if (pipe == nullptr)
+        return output;
+    char chunk[4096];
+    size_t n;
+    while ((n = fread(chunk, 1, sizeof(chunk), pipe)) > 0)
+        output.append(chunk, n);
+    pclose(pipe);
+    return output;
+}
+
+}  // namespace android::test

@@ -24,27 +24,21 @@ using test::TraceCapture;
 // Errors come on the recording service's thread, the rest on the caller's.
 class RecordingRecorderListener : public IRecorderListener {
 public:
-    void onRecorderStarted(int fileNumName) override { add(&started, fileNumName); }
-    void onRecorderStopped(int result) override { add(&stopped, result); }
-    void onError(int code) override { add(&errors, code); }
-    std::vector<int> get(const std::vector<int>& which) {
+    void onRecorderStarted(int fileNumName) override { started.push_back(fileNumName); }
+    void onRecorderStopped(int result) override { stopped.push_back(result); }
+    void onError(int code) override {
         std::lock_guard<std::mutex> lock(mutex);
-        return which;
+        errors.push_back(code);
+        changed.notify_all();
     }
-    bool waitForError() {
+    std::vector<int> waitForErrors() {
         std::unique_lock<std::mutex> lock(mutex);
-        return changed.wait_for(lock, test::kDeadline, [&] { return !errors.empty(); });
+        changed.wait_for(lock, test::kDeadline, [&] { return !errors.empty(); });
+        return errors;
     }
     std::vector<int> started, stopped, errors;
     std::mutex mutex;
     std::condition_variable changed;
-
-private:
-    void add(std::vector<int>* to, int value) {
-        std::lock_guard<std::mutex> lock(mutex);
-        to->push_back(value);
-        changed.notify_all();
-    }
 };
 
 TEST(RecorderCallbackTest, EventTable) {
@@ -136,37 +130,32 @@ TEST_F(RecorderServiceTest, StartFillsTheDetailsFromTheQueryAndStopKeepsOrCancel
         EXPECT_EQ(d->iV_PID, kVideo);
         EXPECT_EQ(d->iA_PID, kAudio);
         EXPECT_EQ(d->isLATM, 1);
-        EXPECT_EQ(d->stationName == nullptr ? "(null)" : std::string(d->stationName),
-                  c.station == nullptr ? "(null)" : c.station);
-        EXPECT_EQ(d->stationNameLength, c.station == nullptr ? 0u : strlen(c.station));
-        EXPECT_EQ(d->prgName == nullptr ? "(null)" : std::string(d->prgName),
-                  c.programme == nullptr ? "(null)" : c.programme);
-        EXPECT_EQ(d->prgNameLength, c.programme == nullptr ? 0u : strlen(c.programme));
+        auto text = [](const char* name) { return std::string(name ? name : "(null)"); };
+        EXPECT_EQ(text(d->stationName), text(c.station));
+        EXPECT_EQ(d->stationNameLength, text(c.station) == "(null)" ? 0u : strlen(c.station));
+        EXPECT_EQ(text(d->prgName), text(c.programme));
+        EXPECT_EQ(d->prgNameLength, text(c.programme) == "(null)" ? 0u : strlen(c.programme));
         free(d->stationName);
         free(d->prgName);
         free(d);
 
-        // The details are logged field by field in their fixed order.
-        const char* const order[] = {"fileNumName",   "stationNameLength",
-                                     "prgNameLength", "creationTime",
-                                     "durationOfRec", "sizeOfRec",
-                                     "recMode",       "recLocation",
-                                     "bCanPlay",      "playbackDuration",
-                                     "recStartTime",  "recEndTime",
-                                     "iV_PID",        "iA_PID",
-                                     "isLATM"};
-        std::vector<std::string> logged;
+        // The details are logged field by field in their fixed order (names apart).
+        std::string logged;
         for (const auto& line : trace.lines()) {
             const auto at = line.text.find("start recDetails->");
-            if (at != std::string::npos && line.text.find("stationName:") == std::string::npos &&
-                line.text.find("prgName:") == std::string::npos)
-                logged.push_back(line.text.substr(at + 18, line.text.find(':') - at - 18));
+            if (at == std::string::npos)
+                continue;
+            const std::string field = line.text.substr(at + 18, line.text.find(':') - at - 18);
+            if (field != "stationName" && field != "prgName")
+                logged += field + " ";
         }
-        EXPECT_EQ(logged, std::vector<std::string>(std::begin(order), std::end(order)));
+        EXPECT_EQ(logged,
+                  "fileNumName stationNameLength prgNameLength creationTime durationOfRec "
+                  "sizeOfRec recMode recLocation bCanPlay playbackDuration recStartTime "
+                  "recEndTime iV_PID iA_PID isLATM ");
 
         recorder->stop(c.stopReason);
         EXPECT_EQ(listener.stopped, std::vector<int>{1});
-        RecPlayerBinder_DeleteTSRecorder();
         EXPECT_EQ(std::filesystem::exists(fileOf(number)), c.fileKept);
     }
 }
@@ -185,8 +174,7 @@ TEST_F(RecorderServiceTest, ARefusedSecondRecordingReportsZeroOnceAndItsError) {
     EXPECT_EQ(second.started, std::vector<int>{0});
     EXPECT_EQ(trace.count(TRACE_ERROR, "start: recDetails == null!"), 1u);
     EXPECT_EQ(trace.count(TRACE_ERROR, "start RecPlayerBinder_CreateTSRecorder failed"), 1u);
-    ASSERT_TRUE(second.waitForError());
-    EXPECT_EQ(second.get(second.errors), std::vector<int>{0x60004});
+    EXPECT_EQ(second.waitForErrors(), std::vector<int>{0x60004});
 
     // The refused attempt's stop fails: it reports 0 and attempts no delete;
     // the first recording then stops normally.

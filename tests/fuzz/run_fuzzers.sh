@@ -7,7 +7,7 @@ set -eu
 src=$1
 out=$2
 seconds=${3:-5}
-flags="-fsanitize=fuzzer-no-link,address,undefined -fno-sanitize-recover=undefined -fno-sanitize=alignment"
+flags="-fsanitize=fuzzer-no-link,address,undefined -fno-sanitize-recover=undefined"
 
 if [ ! -f "$out/CMakeCache.txt" ]; then
     cmake -S "$src" -B "$out" -G Ninja -DCMAKE_BUILD_TYPE=RelWithDebInfo \

@@ -10,7 +10,7 @@
 
 namespace TavoPlayer {
 
-class AudioFragmentData : public Data {
+class TAVO_RING_RECORD AudioFragmentData : public Data {
 public:
     static constexpr uint32_t kHeaderSize = 32;
 
@@ -19,6 +19,7 @@ public:
           mPTS(0),
           mNumberChannels(0),
           mBitsPerSample(16),
+          mPadding{},
           mSamplingRate(0) {}
 
     std::string toString() override;
@@ -28,6 +29,7 @@ public:
     uint64_t mPTS;
     uint8_t mNumberChannels;
     uint8_t mBitsPerSample;
+    uint8_t mPadding[2];  // keeps mSamplingRate at 28
     uint32_t mSamplingRate;
 };
 

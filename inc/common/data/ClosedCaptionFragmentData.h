@@ -12,7 +12,7 @@
 
 namespace TavoPlayer {
 
-class ClosedCaptionFragmentData : public virtual Data {
+class TAVO_RING_RECORD ClosedCaptionFragmentData : public virtual Data {
 public:
     static constexpr uint32_t kHeaderSize = 32;
 

@@ -12,9 +12,17 @@
 #include <cstdint>
 #include <string>
 
+// Records start wherever the previous one ended, rounded up to 4 bytes, so their
+// 8-byte fields (PTS, pointers) often sit at addresses that are 4 mod 8. Every
+// record type is therefore declared with an alignment of 4 and no implicit
+// padding: the compiler then reads and writes those fields with accesses that are
+// safe at any 4-byte boundary, and the layouts (padding spelled out where it
+// exists) stay exactly as they are laid into the rings.
+#define TAVO_RING_RECORD __attribute__((packed, aligned(4)))
+
 namespace TavoPlayer {
 
-class Data {
+class TAVO_RING_RECORD Data {
 public:
     enum Type : uint32_t {
         TYPE_PES = 0,

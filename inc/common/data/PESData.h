@@ -11,7 +11,7 @@
 
 namespace TavoPlayer {
 
-class PESData : public Data {
+class TAVO_RING_RECORD PESData : public Data {
 public:
     static constexpr uint32_t kHeaderSize = 40;
 

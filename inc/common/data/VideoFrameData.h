@@ -17,7 +17,7 @@ namespace TavoPlayer {
 class GraphicBuffer;
 class CaptureFrameListener;
 
-class VideoFrameData : public Data {
+class TAVO_RING_RECORD VideoFrameData : public Data {
 public:
     static constexpr uint32_t kRecordSize = 80;
 
@@ -40,6 +40,7 @@ public:
           mGraphicBuffer(nullptr),
           mListener(nullptr),
           mFlag(0),
+          mPadding{},
           mReserved(0),
           mCropWidth(0),
           mCropHeight(0) {}
@@ -57,6 +58,7 @@ public:
     GraphicBuffer* mGraphicBuffer;  // not owned; null in records written by the decoder
     VideoListener* mListener;       // not owned; the decoder outlives its records
     uint8_t mFlag;
+    uint8_t mPadding[7];  // keeps mReserved at 56
     uint64_t mReserved;
     uint32_t mCropWidth;
     uint32_t mCropHeight;

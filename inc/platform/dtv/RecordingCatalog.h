@@ -89,10 +89,11 @@ public:
     std::vector<IndexPoint> loadIndex(int fileNumName);
     Status storeIndex(int fileNumName, const std::vector<IndexPoint>& points);
 
-    // Scans a TS file: its index points and duration (ms). False when it cannot be
-    // read or holds no packet.
-    static bool scanFile(const std::string& path, std::vector<IndexPoint>* points,
-                         uint32_t* durationMs, uint64_t* sizeBytes);
+    // Scans a TS file from `fromOffset` (an index point at `baseMs`, or 0 and 0) to
+    // its last whole packet: the index points found there, the time at its last PCR
+    // and the offset of its end. False when it cannot be read or holds no packet.
+    static bool scanFile(const std::string& path, uint64_t fromOffset, uint32_t baseMs,
+                         std::vector<IndexPoint>* points, uint32_t* endMs, uint64_t* endOffset);
 
 private:
     Status openDatabase_l();

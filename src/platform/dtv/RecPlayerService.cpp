@@ -452,7 +452,7 @@ RecDetails* RecPlayerService::getRecClipDetails(const char* clipPath, int notOnE
     if (index.empty()) {
         uint32_t durationMs = 0;
         TAVO_LOGI("%s: clip %s has no time index; indexing it\n", kName, entry.path.c_str());
-        if (RecordingCatalog::scanFile(entry.path, &index, &durationMs, nullptr))
+        if (RecordingCatalog::scanFile(entry.path, 0, 0, &index, &durationMs, nullptr))
             catalog->storeIndex(entry.fileNumName, index);
     }
     // A truncated file: the index and the duration end where the file ends.
@@ -462,7 +462,7 @@ RecDetails* RecPlayerService::getRecClipDetails(const char* clipPath, int notOnE
         entry.playbackDuration = index.back().timeMs;
     entry.durationOfRec = entry.playbackDuration / 1000;
 
-    const bool sameClip = mClip && mClip->fileNumName == entry.fileNumName && mCursor;
+    const bool sameClip = mClip && mClip->path == entry.path && mCursor;
     if (!sameClip) {
         mCursor = std::make_shared<ClipCursor>();
     }
@@ -569,7 +569,8 @@ int RecPlayerService::repositioningTSPlayer(unsigned int elapsedTimeSec, int pos
             mCursor->armed = true;
         }
     }
-    mRepositionPending = true;
+    // A seek made while the pipeline is stopped waits for the clip to be opened again.
+    mRepositionPending = !open;
     TAVO_LOGI("%s: from %u s to %d ms: byte %llu\n", kName, elapsedTimeSec, positionMs,
               static_cast<unsigned long long>(offset));
     return 1;

@@ -179,14 +179,15 @@ void RecordingCatalog::setAside_l(const char* why) {
         "RecordingCatalog::open", path.c_str(), why, aside.c_str());
 }
 
-bool RecordingCatalog::scanFile(const std::string& path, std::vector<IndexPoint>* points,
-                                uint32_t* durationMs, uint64_t* sizeBytes) {
+bool RecordingCatalog::scanFile(const std::string& path, uint64_t fromOffset, uint32_t baseMs,
+                                std::vector<IndexPoint>* points, uint32_t* endMs,
+                                uint64_t* endOffset) {
     const int fd = ::open(path.c_str(), O_RDONLY | O_CLOEXEC);
     if (fd < 0)
         return false;
     TsIndexer indexer;
     std::vector<uint8_t> buffer(kScanChunk);
-    uint64_t offset = 0;
+    uint64_t offset = fromOffset;
     bool ok = true;
     for (;;) {
         const ssize_t n = pread(fd, buffer.data(), buffer.size(), static_cast<off_t>(offset));
@@ -200,19 +201,20 @@ bool RecordingCatalog::scanFile(const std::string& path, std::vector<IndexPoint>
         for (size_t i = 0; i < whole; i += kPacket)
             indexer.push(&buffer[i], offset + i);
         offset += whole;
-        if (whole < static_cast<size_t>(n) && whole == 0)
-            break;
-        if (static_cast<size_t>(n) < buffer.size())
+        if (whole == 0 || static_cast<size_t>(n) < buffer.size())
             break;
     }
     close(fd);
-    if (points != nullptr)
+    if (points != nullptr) {
         *points = indexer.points();
-    if (durationMs != nullptr)
-        *durationMs = indexer.elapsedMs();
-    if (sizeBytes != nullptr)
-        *sizeBytes = offset;
-    return ok && offset > 0;
+        for (IndexPoint& p : *points)
+            p.timeMs += baseMs;
+    }
+    if (endMs != nullptr)
+        *endMs = baseMs + indexer.elapsedMs();
+    if (endOffset != nullptr)
+        *endOffset = offset;
+    return ok && offset > fromOffset;
 }
 
 void RecordingCatalog::repair_l() {
@@ -242,10 +244,15 @@ void RecordingCatalog::repair_l() {
                       e.path.c_str(), strerror(errno));
         close(fd);
         std::vector<IndexPoint> index = loadIndexLocked(e.fileNumName);
-        uint32_t durationMs = 0;
         size_t keep = 0;
-        for (; keep < index.size() && index[keep].offset < whole; ++keep)
-            durationMs = index[keep].timeMs;
+        while (keep < index.size() && index[keep].offset < whole)
+            ++keep;
+        // The last second or so reached the file after the last catalog update: the
+        // time line and the index are read on from the last point the catalog has.
+        const IndexPoint from = keep > 0 ? index[keep - 1] : IndexPoint{};
+        std::vector<IndexPoint> tail;
+        uint32_t durationMs = from.timeMs;
+        scanFile(e.path, from.offset, from.timeMs, &tail, &durationMs, nullptr);
         if (keep < index.size()) {
             Statement s =
                 prepare(mDb, "DELETE FROM seekIndex WHERE fileNumName = ? AND offset >= ?;");
@@ -255,9 +262,12 @@ void RecordingCatalog::repair_l() {
                 sqlite3_step(s.get());
             }
         }
+        if (!tail.empty() && keep > 0 && tail.front().timeMs == from.timeMs)
+            tail.erase(tail.begin());
+        storeIndex_l(e.fileNumName, tail);
         e.sizeBytes = whole;
         e.sizeOfRec = static_cast<uint32_t>(whole / 1024);
-        e.playbackDuration = std::max(e.playbackDuration, durationMs);
+        e.playbackDuration = durationMs;
         e.durationOfRec = e.playbackDuration / 1000;
         if (e.recEndTime == 0)
             e.recEndTime = static_cast<uint32_t>(st.st_mtime);
@@ -298,7 +308,7 @@ void RecordingCatalog::recoverFiles_l() {
         Entry e;
         std::vector<IndexPoint> points;
         uint32_t durationMs = 0;
-        if (!scanFile(path, &points, &durationMs, &e.sizeBytes)) {
+        if (!scanFile(path, 0, 0, &points, &durationMs, &e.sizeBytes)) {
             TAVO_LOGW("%s: %s holds no TS packets; left alone\n", "RecordingCatalog::recover",
                       path.c_str());
             continue;

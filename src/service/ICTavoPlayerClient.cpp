@@ -1,0 +1,9 @@
+#include "service/ICTavoPlayerClient.h"
+
+#include "service/BpCTavoPlayerClient.h"
+
+namespace TavoPlayer {
+
+IMPLEMENT_META_INTERFACE(CTavoPlayerClient, "TavoPlayerClient")
+
+}  // namespace TavoPlayer

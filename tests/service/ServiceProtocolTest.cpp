@@ -1,0 +1,532 @@
+// The service protocol between two processes over the real socket transport. This
+// test binary re-executes itself as the service process (ServiceProcess.Serve),
+// which serves a recording fake of the service and prints one line per call
+// ("CALL ...") and per log message ("LOG ...") on its standard output.
+#include <gtest/gtest.h>
+#include <sys/mman.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/un.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <chrono>
+#include <condition_variable>
+#include <cstdarg>
+#include <cstring>
+#include <deque>
+#include <filesystem>
+#include <mutex>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "platform/binder/BBinder.h"
+#include "platform/binder/IServiceManager.h"
+#include "platform/binder/Parcel.h"
+#include "platform/binder/ProcessState.h"
+#include "platform/os/Trace.h"
+#include "service/BnCTavoPlayer.h"
+#include "service/BnCTavoPlayerClient.h"
+
+extern char** environ;
+
+namespace TavoPlayer {
+namespace {
+
+using android::IBinder;
+using android::Parcel;
+using android::sp;
+using android::String16;
+using namespace std::chrono_literals;
+
+constexpr const char* kChildEnv = "TAVO_BINDER_TEST_CHILD";
+// setCaptionLanguage with a value from here up makes the fake send that many
+// one-way callbacks at once and report how many the transport took.
+constexpr int32_t kFloodTrigger = 1000;
+
+// ---- the service process --------------------------------------------------------
+
+void emit(const char* format, ...) __attribute__((format(printf, 1, 2)));
+void emit(const char* format, ...) {
+    static std::mutex lock;
+    std::lock_guard<std::mutex> guard(lock);
+    va_list args;
+    va_start(args, format);
+    vprintf(format, args);
+    va_end(args);
+    fflush(stdout);
+}
+
+class RecordingService : public BnCTavoPlayer {
+public:
+    uint32_t registerClient(const sp<ICTavoPlayerClient>& client) override {
+        mClient = client;
+        emit("CALL registerClient(%s)\n", client != nullptr ? "client" : "null");
+        return 0;
+    }
+    uint32_t start() override { return call("start()", 0); }
+    uint32_t stop() override { return call("stop()", 0); }
+    uint32_t getState() override { return call("getState()", 125); }
+    uint32_t pause() override { return call("pause()", 0); }
+    uint32_t resume() override { return call("resume()", 0); }
+    uint32_t seek(int32_t ms) override { return call("seek(%d)", 0, ms); }
+    uint32_t openUri(const char* uri, int32_t type) override {
+        emit("CALL openUri(%s,%d)\n", uri, type);
+        return 0;
+    }
+    uint32_t close() override { return call("close()", 0); }
+    uint32_t setSurface(const sp<android::Surface>& surface) override {
+        emit("CALL setSurface(%s)\n", surface != nullptr ? "surface" : "null");
+        return 109;
+    }
+    uint32_t getFrame(int32_t width, int32_t height) override {
+        emit("CALL getFrame(%d,%d)\n", width, height);
+        if (mClient != nullptr && width > 0 && height > 0) {
+            std::vector<uint8_t> pixels(static_cast<size_t>(width) * height * 4);
+            for (size_t i = 0; i < pixels.size(); ++i)
+                pixels[i] = static_cast<uint8_t>(i * 7);
+            mClient->onCaptureFrame(pixels.data(), width, height, 0);
+        }
+        return 0;
+    }
+    uint32_t setSoundEffect(int32_t e, int32_t o) override { return call("setSoundEffect(%d,%d)", 111, e, o); }
+    uint32_t startRecorder(const char* uri) override {
+        emit("CALL startRecorder(%s)\n", uri);
+        return 113;
+    }
+    uint32_t stopRecorder(int32_t flag) override { return call("stopRecorder(%d)", 114, flag); }
+    uint32_t setAVSync(int32_t v) override { return call("setAVSync(%d)", 117, v); }
+    uint32_t setCaptionSync(int32_t v) override { return call("setCaptionSync(%d)", 118, v); }
+    uint32_t setAudioEnable(int32_t on) override { return call("setAudioEnable(%d)", 0, on); }
+    uint32_t setCaptionLanguage(int32_t language) override {
+        if (language >= kFloodTrigger)
+            return flood(language);
+        return call("setCaptionLanguage(%d)", 0, language);
+    }
+    uint32_t setAudioPID(int32_t pid) override { return call("setAudioPID(%d)", 0, pid); }
+    int32_t setAudioPathForce(int32_t mode) override { return call("setAudioPathForce(%d)", 0, mode); }
+    uint32_t setCCPID(int32_t pid) override { return call("setCCPID(%d)", 0, pid); }
+    int32_t getFrameRate() override { return call("getFrameRate()", 124); }
+    uint32_t setCropRect(int32_t a, int32_t b, int32_t c, int32_t d, int32_t e) override {
+        return call("setCropRect(%d,%d,%d,%d,%d)", 126, a, b, c, d, e);
+    }
+    uint32_t setAudioOnlyMode(int32_t on) override { return call("setAudioOnlyMode(%d)", 127, on); }
+    int64_t getPCRValue() override {
+        emit("CALL getPCRValue()\n");
+        return 0x123456789ABLL;
+    }
+
+private:
+    template <typename... Args>
+    uint32_t call(const char* format, uint32_t result, Args... args) {
+        char text[128];
+        snprintf(text, sizeof text, format, args...);
+        emit("CALL %s\n", text);
+        return result;
+    }
+    uint32_t flood(int32_t count) {
+        int sent = 0;
+        int dropped = 0;
+        const sp<IBinder> client = android::IInterface::asBinder(mClient);
+        for (int32_t i = 0; client != nullptr && i < count; ++i) {
+            Parcel data;
+            data.writeInterfaceToken(ICTavoPlayerClient::descriptor);
+            data.writeInt32(i);
+            const auto err = client->transact(ICTavoPlayerClient::ON_SEEKED, data, nullptr,
+                                              IBinder::FLAG_ONEWAY);
+            (err == android::OK ? sent : dropped)++;
+        }
+        emit("CALL flood sent=%d dropped=%d\n", sent, dropped);
+        return 0;
+    }
+    sp<ICTavoPlayerClient> mClient;
+};
+
+TEST(ServiceProcess, Serve) {
+    if (getenv(kChildEnv) == nullptr)
+        GTEST_SKIP() << "runs only as the service process of the protocol tests";
+    setTraceSink([](const TraceRecord& record) { emit("LOG %s", record.text.c_str()); });
+    sp<RecordingService> service = new RecordingService();
+    if (android::defaultServiceManager()->addService(String16("TavoPlayer"), service) != 0)
+        _exit(3);
+    emit("READY\n");
+    char byte;
+    while (read(0, &byte, 1) > 0) {
+    }
+    _exit(0);  // the parent closed our input: done, without gtest's own output
+}
+
+// ---- the test process -----------------------------------------------------------
+
+// The service process, with its output collected line by line.
+class ServiceChild {
+public:
+    explicit ServiceChild(const std::string& dir) {
+        std::vector<std::string> env;
+        for (char** e = environ; *e != nullptr; ++e)
+            env.emplace_back(*e);
+        env.push_back(std::string(kChildEnv) + "=1");
+        env.push_back("TAVOPLAYER_SERVICE_DIR=" + dir);
+        env.push_back("TAVOPLAYER_PROP_tavoplayer_video_sink=null");
+        std::vector<char*> envp;
+        for (std::string& s : env)
+            envp.push_back(s.data());
+        envp.push_back(nullptr);
+        char arg0[] = "service";
+        char arg1[] = "--gtest_filter=ServiceProcess.Serve";
+        char* argv[] = {arg0, arg1, nullptr};
+        int in[2], out[2];
+        if (pipe2(in, O_CLOEXEC) != 0 || pipe2(out, O_CLOEXEC) != 0)
+            return;
+        mPid = fork();
+        if (mPid == 0) {
+            dup2(in[0], 0);
+            dup2(out[1], 1);
+            execve("/proc/self/exe", argv, envp.data());
+            _exit(127);
+        }
+        ::close(in[0]);
+        ::close(out[1]);
+        mInput = in[1];
+        mOutput = out[0];
+        mReader = std::thread([this] { readLines(); });
+    }
+    ~ServiceChild() {
+        if (mInput >= 0)
+            ::close(mInput);
+        if (mPid > 0) {
+            int status;
+            for (int i = 0; i < 100 && waitpid(mPid, &status, WNOHANG) == 0; ++i)
+                std::this_thread::sleep_for(50ms);
+            if (kill(mPid, SIGKILL) == 0)
+                waitpid(mPid, &status, 0);
+        }
+        if (mReader.joinable())
+            mReader.join();
+        if (mOutput >= 0)
+            ::close(mOutput);
+    }
+    pid_t pid() const { return mPid; }
+
+    // The next line starting with `prefix` (others are skipped), or "" at the deadline.
+    std::string next(const std::string& prefix) {
+        std::unique_lock<std::mutex> lock(mLock);
+        const auto deadline = std::chrono::steady_clock::now() + 30s;
+        for (;;) {
+            while (!mLines.empty()) {
+                std::string line = std::move(mLines.front());
+                mLines.pop_front();
+                if (line.rfind(prefix, 0) == 0)
+                    return line.substr(prefix.size());
+                if (line.rfind("LOG ", 0) == 0)
+                    mLogs.push_back(line);
+            }
+            if (mEnded || mCv.wait_until(lock, deadline) == std::cv_status::timeout)
+                return "";
+        }
+    }
+    // Whether the service logged `text`, waiting for it up to the deadline.
+    bool logged(const std::string& text) {
+        std::unique_lock<std::mutex> lock(mLock);
+        const auto deadline = std::chrono::steady_clock::now() + 30s;
+        for (;;) {
+            for (auto it = mLines.begin(); it != mLines.end();) {
+                if (it->rfind("LOG ", 0) == 0) {
+                    mLogs.push_back(std::move(*it));
+                    it = mLines.erase(it);
+                } else {
+                    ++it;
+                }
+            }
+            for (const std::string& line : mLogs) {
+                if (line.find(text) != std::string::npos)
+                    return true;
+            }
+            if (mEnded || mCv.wait_until(lock, deadline) == std::cv_status::timeout)
+                return false;
+        }
+    }
+
+private:
+    void readLines() {
+        std::string partial;
+        char buffer[4096];
+        ssize_t n;
+        while ((n = ::read(mOutput, buffer, sizeof buffer)) > 0) {
+            std::lock_guard<std::mutex> lock(mLock);
+            partial.append(buffer, static_cast<size_t>(n));
+            size_t eol;
+            while ((eol = partial.find('\n')) != std::string::npos) {
+                mLines.push_back(partial.substr(0, eol));
+                partial.erase(0, eol + 1);
+            }
+            mCv.notify_all();
+        }
+        std::lock_guard<std::mutex> lock(mLock);
+        mEnded = true;
+        mCv.notify_all();
+    }
+
+    pid_t mPid = -1;
+    int mInput = -1;
+    int mOutput = -1;
+    std::thread mReader;
+    std::mutex mLock;
+    std::condition_variable mCv;
+    std::deque<std::string> mLines;
+    std::vector<std::string> mLogs;
+    bool mEnded = false;
+};
+
+class ServiceProtocolTest : public ::testing::Test {
+protected:
+    void SetUp() override {
+        char dir[] = "/tmp/tavo-binder-XXXXXX";
+        ASSERT_NE(nullptr, mkdtemp(dir));
+        mDir = dir;
+        setenv("TAVOPLAYER_SERVICE_DIR", dir, 1);
+        child = std::make_unique<ServiceChild>(mDir);
+        ASSERT_EQ("", child->next("READY"));
+        service = android::defaultServiceManager()->checkService(String16("TavoPlayer"));
+        ASSERT_NE(nullptr, service);
+    }
+    void TearDown() override {
+        service.clear();
+        child.reset();
+        std::filesystem::remove_all(mDir);
+    }
+
+    std::string mDir;
+    std::unique_ptr<ServiceChild> child;
+    sp<IBinder> service;
+};
+
+// One request: arguments after the token, the call the service saw, the reply.
+struct Arg {
+    enum Kind { INT, UINT, TEXT, BINDER } kind;
+    int32_t value = 0;
+    const char* text = nullptr;
+};
+Arg I(int32_t v) { return {Arg::INT, v}; }
+Arg U(uint32_t v) { return {Arg::UINT, static_cast<int32_t>(v)}; }
+Arg S(const char* t) { return {Arg::TEXT, 0, t}; }
+Arg B(bool present) { return {Arg::BINDER, present ? 1 : 0}; }
+
+enum ReplyKind { NONE, INT32, INT64 };
+
+struct Request {
+    uint32_t code;
+    std::vector<Arg> args;
+    const char* call;  // null: the service must not be called
+    android::status_t status;
+    ReplyKind reply;
+    int64_t value;
+    bool token = true;
+};
+
+TEST_F(ServiceProtocolTest, EveryCodeReadsItsArgumentsInOrderAndReplies) {
+    sp<IBinder> token = new android::BBinder();
+    const android::status_t unknown = android::UNKNOWN_TRANSACTION;
+    const std::vector<Request> table = {
+        {1, {B(true)}, "registerClient(client)", 0, NONE, 0},
+        {2, {}, "start()", 0, NONE, 0},
+        {3, {}, "stop()", 0, NONE, 0},
+        {4, {}, "pause()", 0, NONE, 0},
+        {5, {}, "resume()", 0, NONE, 0},
+        {6, {I(1500)}, "seek(1500)", 0, NONE, 0},
+        {7, {I(5), S("MTV://a?pcr=256")}, "openUri(MTV://a?pcr=256,5)", 0, NONE, 0},
+        {8, {}, "close()", 0, NONE, 0},
+        {9, {S("sf"), S(""), I(3), U(0xffffffffu), B(false)}, "setSurface(null)", 0, INT32, 109},
+        {9, {S("sf"), S("x"), I(0), U(0), B(true)}, "setSurface(surface)", 0, INT32, 109},
+        {10, {I(0), I(0)}, "getFrame(0,0)", 0, NONE, 0},
+        {11, {I(2), I(-5)}, "setSoundEffect(2,-5)", 0, INT32, 111},
+        {12, {I(1)}, nullptr, unknown, NONE, 0},
+        {13, {S("MTV://rec")}, "startRecorder(MTV://rec)", 0, INT32, 113},
+        {14, {I(1)}, "stopRecorder(1)", 0, INT32, 114},
+        {15, {}, nullptr, unknown, NONE, 0},
+        {16, {}, nullptr, unknown, NONE, 0},
+        {17, {I(150)}, "setAVSync(150)", 0, INT32, 117},
+        {18, {I(-3)}, "setCaptionSync(-3)", 0, INT32, 118},
+        {19, {I(2)}, "setCaptionLanguage(2)", 0, NONE, 0},
+        {20, {I(0)}, "setAudioEnable(0)", 0, NONE, 0},
+        {21, {I(0x111)}, "setAudioPID(273)", 0, NONE, 0},
+        {22, {I(1)}, "setAudioPathForce(1)", 0, NONE, 0},
+        {23, {I(0x130)}, "setCCPID(304)", 0, NONE, 0},
+        {24, {}, "getFrameRate()", 0, INT32, 124},
+        {25, {}, "getState()", 0, INT32, 125},
+        {26, {I(1), I(2), I(3), I(4), I(5)}, "setCropRect(1,2,3,4,5)", 0, INT32, 126},
+        {27, {I(1)}, "setAudioOnlyMode(1)", 0, INT32, 127},
+        {28, {}, "getPCRValue()", 0, INT64, 0x123456789ABLL},
+        {29, {}, nullptr, unknown, NONE, 0},
+        // A request too short for its arguments is refused without a call.
+        {26, {I(1), I(2)}, nullptr, android::BAD_VALUE, NONE, 0},
+        {2, {}, nullptr, -1, NONE, 0, false},
+        // The last row calls, so no stray call from the rows above goes unseen.
+        {2, {}, "start()", 0, NONE, 0},
+    };
+    for (const Request& row : table) {
+        SCOPED_TRACE("code " + std::to_string(row.code));
+        Parcel data, reply;
+        data.writeInterfaceToken(String16(row.token ? "TavoPlayer" : "TavoPlayerX"));
+        for (const Arg& arg : row.args) {
+            if (arg.kind == Arg::INT)
+                data.writeInt32(arg.value);
+            else if (arg.kind == Arg::UINT)
+                data.writeUint32(static_cast<uint32_t>(arg.value));
+            else if (arg.kind == Arg::TEXT)
+                data.writeString16(String16(arg.text));
+            else
+                data.writeStrongBinder(arg.value != 0 ? token : nullptr);
+        }
+        EXPECT_EQ(row.status, service->transact(row.code, data, &reply));
+        if (row.call != nullptr) {
+            EXPECT_EQ(row.call, child->next("CALL "));
+        }
+        const size_t replyBytes = row.reply == NONE ? 0 : row.reply == INT32 ? 4 : 8;
+        EXPECT_EQ(replyBytes, reply.dataSize());
+        if (row.reply == INT32) {
+            EXPECT_EQ(row.value, reply.readInt32());
+        } else if (row.reply == INT64) {
+            EXPECT_EQ(row.value, reply.readInt64());
+        }
+    }
+    EXPECT_TRUE(child->logged("Call incorrectly routed to ICTavoPlayer"));
+}
+
+// The client side of the callbacks, recording what arrives.
+class RecordingClient : public BnCTavoPlayerClient {
+public:
+    void openUriComplete(int32_t) override {}
+    void startComplete(int32_t) override {}
+    void onCaptureFrame(uint8_t* data, int32_t width, int32_t height, int32_t) override {
+        std::lock_guard<std::mutex> lock(mLock);
+        pixels.assign(data, data + static_cast<size_t>(width) * height * 4);
+    }
+    void onSignalStatusChanged(int32_t, int32_t) override {}
+    void closedCaptionText(const uint8_t*, int32_t) override {}
+    void onStopComplete(int32_t) override {}
+    void onError(int32_t) override {}
+    void onBufferingBegin() override {}
+    void onBufferingEnd() override {}
+    void onBuffering(int32_t) override {}
+    void onAudioSessionId(int32_t) override {}
+    void onStartVideoTask(int32_t, int32_t) override {}
+    void onTimeUpdate(int32_t) override {}
+    void onEndOfContent() override {}
+    void onRecorderStarted(int32_t) override {}
+    void onRecorderStopped(int32_t) override {}
+    void onPaused(int32_t) override {}
+    void onResumed(int32_t) override {}
+    void onSeeked(int32_t) override {}
+
+    bool waitFrame() {
+        std::unique_lock<std::mutex> lock(mLock);
+        return mCv.wait_for(lock, 30s, [&] { return !pixels.empty(); });
+    }
+    std::mutex mLock;
+    std::condition_variable mCv;
+    std::vector<uint8_t> pixels;
+    off_t regionBytes = -1;
+    int writableMapErrno = 0;
+
+protected:
+    void onCaptureFrameRegion(int fd, int32_t width, int32_t height, int32_t flag) override {
+        struct stat st{};
+        fstat(fd, &st);
+        void* rw = mmap(nullptr, 4096, PROT_READ | PROT_WRITE, MAP_SHARED, fd, 0);
+        const int err = rw == MAP_FAILED ? errno : 0;
+        if (rw != MAP_FAILED)
+            munmap(rw, 4096);
+        BnCTavoPlayerClient::onCaptureFrameRegion(fd, width, height, flag);
+        std::lock_guard<std::mutex> lock(mLock);
+        regionBytes = st.st_size;
+        writableMapErrno = err;
+        mCv.notify_all();
+    }
+};
+
+TEST_F(ServiceProtocolTest, CaptureArrivesAsAReadOnlyRegionThroughTheProxy) {
+    sp<RecordingClient> client = new RecordingClient();
+    sp<ICTavoPlayer> player = android::interface_cast<ICTavoPlayer>(service);
+    ASSERT_EQ(0u, player->registerClient(client));
+    EXPECT_EQ("registerClient(client)", child->next("CALL "));
+    ASSERT_EQ(0u, player->getFrame(320, 240));
+    EXPECT_EQ("getFrame(320,240)", child->next("CALL "));
+    ASSERT_TRUE(client->waitFrame());
+    std::lock_guard<std::mutex> lock(client->mLock);
+    EXPECT_EQ(307200, client->regionBytes);
+    EXPECT_EQ(EACCES, client->writableMapErrno);
+    ASSERT_EQ(307200u, client->pixels.size());
+    for (size_t i = 0; i < client->pixels.size(); i += 997)
+        ASSERT_EQ(static_cast<uint8_t>(i * 7), client->pixels[i]) << "byte " << i;
+}
+
+// A client that registers by hand and then never reads its socket: the service's
+// one-way callbacks fill the bounded queue and the rest are refused, and the
+// service's thread carries on.
+TEST_F(ServiceProtocolTest, ClientThatNeverReadsDoesNotBlockTheService) {
+    const int fd = socket(AF_UNIX, SOCK_SEQPACKET | SOCK_CLOEXEC, 0);
+    sockaddr_un addr{};
+    addr.sun_family = AF_UNIX;
+    snprintf(addr.sun_path, sizeof addr.sun_path, "%s/TavoPlayer", mDir.c_str());
+    ASSERT_EQ(0, connect(fd, reinterpret_cast<sockaddr*>(&addr), sizeof addr));
+    auto frame = [](uint32_t code, uint64_t tid, const Parcel& body, bool withBinder) {
+        // The frame layout of docs/protocol.md, built without the library.
+        std::vector<uint8_t> f(40 + body.dataSize() + (withBinder ? 4 : 0), 0);
+        const uint32_t header[] = {0x31425654, 1, 0, code, 1, 0, static_cast<uint32_t>(tid), 0,
+                                   static_cast<uint32_t>(body.dataSize()), withBinder ? 1u : 0u};
+        memcpy(f.data(), header, sizeof header);
+        memcpy(f.data() + 40, body.data(), body.dataSize());
+        if (withBinder) {
+            const uint32_t offset = static_cast<uint32_t>(body.dataSize() - 24);
+            const uint32_t flat[] = {0x73622a85, 0, 2, 0, 0, 0};  // our object, id 2
+            memcpy(f.data() + 40 + offset, flat, sizeof flat);
+            memcpy(f.data() + 40 + body.dataSize(), &offset, 4);
+        }
+        return f;
+    };
+    Parcel reg;
+    reg.writeInterfaceToken(String16("TavoPlayer"));
+    reg.write(std::vector<uint8_t>(24, 0).data(), 24);
+    const std::vector<uint8_t> f1 = frame(1, 1, reg, true);
+    ASSERT_EQ(static_cast<ssize_t>(f1.size()), send(fd, f1.data(), f1.size(), 0));
+    EXPECT_EQ("registerClient(client)", child->next("CALL "));
+    Parcel flood;
+    flood.writeInterfaceToken(String16("TavoPlayer"));
+    flood.writeInt32(5000);
+    const std::vector<uint8_t> f2 = frame(19, 2, flood, false);
+    ASSERT_EQ(static_cast<ssize_t>(f2.size()), send(fd, f2.data(), f2.size(), 0));
+    const std::string result = child->next("CALL flood ");
+    int sent = -1, dropped = -1;
+    ASSERT_EQ(2, sscanf(result.c_str(), "sent=%d dropped=%d", &sent, &dropped)) << result;
+    EXPECT_EQ(5000, sent + dropped);
+    EXPECT_GT(dropped, 0);
+    EXPECT_GE(sent, 256);  // at least the queue's worth was taken
+    ::close(fd);
+}
+
+TEST_F(ServiceProtocolTest, KilledServiceIsReportedDead) {
+    struct Recipient : IBinder::DeathRecipient {
+        void binderDied(const android::wp<IBinder>&) override {
+            std::lock_guard<std::mutex> lock(mLock);
+            died = true;
+            mCv.notify_all();
+        }
+        std::mutex mLock;
+        std::condition_variable mCv;
+        bool died = false;
+    };
+    sp<Recipient> recipient = new Recipient();
+    ASSERT_EQ(android::OK, service->linkToDeath(recipient));
+    ASSERT_EQ(0, kill(child->pid(), SIGKILL));
+    std::unique_lock<std::mutex> lock(recipient->mLock);
+    EXPECT_TRUE(recipient->mCv.wait_for(lock, 30s, [&] { return recipient->died; }));
+    Parcel data, reply;
+    data.writeInterfaceToken(String16("TavoPlayer"));
+    EXPECT_EQ(android::DEAD_OBJECT, service->transact(ICTavoPlayer::START, data, &reply));
+}
+
+}  // namespace
+}  // namespace TavoPlayer

@@ -181,7 +181,8 @@ public:
         const auto socket = mSecondsPerIteration.find("BM_SocketPingPong/real_time");
         if (binder != mSecondsPerIteration.end() && socket != mSecondsPerIteration.end()) {
             std::printf("round trip: binder %.1f us, socket ping-pong %.1f us, ratio %.2f\n",
-                        binder->second * 1e6, socket->second * 1e6, socket->second / binder->second);
+                        binder->second * 1e6, socket->second * 1e6,
+                        socket->second / binder->second);
         }
         const auto oneway = mRate.find("BM_BinderOneway/real_time");
         const auto plain = mRate.find("BM_SocketOneway/real_time");

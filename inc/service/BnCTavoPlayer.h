@@ -14,8 +14,8 @@ class BnCTavoPlayer : public android::BnInterface<ICTavoPlayer> {
 public:
     // A wrong token gives -1 as the transaction status (nothing is called). A request
     // too short for its arguments gives BAD_VALUE, also without a call.
-    android::status_t onTransact(uint32_t code, const android::Parcel& data,
-                                 android::Parcel* reply, uint32_t flags = 0) override;
+    android::status_t onTransact(uint32_t code, const android::Parcel& data, android::Parcel* reply,
+                                 uint32_t flags = 0) override;
 };
 
 }  // namespace TavoPlayer

@@ -15,8 +15,8 @@ namespace TavoPlayer {
 
 class BnCTavoPlayerClient : public android::BnInterface<ICTavoPlayerClient> {
 public:
-    android::status_t onTransact(uint32_t code, const android::Parcel& data,
-                                 android::Parcel* reply, uint32_t flags = 0) override;
+    android::status_t onTransact(uint32_t code, const android::Parcel& data, android::Parcel* reply,
+                                 uint32_t flags = 0) override;
 
 protected:
     // `fd` is the parcel's: valid during the call only.

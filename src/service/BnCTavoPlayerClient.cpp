@@ -18,7 +18,7 @@ using android::status_t;
 void BnCTavoPlayerClient::onCaptureFrameRegion(int fd, int32_t width, int32_t height,
                                                int32_t flag) {
     const int64_t len = static_cast<int64_t>(width) * height * (flag != 0 ? 2 : 4);
-    struct stat st{};
+    struct stat st {};
     if (width <= 0 || height <= 0 || fstat(fd, &st) != 0 || st.st_size < len) {
         TAVO_LOGE("%s: frame region too small for %dx%d\n", __func__, width, height);
         return;
@@ -49,8 +49,12 @@ status_t BnCTavoPlayerClient::onTransact(uint32_t code, const Parcel& data, Parc
             return BAD_VALUE;
     }
     switch (code) {
-        case OPEN_URI_COMPLETE: openUriComplete(v[0]); break;
-        case START_COMPLETE: startComplete(v[0]); break;
+        case OPEN_URI_COMPLETE:
+            openUriComplete(v[0]);
+            break;
+        case START_COMPLETE:
+            startComplete(v[0]);
+            break;
         case CLOSED_CAPTION_TEXT: {
             // The length comes twice; both must agree before the bytes are trusted.
             if (v[0] != v[1] || v[0] < 0)
@@ -68,21 +72,51 @@ status_t BnCTavoPlayerClient::onTransact(uint32_t code, const Parcel& data, Parc
             onCaptureFrameRegion(fd, v[0], v[1], v[2]);
             break;
         }
-        case ON_SIGNAL_STATUS_CHANGED: onSignalStatusChanged(v[0], v[1]); break;
-        case ON_STOP_COMPLETE: onStopComplete(v[0]); break;
-        case ON_ERROR: onError(v[0]); break;
-        case ON_BUFFERING_BEGIN: onBufferingBegin(); break;
-        case ON_BUFFERING_END: onBufferingEnd(); break;
-        case ON_BUFFERING: onBuffering(v[0]); break;
-        case ON_AUDIO_SESSION_ID: onAudioSessionId(v[0]); break;
-        case ON_START_VIDEO_TASK: onStartVideoTask(v[0], v[1]); break;
-        case ON_TIME_UPDATE: onTimeUpdate(v[0]); break;
-        case ON_END_OF_CONTENT: onEndOfContent(); break;
-        case ON_RECORDER_STARTED: onRecorderStarted(v[0]); break;
-        case ON_RECORDER_STOPPED: onRecorderStopped(v[0]); break;
-        case ON_PAUSED: onPaused(v[0]); break;
-        case ON_RESUMED: onResumed(v[0]); break;
-        case ON_SEEKED: onSeeked(v[0]); break;
+        case ON_SIGNAL_STATUS_CHANGED:
+            onSignalStatusChanged(v[0], v[1]);
+            break;
+        case ON_STOP_COMPLETE:
+            onStopComplete(v[0]);
+            break;
+        case ON_ERROR:
+            onError(v[0]);
+            break;
+        case ON_BUFFERING_BEGIN:
+            onBufferingBegin();
+            break;
+        case ON_BUFFERING_END:
+            onBufferingEnd();
+            break;
+        case ON_BUFFERING:
+            onBuffering(v[0]);
+            break;
+        case ON_AUDIO_SESSION_ID:
+            onAudioSessionId(v[0]);
+            break;
+        case ON_START_VIDEO_TASK:
+            onStartVideoTask(v[0], v[1]);
+            break;
+        case ON_TIME_UPDATE:
+            onTimeUpdate(v[0]);
+            break;
+        case ON_END_OF_CONTENT:
+            onEndOfContent();
+            break;
+        case ON_RECORDER_STARTED:
+            onRecorderStarted(v[0]);
+            break;
+        case ON_RECORDER_STOPPED:
+            onRecorderStopped(v[0]);
+            break;
+        case ON_PAUSED:
+            onPaused(v[0]);
+            break;
+        case ON_RESUMED:
+            onResumed(v[0]);
+            break;
+        case ON_SEEKED:
+            onSeeked(v[0]);
+            break;
     }
     return OK;
 }

@@ -93,20 +93,22 @@ INSTANTIATE_TEST_SUITE_P(
         CallbackCase{"openUriComplete", [](auto& c) { c.openUriComplete(-7); }, 1, {-7}},
         CallbackCase{"startComplete", [](auto& c) { c.startComplete(1); }, 2, {1}},
         // The length twice, then the bytes padded to 4: 'A',0,0,0 and 'b',0,0,0.
-        CallbackCase{"closedCaptionText", [](auto& c) { c.closedCaptionText(kText, 6); }, 3,
+        CallbackCase{"closedCaptionText",
+                     [](auto& c) { c.closedCaptionText(kText, 6); },
+                     3,
                      {6, 6, 'A', 'b'}},
-        CallbackCase{"closedCaptionText_empty", [](auto& c) { c.closedCaptionText(nullptr, 0); },
-                     3, {0, 0}},
-        CallbackCase{"onSignalStatusChanged", [](auto& c) { c.onSignalStatusChanged(2, 5); }, 5,
-                     {2, 5}},
+        CallbackCase{
+            "closedCaptionText_empty", [](auto& c) { c.closedCaptionText(nullptr, 0); }, 3, {0, 0}},
+        CallbackCase{
+            "onSignalStatusChanged", [](auto& c) { c.onSignalStatusChanged(2, 5); }, 5, {2, 5}},
         CallbackCase{"onStopComplete", [](auto& c) { c.onStopComplete(0); }, 6, {0}},
         CallbackCase{"onError", [](auto& c) { c.onError(0x41001); }, 7, {0x41001}},
         CallbackCase{"onBufferingBegin", [](auto& c) { c.onBufferingBegin(); }, 8, {}},
         CallbackCase{"onBufferingEnd", [](auto& c) { c.onBufferingEnd(); }, 9, {}},
         CallbackCase{"onBuffering", [](auto& c) { c.onBuffering(40); }, 10, {40}},
         CallbackCase{"onAudioSessionId", [](auto& c) { c.onAudioSessionId(33); }, 11, {33}},
-        CallbackCase{"onStartVideoTask", [](auto& c) { c.onStartVideoTask(1920, 1080); }, 12,
-                     {1920, 1080}},
+        CallbackCase{
+            "onStartVideoTask", [](auto& c) { c.onStartVideoTask(1920, 1080); }, 12, {1920, 1080}},
         CallbackCase{"onTimeUpdate", [](auto& c) { c.onTimeUpdate(61); }, 13, {61}},
         CallbackCase{"onEndOfContent", [](auto& c) { c.onEndOfContent(); }, 14, {}},
         CallbackCase{"onRecorderStarted", [](auto& c) { c.onRecorderStarted(0); }, 15, {0}},
@@ -135,11 +137,12 @@ TEST(CaptureFrameRegionTest, SizedByTheFlagAndReadOnly) {
         const RawClient::Call& call = raw->calls[0];
         EXPECT_EQ((std::vector<int32_t>{320, 240, size.flag != 0 ? 1 : 0}), call.ints);
         ASSERT_GE(call.fd, 0);
-        struct stat st{};
+        struct stat st {};
         ASSERT_EQ(0, fstat(call.fd, &st));
         EXPECT_EQ(size.bytes, st.st_size);
         EXPECT_EQ(MAP_FAILED, mmap(nullptr, 4096, PROT_READ | PROT_WRITE, MAP_SHARED, call.fd, 0));
-        void* map = mmap(nullptr, static_cast<size_t>(size.bytes), PROT_READ, MAP_SHARED, call.fd, 0);
+        void* map =
+            mmap(nullptr, static_cast<size_t>(size.bytes), PROT_READ, MAP_SHARED, call.fd, 0);
         ASSERT_NE(MAP_FAILED, map);
         EXPECT_EQ(0, memcmp(map, pixels.data(), pixels.size()));
         munmap(map, static_cast<size_t>(size.bytes));

@@ -91,7 +91,9 @@ public:
         }
         return 0;
     }
-    uint32_t setSoundEffect(int32_t e, int32_t o) override { return call("setSoundEffect(%d,%d)", 111, e, o); }
+    uint32_t setSoundEffect(int32_t e, int32_t o) override {
+        return call("setSoundEffect(%d,%d)", 111, e, o);
+    }
     uint32_t startRecorder(const char* uri) override {
         emit("CALL startRecorder(%s)\n", uri);
         return 113;
@@ -106,7 +108,9 @@ public:
         return call("setCaptionLanguage(%d)", 0, language);
     }
     uint32_t setAudioPID(int32_t pid) override { return call("setAudioPID(%d)", 0, pid); }
-    int32_t setAudioPathForce(int32_t mode) override { return call("setAudioPathForce(%d)", 0, mode); }
+    int32_t setAudioPathForce(int32_t mode) override {
+        return call("setAudioPathForce(%d)", 0, mode);
+    }
     uint32_t setCCPID(int32_t pid) override { return call("setCCPID(%d)", 0, pid); }
     int32_t getFrameRate() override { return call("getFrameRate()", 124); }
     uint32_t setCropRect(int32_t a, int32_t b, int32_t c, int32_t d, int32_t e) override {
@@ -309,10 +313,18 @@ struct Arg {
     int32_t value = 0;
     const char* text = nullptr;
 };
-Arg I(int32_t v) { return {Arg::INT, v}; }
-Arg U(uint32_t v) { return {Arg::UINT, static_cast<int32_t>(v)}; }
-Arg S(const char* t) { return {Arg::TEXT, 0, t}; }
-Arg B(bool present) { return {Arg::BINDER, present ? 1 : 0}; }
+Arg I(int32_t v) {
+    return {Arg::INT, v};
+}
+Arg U(uint32_t v) {
+    return {Arg::UINT, static_cast<int32_t>(v)};
+}
+Arg S(const char* t) {
+    return {Arg::TEXT, 0, t};
+}
+Arg B(bool present) {
+    return {Arg::BINDER, present ? 1 : 0};
+}
 
 enum ReplyKind { NONE, INT32, INT64 };
 
@@ -433,7 +445,7 @@ public:
 
 protected:
     void onCaptureFrameRegion(int fd, int32_t width, int32_t height, int32_t flag) override {
-        struct stat st{};
+        struct stat st {};
         fstat(fd, &st);
         void* rw = mmap(nullptr, 4096, PROT_READ | PROT_WRITE, MAP_SHARED, fd, 0);
         const int err = rw == MAP_FAILED ? errno : 0;
@@ -475,8 +487,16 @@ TEST_F(ServiceProtocolTest, ClientThatNeverReadsDoesNotBlockTheService) {
     auto frame = [](uint32_t code, uint64_t tid, const Parcel& body, bool withBinder) {
         // The frame layout of docs/protocol.md, built without the library.
         std::vector<uint8_t> f(40 + body.dataSize() + (withBinder ? 4 : 0), 0);
-        const uint32_t header[] = {0x31425654, 1, 0, code, 1, 0, static_cast<uint32_t>(tid), 0,
-                                   static_cast<uint32_t>(body.dataSize()), withBinder ? 1u : 0u};
+        const uint32_t header[] = {0x31425654,
+                                   1,
+                                   0,
+                                   code,
+                                   1,
+                                   0,
+                                   static_cast<uint32_t>(tid),
+                                   0,
+                                   static_cast<uint32_t>(body.dataSize()),
+                                   withBinder ? 1u : 0u};
         memcpy(f.data(), header, sizeof header);
         memcpy(f.data() + 40, body.data(), body.dataSize());
         if (withBinder) {

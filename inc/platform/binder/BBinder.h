@@ -15,8 +15,7 @@ public:
     bool isBinderAlive() const override { return true; }
     status_t pingBinder() override { return OK; }
     status_t dump(int fd, const Vector<String16>& args) override;
-    status_t transact(uint32_t code, const Parcel& data, Parcel* reply,
-                      uint32_t flags = 0) final;
+    status_t transact(uint32_t code, const Parcel& data, Parcel* reply, uint32_t flags = 0) final;
     status_t linkToDeath(const sp<DeathRecipient>& recipient, void* cookie = nullptr,
                          uint32_t flags = 0) override;
     status_t unlinkToDeath(const wp<DeathRecipient>& recipient, void* cookie = nullptr,

@@ -54,7 +54,8 @@ public:
     virtual status_t linkToDeath(const sp<DeathRecipient>& recipient, void* cookie = nullptr,
                                  uint32_t flags = 0) = 0;
     virtual status_t unlinkToDeath(const wp<DeathRecipient>& recipient, void* cookie = nullptr,
-                                   uint32_t flags = 0, wp<DeathRecipient>* outRecipient = nullptr) = 0;
+                                   uint32_t flags = 0,
+                                   wp<DeathRecipient>* outRecipient = nullptr) = 0;
 
     virtual BBinder* localBinder() { return nullptr; }
     virtual BpBinder* remoteBinder() { return nullptr; }

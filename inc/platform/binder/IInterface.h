@@ -26,29 +26,29 @@ inline sp<INTERFACE> interface_cast(const sp<IBinder>& obj) {
 
 }  // namespace android
 
-#define DECLARE_META_INTERFACE(INTERFACE)                                             \
-public:                                                                               \
-    static const ::android::String16 descriptor;                                      \
+#define DECLARE_META_INTERFACE(INTERFACE)                                                         \
+public:                                                                                           \
+    static const ::android::String16 descriptor;                                                  \
     static ::android::sp<I##INTERFACE> asInterface(const ::android::sp<::android::IBinder>& obj); \
-    virtual const ::android::String16& getInterfaceDescriptor() const;                \
-    I##INTERFACE();                                                                   \
+    virtual const ::android::String16& getInterfaceDescriptor() const;                            \
+    I##INTERFACE();                                                                               \
     ~I##INTERFACE() override;
 
-#define IMPLEMENT_META_INTERFACE(INTERFACE, NAME)                                     \
-    const ::android::String16 I##INTERFACE::descriptor(NAME);                         \
-    const ::android::String16& I##INTERFACE::getInterfaceDescriptor() const {         \
-        return I##INTERFACE::descriptor;                                              \
-    }                                                                                 \
-    ::android::sp<I##INTERFACE> I##INTERFACE::asInterface(                            \
-        const ::android::sp<::android::IBinder>& obj) {                               \
-        ::android::sp<I##INTERFACE> intr;                                             \
-        if (obj != nullptr) {                                                         \
-            intr = static_cast<I##INTERFACE*>(                                        \
-                obj->queryLocalInterface(I##INTERFACE::descriptor).get());            \
-            if (intr == nullptr)                                                      \
-                intr = new Bp##INTERFACE(obj);                                        \
-        }                                                                             \
-        return intr;                                                                  \
-    }                                                                                 \
-    I##INTERFACE::I##INTERFACE() = default;                                           \
+#define IMPLEMENT_META_INTERFACE(INTERFACE, NAME)                             \
+    const ::android::String16 I##INTERFACE::descriptor(NAME);                 \
+    const ::android::String16& I##INTERFACE::getInterfaceDescriptor() const { \
+        return I##INTERFACE::descriptor;                                      \
+    }                                                                         \
+    ::android::sp<I##INTERFACE> I##INTERFACE::asInterface(                    \
+        const ::android::sp<::android::IBinder>& obj) {                       \
+        ::android::sp<I##INTERFACE> intr;                                     \
+        if (obj != nullptr) {                                                 \
+            intr = static_cast<I##INTERFACE*>(                                \
+                obj->queryLocalInterface(I##INTERFACE::descriptor).get());    \
+            if (intr == nullptr)                                              \
+                intr = new Bp##INTERFACE(obj);                                \
+        }                                                                     \
+        return intr;                                                          \
+    }                                                                         \
+    I##INTERFACE::I##INTERFACE() = default;                                   \
     I##INTERFACE::~I##INTERFACE() = default;

@@ -35,13 +35,11 @@ status_t BBinder::linkToDeath(const sp<DeathRecipient>&, void*, uint32_t) {
     return INVALID_OPERATION;
 }
 
-status_t BBinder::unlinkToDeath(const wp<DeathRecipient>&, void*, uint32_t,
-                                wp<DeathRecipient>*) {
+status_t BBinder::unlinkToDeath(const wp<DeathRecipient>&, void*, uint32_t, wp<DeathRecipient>*) {
     return INVALID_OPERATION;
 }
 
-status_t BBinder::onTransact(uint32_t code, const Parcel& data, Parcel* reply,
-                             uint32_t /*flags*/) {
+status_t BBinder::onTransact(uint32_t code, const Parcel& data, Parcel* reply, uint32_t /*flags*/) {
     switch (code) {
         case INTERFACE_TRANSACTION:
             if (reply == nullptr)

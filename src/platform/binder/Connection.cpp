@@ -304,8 +304,8 @@ status_t Connection::send(Outgoing&& frame) {
         if (errno != EAGAIN && errno != EWOULDBLOCK)
             return DEAD_OBJECT;
     }
-    if (frame.oneway &&
-        (mQueuedOneway >= kMaxQueuedOneway || mQueuedBytes + frame.bytes.size() > kMaxQueuedBytes)) {
+    if (frame.oneway && (mQueuedOneway >= kMaxQueuedOneway ||
+                         mQueuedBytes + frame.bytes.size() > kMaxQueuedBytes)) {
         if (!mOverflowLogged) {
             TAVO_LOGW("%s: peer pid %d is not reading; one-way calls dropped\n", __func__,
                       static_cast<int>(mPeerPid));
@@ -352,8 +352,8 @@ status_t Connection::transact(uint64_t handle, uint32_t code, const Parcel& data
     }
     Outgoing frame;
     frame.oneway = oneway;
-    status_t err = flatten(CMD_TRANSACTION, flags & IBinder::FLAG_ONEWAY, code, handle, tid,
-                           &data, &frame);
+    status_t err =
+        flatten(CMD_TRANSACTION, flags & IBinder::FLAG_ONEWAY, code, handle, tid, &data, &frame);
     if (err == OK)
         err = send(std::move(frame));
     std::unique_lock<std::mutex> lock(mLock);
@@ -669,8 +669,9 @@ void Connection::ioLoop() {
                 break;
             wantIn = mOneway.size() < kMaxPendingIncoming;
         }
-        pollfd fds[2] = {{mFd, static_cast<short>((wantIn ? POLLIN : 0) | (wantOut ? POLLOUT : 0)), 0},
-                         {mWakeFd, POLLIN, 0}};
+        pollfd fds[2] = {
+            {mFd, static_cast<short>((wantIn ? POLLIN : 0) | (wantOut ? POLLOUT : 0)), 0},
+            {mWakeFd, POLLIN, 0}};
         const int n = poll(fds, 2, kPollMs);
         if (n < 0 && errno != EINTR)
             break;

@@ -17,7 +17,9 @@ namespace {
 // the "gather penalties" bit in every token it writes, and readers ignore the word.
 constexpr int32_t kStrictModePenaltyGather = 0x40 << 16;
 
-constexpr size_t pad4(size_t len) { return (len + 3) & ~size_t{3}; }
+constexpr size_t pad4(size_t len) {
+    return (len + 3) & ~size_t{3};
+}
 
 void putLe32(uint8_t* p, uint32_t v) {
     for (int i = 0; i < 4; ++i)

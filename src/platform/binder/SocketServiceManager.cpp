@@ -38,7 +38,7 @@ bool validName(const std::string& name) {
 status_t makeDirectory(const std::string& dir) {
     std::error_code ec;
     std::filesystem::create_directories(dir, ec);
-    struct stat st{};
+    struct stat st {};
     if (stat(dir.c_str(), &st) != 0 || !S_ISDIR(st.st_mode)) {
         TAVO_LOGE("%s: cannot create the service directory %s\n", "addService", dir.c_str());
         return PERMISSION_DENIED;

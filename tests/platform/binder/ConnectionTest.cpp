@@ -53,7 +53,8 @@ protected:
                 Parcel in, out;
                 in.writeInt32(41);
                 in.writeStrongBinder(nullptr);
-                const status_t err = target != nullptr ? target->transact(ECHO, in, &out) : BAD_VALUE;
+                const status_t err =
+                    target != nullptr ? target->transact(ECHO, in, &out) : BAD_VALUE;
                 reply->writeInt32(err == OK ? out.readInt32() : err);
                 return OK;
             }

@@ -29,12 +29,13 @@ TEST(ParcelEncodingTest, BytesOnTheWire) {
     const std::vector<uint8_t> expected = {
         0xfe, 0xff, 0xff, 0xff,                          // int32 -2
         0x08, 0x07, 0x06, 0x05, 0x04, 0x03, 0x02, 0x01,  // int64, little-endian
-        2, 0, 0, 0, 'A', 0, 'b', 0, 0, 0, 0, 0,          // "Ab": length, units, 0 unit, pad
-        0, 0, 0, 0, 0, 0, 0, 0,                          // "": length 0, 0 unit, pad
-        0xff, 0xff, 0xff, 0xff,                          // null string
-        3, 0, 0, 0, 'x', 'y', 'z', 0,                    // 8-bit "xyz" and its 0
-        0, 0, 0x40, 0,                                   // strict-mode word of a token
-        1, 0, 0, 0, 'T', 0, 0, 0,                        // descriptor "T"
+        2,    0,    0,    0,    'A',  0,    'b',  0,
+        0,    0,    0,    0,                          // "Ab": length, units, 0 unit, pad
+        0,    0,    0,    0,    0,    0,    0,    0,  // "": length 0, 0 unit, pad
+        0xff, 0xff, 0xff, 0xff,                       // null string
+        3,    0,    0,    0,    'x',  'y',  'z',  0,  // 8-bit "xyz" and its 0
+        0,    0,    0x40, 0,                          // strict-mode word of a token
+        1,    0,    0,    0,    'T',  0,    0,    0,  // descriptor "T"
     };
     EXPECT_EQ(expected, bytesOf(p));
 
@@ -112,13 +113,15 @@ INSTANTIATE_TEST_SUITE_P(
         ShortReadCase{"int32_of_3_bytes", {1, 2, 3}, readI32, NOT_ENOUGH_DATA},
         ShortReadCase{"int64_of_4_bytes", {1, 2, 3, 4}, readI64, NOT_ENOUGH_DATA},
         ShortReadCase{"string16_units_missing", {5, 0, 0, 0, 'a', 0}, readS16, NOT_ENOUGH_DATA},
-        ShortReadCase{"string16_length_huge", {0xff, 0xff, 0xff, 0x7f, 'a', 0, 0, 0}, readS16,
+        ShortReadCase{"string16_length_huge",
+                      {0xff, 0xff, 0xff, 0x7f, 'a', 0, 0, 0},
+                      readS16,
                       NOT_ENOUGH_DATA},
         ShortReadCase{"string16_negative_length", {0xfe, 0xff, 0xff, 0xff}, readS16, BAD_VALUE},
-        ShortReadCase{"string16_without_terminator", {1, 0, 0, 0, 'a', 0, 'b', 0}, readS16,
-                      NOT_ENOUGH_DATA},
-        ShortReadCase{"string8_bytes_missing", {9, 0, 0, 0, 'a', 'b', 'c', 'd'}, readS8,
-                      NOT_ENOUGH_DATA},
+        ShortReadCase{
+            "string16_without_terminator", {1, 0, 0, 0, 'a', 0, 'b', 0}, readS16, NOT_ENOUGH_DATA},
+        ShortReadCase{
+            "string8_bytes_missing", {9, 0, 0, 0, 'a', 'b', 'c', 'd'}, readS8, NOT_ENOUGH_DATA},
         ShortReadCase{"binder_from_plain_data", std::vector<uint8_t>(24, 0), readBinder, BAD_TYPE},
         ShortReadCase{"binder_past_end", {0x85, 0x2a, 0x62, 0x73}, readBinder, NOT_ENOUGH_DATA},
         ShortReadCase{"fd_from_plain_data", std::vector<uint8_t>(24, 0), readFd, BAD_TYPE},

@@ -435,13 +435,14 @@ public:
 
     bool waitFrame() {
         std::unique_lock<std::mutex> lock(mLock);
-        return mCv.wait_for(lock, 30s, [&] { return !pixels.empty(); });
+        return mCv.wait_for(lock, 30s, [&] { return done; });
     }
     std::mutex mLock;
     std::condition_variable mCv;
     std::vector<uint8_t> pixels;
     off_t regionBytes = -1;
     int writableMapErrno = 0;
+    bool done = false;
 
 protected:
     void onCaptureFrameRegion(int fd, int32_t width, int32_t height, int32_t flag) override {
@@ -455,6 +456,7 @@ protected:
         std::lock_guard<std::mutex> lock(mLock);
         regionBytes = st.st_size;
         writableMapErrno = err;
+        done = true;
         mCv.notify_all();
     }
 };

@@ -46,6 +46,11 @@ public:
     unsigned int getDecodableUnit(void* buffer, unsigned long size, unsigned long* length,
                                   long long* pts, unsigned char* flags) override;
     void reset() override;
+    // Gives a record in use back unconsumed, releasing the input ring's reader lock on
+    // the calling thread (which must be the one that took it); the next call takes it
+    // again from its start. The decoder's input thread calls this on its way out so
+    // that no lock is left held by a thread that has ended.
+    void giveBackRecord();
 
     // From the position, finds the next offset where a sync pattern is followed by a
     // valid header: 0 there, RESULT_RESYNC_FAILED when the payload ends first.

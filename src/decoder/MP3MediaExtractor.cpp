@@ -93,6 +93,19 @@ void MP3MediaExtractor::reset() {
     // Deliberately nothing: the sync state and a held frame start survive a flush.
 }
 
+void MP3MediaExtractor::giveBackRecord() {
+    if (mCurrentRecord == nullptr)
+        return;
+    abandonRecord();
+    mCurrentRecord = nullptr;
+    mPayload = nullptr;
+    mPayloadSize = 0;
+    mPosition = 0;
+    // Taken again from its start, where a frame tail may come first: find the next
+    // header instead of failing on that tail.
+    mSynced = false;
+}
+
 void MP3MediaExtractor::adoptRecord(PESData* record) {
     mCurrentRecord = record;
     mPosition = 0;

@@ -52,6 +52,18 @@ public:
     // record, none for a decoder record. Returns the lock's status (0 without a buffer).
     int getRaw(unsigned char** data, unsigned int* size) override;
 
+    // Colour formats a capture can convert.
+    static constexpr int kColorFormatYUV420SemiPlanar = 261;  // Y, then Cb/Cr pairs
+    static constexpr int kColorFormatYUV420SemiPlanarAlt = 289;
+    static constexpr int kColorFormatYV12 = 0x32315659;  // Y, then Cr, then Cb planes
+
+    // Converts a 4:2:0 picture in `colorFormat` to pixels 0xFF000000 | R << 16 |
+    // G << 8 | B, rows of `width` pixels. Luma rows are `stride` bytes apart. 0 on
+    // success, 1 for an unsupported format (nothing written).
+    static int convertFrameFromYvuToRgba(unsigned char* source, int* destination,
+                                         unsigned int width, unsigned int height, int colorFormat,
+                                         unsigned int stride);
+
     uint64_t mPTS;
     int32_t mColorFormat;
     int32_t mBufferIndex;

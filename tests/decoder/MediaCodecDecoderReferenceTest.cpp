@@ -1,0 +1,154 @@
+// The decoder module against FFmpeg: tsgen streams go TS parser -> MediaCodecDecoder
+// -> output ring; the pictures shown and the PCM written must be FFmpeg's own decode
+// of the same file (framemd5 of nv12 with the stream's PTS; s16 PCM).
+#include <gtest/gtest.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <filesystem>
+#include <map>
+
+#include "DecoderTestUtil.h"
+#include "PesRecordTestUtil.h"
+
+namespace TavoPlayer {
+namespace {
+
+struct ReferenceCase {
+    std::string name;
+    std::string args;
+    Decoder::codingType_t type;
+    int channels;
+    int sampleRate;
+};
+using test::PrintTo;
+
+class MediaCodecDecoderReferenceTest : public ::testing::TestWithParam<ReferenceCase> {
+protected:
+    void SetUp() override {
+        mDir =
+            std::filesystem::temp_directory_path() / ("tavo_mcd_ref_" + std::to_string(getpid()));
+        std::filesystem::create_directories(mDir);
+    }
+    void TearDown() override { std::filesystem::remove_all(mDir); }
+    std::filesystem::path mDir;
+};
+
+TEST_P(MediaCodecDecoderReferenceTest, OutputIsFfmpegsDecode) {
+#ifndef TAVO_TSGEN_PATH
+    GTEST_SKIP() << "tsgen is not part of this build";
+#else
+    const ReferenceCase& c = GetParam();
+    const std::string path = (mDir / (c.name + ".ts")).string();
+    ASSERT_TRUE(test::runCommand(std::string(TAVO_TSGEN_PATH) + " -o " + path + " " + c.args +
+                                 " >/dev/null 2>&1"));
+    const test::Bytes ts = test::readFile(path);
+    const bool video = c.type == Decoder::CODING_H264;
+    android::sp<test::RecordingSurface> surface = new test::RecordingSurface();
+    const test::DecodedRun run =
+        test::runDecoder(ts, video ? 0x111 : 0x112, c.type, video ? surface : nullptr);
+    ASSERT_TRUE(run.started);
+    EXPECT_EQ(0u, run.rejectedUnits);
+    EXPECT_EQ(0u, run.heldOutputBuffers);
+    EXPECT_EQ(0u, run.stopResult);
+
+    if (video) {
+        const auto reference = test::ffmpegFramemd5(path);
+        ASSERT_GT(reference.size(), 20u);
+        // Ticks go to the codec as whole microseconds and come back truncated: 93003
+        // ticks become 1033366 us and then 93002 ticks, as designed.
+        std::map<int64_t, std::string> md5At;
+        for (const auto& line : reference)
+            md5At[line.pts * 1000 / 90 * 9 / 100] = line.md5;
+        const auto shown = surface->shown();
+        // The last PES is never emitted by the TS parser and frame threads keep the
+        // last pictures: a few at the end are missing, nothing else.
+        ASSERT_GE(shown.size() + 4, reference.size());
+        ASSERT_EQ(run.video.size(), shown.size());
+        ASSERT_EQ(1000000, shown.front().ptsUs);  // PTS 90000 ticks
+        for (size_t i = 0; i < shown.size(); ++i) {
+            const int64_t pts = shown[i].ptsUs * 9 / 100;
+            EXPECT_EQ(md5At[pts], shown[i].md5) << "picture " << i << " pts " << pts;
+            EXPECT_EQ(static_cast<uint64_t>(pts), run.video[i].pts) << "record " << i;
+            EXPECT_EQ(1920, shown[i].width);
+            EXPECT_EQ(1080, shown[i].height);
+            EXPECT_EQ(261, run.video[i].colorFormat);
+            EXPECT_EQ(1920u, run.video[i].width);
+            EXPECT_EQ(1080u, run.video[i].height);
+            if (i > 0) {
+                EXPECT_LT(shown[i - 1].ptsUs, shown[i].ptsUs);
+            }
+        }
+        // GOP of 15: the pictures 0 and 15 are IDR pictures, the others not.
+        for (size_t i = 0; i < run.video.size(); ++i)
+            EXPECT_EQ(i % 15 == 0 ? 1 : 0, run.video[i].flag) << "record " << i;
+        ASSERT_FALSE(run.resolutions.empty());
+        EXPECT_EQ(std::make_pair(1920, 1080), run.resolutions.front());
+        return;
+    }
+
+    // The AAC extractor's first unit is the stream's second frame (the first one goes
+    // to finding the configuration). The decoder's state (the overlap, the noise
+    // generator of perceptual noise substitution) then differs from a decode of the
+    // whole stream, so FFmpeg decodes the same frames: the ES without its first frame.
+    const bool aac = c.type != Decoder::CODING_MPEG_AUDIO;
+    const size_t skipped = aac ? 1 : 0;
+    const auto pes = test::pesFromTs(ts, 0x112);
+    ASSERT_GT(pes.size(), skipped);
+    std::string referencePath = path;
+    if (aac) {
+        test::Bytes es = test::joinEs(pes);
+        ASSERT_GT(es.size(), 8u);
+        // ISO/IEC 14496-3, 1.A.2 (adts_fixed/variable_header: frame_length) and 1.7.2
+        // (AudioSyncStream: audioMuxLengthBytes after the 11-bit sync word).
+        const size_t first = c.type == Decoder::CODING_AAC_ADTS
+                                 ? ((es[3] & 3u) << 11 | es[4] << 3 | es[5] >> 5)
+                                 : (((es[1] & 0x1Fu) << 8 | es[2]) + 3);
+        es.erase(es.begin(), es.begin() + static_cast<long>(first));
+        referencePath = (mDir / (c.name + ".es")).string();
+        FILE* file = fopen(referencePath.c_str(), "wb");
+        ASSERT_NE(nullptr, file);
+        fwrite(es.data(), 1, es.size(), file);
+        fclose(file);
+    }
+    const test::Bytes reference =
+        test::ffmpegPcm(referencePath, !aac                                 ? ""
+                                       : c.type == Decoder::CODING_AAC_ADTS ? "aac"
+                                                                            : "loas");
+    ASSERT_GT(reference.size(), 10000u);
+    ASSERT_GT(run.audio.size(), 10u);
+    // The last frame or two never leave the extractors (see above); the rest is equal.
+    const size_t frameBytes = run.audio.front().bytes;
+    ASSERT_GE(run.pcm.size() + 3 * frameBytes, reference.size());
+    ASSERT_LE(run.pcm.size(), reference.size());
+    const auto mismatch = std::mismatch(run.pcm.begin(), run.pcm.end(), reference.begin());
+    EXPECT_TRUE(mismatch.first == run.pcm.end())
+        << "PCM differs from byte " << (mismatch.first - run.pcm.begin());
+    EXPECT_EQ(pes[skipped].pts * 1000 / 90 * 9 / 100, run.audio.front().pts);
+    for (const test::AudioRecord& record : run.audio) {
+        EXPECT_EQ(c.channels, record.channels);
+        EXPECT_EQ(static_cast<uint32_t>(c.sampleRate), record.sampleRate);
+    }
+    EXPECT_EQ(aac ? 1u : 0u, run.configInputs);
+#endif
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Streams, MediaCodecDecoderReferenceTest,
+    ::testing::Values(
+        ReferenceCase{"H264Interlaced1080Mbaff", "-d 1 --audio none --start-pts 90000",
+                      Decoder::CODING_H264, 0, 0},
+        ReferenceCase{"AacLatm48kStereo", "-d 2 --size 64x64 --audio latm",
+                      Decoder::CODING_AAC_LATM, 2, 48000},
+        ReferenceCase{"AacAdts48kStereo", "-d 2 --size 64x64 --audio adts",
+                      Decoder::CODING_AAC_ADTS, 2, 48000},
+        ReferenceCase{"AacAdts32kSurround",
+                      "-d 2 --size 64x64 --audio adts --audio-rate 32000 --audio-channels 6",
+                      Decoder::CODING_AAC_ADTS, 6, 32000},
+        ReferenceCase{"Mp2", "-d 2 --size 64x64 --audio mp2", Decoder::CODING_MPEG_AUDIO, 2, 48000},
+        ReferenceCase{"Mp3Mono", "-d 2 --size 64x64 --audio mp3 --audio-channels 1",
+                      Decoder::CODING_MPEG_AUDIO, 1, 48000}),
+    [](const auto& info) { return info.param.name; });
+
+}  // namespace
+}  // namespace TavoPlayer

@@ -121,6 +121,8 @@ private:
     uid_t mPeerUid = static_cast<uid_t>(-1);
     std::thread mThread;
     std::thread::id mThreadId;
+    std::vector<uint8_t> mRecvBuffer;   // the I/O thread's only
+    std::vector<uint8_t> mRecvControl;  // the I/O thread's only
 
     mutable std::mutex mLock;  // guards the tables, pending calls, state and incoming queue
     bool mDead = false;

@@ -612,8 +612,14 @@ bool Connection::flushQueue() {
 }
 
 bool Connection::readFrames() {
-    std::vector<uint8_t> buffer(kMaxFrameBytes);
-    std::vector<uint8_t> control(CMSG_SPACE(sizeof(int) * kMaxFds));
+    // Allocated once: zeroing a frame-sized buffer on every wake-up would cost more
+    // than a small transaction itself.
+    if (mRecvBuffer.empty()) {
+        mRecvBuffer.resize(kMaxFrameBytes);
+        mRecvControl.resize(CMSG_SPACE(sizeof(int) * kMaxFds));
+    }
+    std::vector<uint8_t>& buffer = mRecvBuffer;
+    std::vector<uint8_t>& control = mRecvControl;
     for (int batch = 0; batch < 64; ++batch) {
         {
             std::lock_guard<std::mutex> lock(mLock);

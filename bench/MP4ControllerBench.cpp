@@ -101,7 +101,7 @@ std::string makeFile() {
         " -f lavfi -i sine=frequency=440:sample_rate=48000 -t " +
         std::to_string(kSeconds) +
         " -c:v libx264 -preset veryfast -b:v 8M -g 50 -pix_fmt yuv420p"
-        " -c:a aac -b:a 128k -ac 2 -shortest '" +
+        " -c:a aac -b:a 128k -ac 2 -shortest -f mp4 '" +
         path + ".part' && mv '" + path + ".part' '" + path + "'";
     fprintf(stderr, "making %s with ffmpeg...\n", path.c_str());
     return system(command.c_str()) == 0 ? path : std::string();

@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 
 #include <chrono>
+#include <map>
 #include <mutex>
 #include <string>
 #include <thread>
@@ -17,43 +18,37 @@ namespace {
 
 using android::sp;
 
-// Every listener the controller reports to, recording what arrives on any thread.
+// Every listener the controller reports to, recording what arrives on any thread by
+// kind: "time", "end", "error", "session", "frame" (width, then height).
 class Listeners : public IPlayerListener,
                   public ErrorListener,
                   public AudioRenderer::AudioRenderedListener,
                   public VideoRenderer::FrameRenderedListener {
 public:
-    void onTimeUpdate(int seconds) override { add(&mTimes, seconds); }
-    void onEndOfContent() override { add(&mEnds, 1); }
-    void onError(unsigned int code, const Module*) const override {
-        const_cast<Listeners*>(this)->add(&const_cast<Listeners*>(this)->mErrors, int(code));
-    }
+    void onTimeUpdate(int seconds) override { add("time", seconds); }
+    void onEndOfContent() override { add("end", 1); }
+    void onError(unsigned int code, const Module*) const override { add("error", int(code)); }
     void onAudioRendered() override {}
     void onAudioReady(long) override {}
-    void onAudioSessionId(int id) override { add(&mSessions, id); }
+    void onAudioSessionId(int id) override { add("session", id); }
     void onFrameRendered(int, int, Uint33) override {}
     void onFirstFrameRendered(int width, int height) override {
-        add(&mFirstFrames, width);
-        add(&mFirstFrames, height);
+        add("frame", width);
+        add("frame", height);
     }
-
-    std::vector<int> times() const { return get(mTimes); }
-    std::vector<int> ends() const { return get(mEnds); }
-    std::vector<int> errors() const { return get(mErrors); }
-    std::vector<int> sessions() const { return get(mSessions); }
-    std::vector<int> firstFrames() const { return get(mFirstFrames); }
+    std::vector<int> operator[](const std::string& kind) const {
+        std::lock_guard<std::mutex> lock(mMutex);
+        auto found = mValues.find(kind);
+        return found != mValues.end() ? found->second : std::vector<int>{};
+    }
 
 private:
-    void add(std::vector<int>* to, int value) {
+    void add(const std::string& kind, int value) const {
         std::lock_guard<std::mutex> lock(mMutex);
-        to->push_back(value);
-    }
-    std::vector<int> get(const std::vector<int>& from) const {
-        std::lock_guard<std::mutex> lock(mMutex);
-        return from;
+        mValues[kind].push_back(value);
     }
     mutable std::mutex mMutex;
-    std::vector<int> mTimes, mEnds, mErrors, mSessions, mFirstFrames;
+    mutable std::map<std::string, std::vector<int>> mValues;
 };
 
 void attach(MP4Controller& controller, Listeners& listeners) {
@@ -92,35 +87,35 @@ MediaTestFiles* MP4ControllerFileTest::sFiles = nullptr;
 TEST_F(MP4ControllerFileTest, PlaysAFileAndReportsFrameTimeAndEnd) {
     ASSERT_EQ(open({{"path", sFiles->mp4()}}), 0u);
     ASSERT_EQ(mController->start(), 0u);
-    ASSERT_TRUE(waitUntil([&] { return !mListeners.ends().empty(); }));
-    EXPECT_EQ(mListeners.sessions().size(), 1u);
-    EXPECT_GT(mListeners.sessions().at(0), 0);
-    EXPECT_EQ(mListeners.firstFrames(), (std::vector<int>{320, 240}));
+    ASSERT_TRUE(waitUntil([&] { return !mListeners["end"].empty(); }));
+    EXPECT_EQ(mListeners["session"].size(), 1u);
+    EXPECT_GT(mListeners["session"].at(0), 0);
+    EXPECT_EQ(mListeners["frame"], (std::vector<int>{320, 240}));
     EXPECT_EQ(mTrace.count("Video size: 320 x 240"), 1u);
     // Seconds rounded up, never going back, up to the file's length.
-    const std::vector<int> times = mListeners.times();
+    const std::vector<int> times = mListeners["time"];
     ASSERT_FALSE(times.empty());
     for (size_t i = 1; i < times.size(); ++i)
         EXPECT_LE(times[i - 1], times[i]) << "at " << i;
     EXPECT_EQ(times.back(), MediaTestFiles::kSeconds);
-    EXPECT_TRUE(mListeners.errors().empty());
+    EXPECT_TRUE(mListeners["error"].empty());
 }
 
 TEST_F(MP4ControllerFileTest, PauseStopsTheTimeAndResumeAndSeekMoveIt) {
     ASSERT_EQ(open({{"path", sFiles->mp4()}}), 0u);
     ASSERT_EQ(mController->start(), 0u);
-    ASSERT_TRUE(waitUntil([&] { return !mListeners.times().empty(); }));
+    ASSERT_TRUE(waitUntil([&] { return !mListeners["time"].empty(); }));
     ASSERT_EQ(mController->pause(), 0u);
     std::this_thread::sleep_for(std::chrono::milliseconds(150));  // a trigger under way ends
-    const size_t paused = mListeners.times().size();
+    const size_t paused = mListeners["time"].size();
     std::this_thread::sleep_for(std::chrono::milliseconds(400));
-    EXPECT_EQ(mListeners.times().size(), paused) << "no time update while paused";
+    EXPECT_EQ(mListeners["time"].size(), paused) << "no time update while paused";
     ASSERT_EQ(mController->resume(), 0u);
-    ASSERT_TRUE(waitUntil([&] { return mListeners.times().back() == 2; }));
+    ASSERT_TRUE(waitUntil([&] { return mListeners["time"].back() == 2; }));
     // Back to the start: the time goes back to 1 s or less, then the end still comes.
     ASSERT_EQ(mController->seek(0), 0u);
-    EXPECT_TRUE(waitUntil([&] { return mListeners.times().back() <= 1; }));
-    EXPECT_TRUE(waitUntil([&] { return !mListeners.ends().empty(); }));
+    EXPECT_TRUE(waitUntil([&] { return mListeners["time"].back() <= 1; }));
+    EXPECT_TRUE(waitUntil([&] { return !mListeners["end"].empty(); }));
 }
 
 struct BadPathCase {
@@ -136,10 +131,10 @@ TEST_P(MP4ControllerBadPathTest, ConfigureAcceptsAndStartEndsInErrorOne) {
     EXPECT_EQ(mController->configure(config), 0u);
     EXPECT_EQ(config.count("path"), 1u) << "looked up with the map's subscript";
     EXPECT_EQ(mController->start(), 0u);
-    ASSERT_TRUE(waitUntil([&] { return !mListeners.errors().empty(); }));
-    EXPECT_EQ(mListeners.errors(), std::vector<int>{1});
+    ASSERT_TRUE(waitUntil([&] { return !mListeners["error"].empty(); }));
+    EXPECT_EQ(mListeners["error"], std::vector<int>{1});
     EXPECT_EQ(mTrace.count(TRACE_ERROR, "Received MEDIA_ERROR"), 1u) << mTrace.all();
-    EXPECT_TRUE(mListeners.firstFrames().empty());
+    EXPECT_TRUE(mListeners["frame"].empty());
 }
 
 INSTANTIATE_TEST_SUITE_P(
@@ -228,8 +223,8 @@ class MP4ControllerTimeTest : public MP4ControllerFakeTest,
 TEST_P(MP4ControllerTimeTest, ReportsWholeSecondsRoundedUp) {
     mPlayer->positionMs = GetParam().first;
     mController->start();
-    ASSERT_TRUE(waitUntil([&] { return mListeners.times().size() >= 2; }));
-    for (int seconds : mListeners.times())
+    ASSERT_TRUE(waitUntil([&] { return mListeners["time"].size() >= 2; }));
+    for (int seconds : mListeners["time"])
         EXPECT_EQ(seconds, GetParam().second);
 }
 
@@ -255,9 +250,9 @@ class MP4ControllerNotifyTest : public MP4ControllerFakeTest,
 TEST_P(MP4ControllerNotifyTest, TurnsNotificationsIntoListenerCallsAndLogs) {
     for (const Notification& n : GetParam().notifications)
         mController->notify(n.msg, n.ext1, n.ext2, nullptr);
-    EXPECT_EQ(mListeners.firstFrames(), GetParam().firstFrames);
-    EXPECT_EQ(mListeners.ends(), GetParam().ends);
-    EXPECT_EQ(mListeners.errors(), GetParam().errors);
+    EXPECT_EQ(mListeners["frame"], GetParam().firstFrames);
+    EXPECT_EQ(mListeners["end"], GetParam().ends);
+    EXPECT_EQ(mListeners["error"], GetParam().errors);
     for (const auto& [fragment, times] : GetParam().logged)
         EXPECT_EQ(mTrace.count(fragment), times) << fragment << "\n" << mTrace.all();
 }
@@ -265,34 +260,31 @@ TEST_P(MP4ControllerNotifyTest, TurnsNotificationsIntoListenerCallsAndLogs) {
 INSTANTIATE_TEST_SUITE_P(
     Messages, MP4ControllerNotifyTest,
     ::testing::Values(
+        // The first size is logged and replaced only when it changes.
         NotifyCase{"SameSizeTwiceLoggedOnce",
-                   {{5, 320, 240}, {5, 320, 240}, {200, 3, 0}},
-                   {320, 240},
-                   {},
-                   {},
-                   {{"Video size: 320 x 240", 1}, {"Received MEDIA_SET_VIDEO_SIZE", 2}}},
-        NotifyCase{"NewSizeReplacesTheOld",
-                   {{5, 320, 240}, {5, 640, 480}, {200, 3, 0}},
+                   {{5, 320, 240}, {5, 320, 240}, {5, 640, 480}, {200, 3, 0}},
                    {640, 480},
                    {},
                    {},
-                   {{"Video size: 640 x 480", 1}}},
+                   {{"Video size: 320 x 240", 1}, {"Video size: 640 x 480", 1}}},
         NotifyCase{"EmptySizeOfAudioOnlyNotLogged",
                    {{5, 0, 0}, {200, 3, 0}},
                    {0, 0},
                    {},
                    {},
                    {{"Video size", 0}}},
-        NotifyCase{"InfoOtherThanRenderingStart",
-                   {{200, 701, 0}, {200, 1, 0}},
+        // Nothing beyond their log lines.
+        NotifyCase{"InfoBufferingAndOthers",
+                   {{200, 701, 0}, {3, 42, 0}, {7, 1, 2}},
                    {},
                    {},
                    {},
-                   {{"Received MEDIA_INFO", 2}, {"MEDIA_INFO_RENDERING_START", 0}}},
+                   {{"Received MEDIA_INFO", 1},
+                    {"MEDIA_INFO_RENDERING_START", 0},
+                    {"Buffering at: 42", 1},
+                    {"msg 7, ext1 1, ext2 2", 1}}},
         NotifyCase{"PlaybackComplete", {{2, 0, 0}}, {}, {1}, {}, {{"MEDIA_PLAYBACK_COMPLETE", 1}}},
-        NotifyCase{"ErrorIsFatal", {{100, 1, -1004}}, {}, {}, {1}, {{"Received MEDIA_ERROR", 1}}},
-        NotifyCase{"Buffering", {{3, 42, 0}}, {}, {}, {}, {{"Buffering at: 42", 1}}},
-        NotifyCase{"Unknown", {{4, 0, 0}, {7, 1, 2}}, {}, {}, {}, {{"msg 7, ext1 1, ext2 2", 1}}}),
+        NotifyCase{"ErrorIsFatal", {{100, 1, -1004}}, {}, {}, {1}, {{"Received MEDIA_ERROR", 1}}}),
     [](const auto& info) { return std::string(info.param.name); });
 
 TEST_F(MP4ControllerFakeTest, BroadcastOnlyOperationsAreRefusedAndDoNothing) {

@@ -109,6 +109,11 @@ MediaPlayer::MediaPlayer() : mAudioSessionId(newAudioSessionId()) {
     setOption(handle, "force-window", "no");
     setOption(handle, "pause", "yes");
     setOption(handle, "network-timeout", std::to_string(kNetworkTimeoutSeconds));
+#if defined(__SANITIZE_THREAD__)
+    // FFmpeg's frame threads synchronise in ways ThreadSanitizer cannot see inside an
+    // uninstrumented library; one decoding thread keeps its reports to our own code.
+    setOption(handle, "vd-lavc-threads", "1");
+#endif
     const MediaPlayerOutputs outputs = MediaPlayerOutputs::fromSystem(false);
     if (!outputs.note.empty())
         TAVO_LOGW("%s: %s\n", __func__, outputs.note.c_str());

@@ -16,6 +16,15 @@
 namespace TavoPlayer::test {
 namespace {
 
+// glibc runs a timer's notifications from a helper thread that ThreadSanitizer never
+// sees created, and its runtime crashes there at the first expiry: tests that arm the
+// controller's timer run in the other builds only.
+#if defined(__SANITIZE_THREAD__)
+#define SKIP_IF_TIMERS_UNSUPPORTED() GTEST_SKIP() << "SIGEV_THREAD timers under ThreadSanitizer"
+#else
+#define SKIP_IF_TIMERS_UNSUPPORTED() (void)0
+#endif
+
 using android::sp;
 
 // Every listener the controller reports to, recording what arrives on any thread by
@@ -63,12 +72,14 @@ protected:
     static void SetUpTestSuite() { sFiles = new MediaTestFiles(); }
     static void TearDownTestSuite() { delete sFiles; }
     void SetUp() override {
+        SKIP_IF_TIMERS_UNSUPPORTED();
         ASSERT_TRUE(sFiles->ok()) << sFiles->error();
         mController = new MP4Controller();
         attach(*mController, mListeners);
     }
     void TearDown() override {
-        mController->stop();
+        if (mController != nullptr)
+            mController->stop();
         mController.clear();
     }
     unsigned int open(std::map<std::string, std::string> config) {
@@ -206,6 +217,7 @@ protected:
 };
 
 TEST_F(MP4ControllerFakeTest, StartsMutedUntilAudioIsEnabledAndStopClearsTheListener) {
+    SKIP_IF_TIMERS_UNSUPPORTED();
     mController->start();
     mController->stop();
     mController->setAudioEnable(1);
@@ -221,6 +233,7 @@ class MP4ControllerTimeTest : public MP4ControllerFakeTest,
                               public ::testing::WithParamInterface<std::pair<int, int>> {};
 
 TEST_P(MP4ControllerTimeTest, ReportsWholeSecondsRoundedUp) {
+    SKIP_IF_TIMERS_UNSUPPORTED();
     mPlayer->positionMs = GetParam().first;
     mController->start();
     ASSERT_TRUE(waitUntil([&] { return mListeners["time"].size() >= 2; }));

@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cmath>
+#include <cstdio>
 
 namespace TavoPlayer::tsgen {
 
@@ -142,7 +143,9 @@ bool CaptionWriter::encodeText(const std::string& text, std::vector<uint8_t>& by
         bool ok = true;
         appendUtf8CodePoint(cp, bytes, ok);
         if (!ok) {
-            error = "caption character U+" + std::to_string(cp) + " has no Latin caption code";
+            char name[16];
+            snprintf(name, sizeof(name), "U+%04X", cp);
+            error = std::string("caption character ") + name + " has no Latin caption code";
             return false;
         }
         i += 1 + extra;

@@ -1,0 +1,182 @@
+// Still capture through the decoder module: a decoded tsgen picture converted and
+// compared with FFmpeg's own RGB conversion, and the refusals and failures.
+#include <gtest/gtest.h>
+
+#include <condition_variable>
+#include <functional>
+#include <mutex>
+
+extern "C" {
+#include <libswscale/swscale.h>
+}
+
+#include "DecoderTestUtil.h"
+#include "PesRecordTestUtil.h"
+#include "decoder/MediaCodecDecoder.h"
+#include "support/TraceCapture.h"
+#include "support/TsTestUtil.h"
+
+namespace TavoPlayer {
+namespace {
+
+class Listener : public CaptureFrameListener {
+public:
+    void onCaptureFrame(unsigned char* pixels, unsigned int width, unsigned int height,
+                        bool flag) override {
+        std::unique_lock<std::mutex> lock(mMutex);
+        mChanged.wait(lock, [&] { return !mBlocked; });
+        mPixels.assign(reinterpret_cast<uint32_t*>(pixels),
+                       reinterpret_cast<uint32_t*>(pixels) + width * height);
+        delete[] pixels;
+        mWidth = width;
+        mHeight = height;
+        mFlag = flag;
+        ++mCalls;
+    }
+    void block(bool blocked) {
+        std::lock_guard<std::mutex> lock(mMutex);
+        mBlocked = blocked;
+        mChanged.notify_all();
+    }
+    int calls() {
+        std::lock_guard<std::mutex> lock(mMutex);
+        return mCalls;
+    }
+
+    std::mutex mMutex;
+    std::condition_variable mChanged;
+    bool mBlocked = false;
+    int mCalls = 0;
+    std::vector<uint32_t> mPixels;
+    unsigned int mWidth = 0, mHeight = 0;
+    bool mFlag = true;
+};
+
+class MediaCodecDecoderCaptureTest : public ::testing::Test {
+public:
+    void SetUp() override {
+        mDecoder->configure(Decoder::CODING_H264);
+        mFrame.mColorFormat = 261;
+        mFrame.mCropWidth = 320;
+        mFrame.mCropHeight = 240;
+    }
+    void setSurface() {
+        android::sp<android::Surface> surface = mSurface;
+        mDecoder->setSurface(surface);
+    }
+    test::TraceCapture mTrace;
+    android::sp<MediaCodecDecoder> mDecoder = new MediaCodecDecoder();
+    android::sp<test::RecordingSurface> mSurface = new test::RecordingSurface();
+    VideoFrameData mFrame;
+    Listener mListener;
+};
+
+TEST_F(MediaCodecDecoderCaptureTest, DecodedPictureMatchesFfmpegsConversion) {
+    const test::Bytes ts = test::runTsgen("-d 1 --audio none --size 320x240 --progressive");
+    ASSERT_FALSE(ts.empty());
+    const test::DecodedRun run = test::runDecoder(ts, 0x111, Decoder::CODING_H264, mSurface);
+    ASSERT_GT(mSurface->shownCount(), 10u);
+    int width = 0, height = 0;
+    std::vector<uint8_t> nv12 = mSurface->lastPicture(&width, &height);
+    ASSERT_EQ(320, width);
+    setSurface();
+    ASSERT_TRUE(mDecoder->captureFrame(mFrame, &mListener));
+    ASSERT_TRUE(test::waitUntil([&] { return mListener.calls() == 1; }));
+    EXPECT_FALSE(mListener.mFlag);
+    ASSERT_EQ(320u * 240u, mListener.mPixels.size());
+    EXPECT_EQ(1, mSurface->queuedBack);
+
+    // FFmpeg: full-range BT.601 NV12 to BGRA (bytes B, G, R, A as the capture's
+    // little-endian 0xAARRGGBB), chroma repeated over each 2 x 2 block.
+    SwsContext* sws = sws_getContext(320, 240, AV_PIX_FMT_NV12, 320, 240, AV_PIX_FMT_BGRA,
+                                     SWS_POINT, nullptr, nullptr, nullptr);
+    ASSERT_NE(nullptr, sws);
+    const int* table = sws_getCoefficients(SWS_CS_ITU601);
+    sws_setColorspaceDetails(sws, table, 1, table, 1, 0, 1 << 16, 1 << 16);
+    std::vector<uint32_t> reference(320 * 240);
+    const uint8_t* planes[2] = {nv12.data(), nv12.data() + 320 * 240};
+    const int strides[2] = {320, 320};
+    uint8_t* out[1] = {reinterpret_cast<uint8_t*>(reference.data())};
+    const int outStride[1] = {320 * 4};
+    sws_scale(sws, planes, strides, 0, 240, out, outStride);
+    sws_freeContext(sws);
+    // The 10-bit factors truncate (arithmetic shifts) where FFmpeg rounds.
+    int worst = 0;
+    for (size_t i = 0; i < reference.size(); ++i) {
+        for (int shift : {0, 8, 16}) {
+            const int ours = (mListener.mPixels[i] >> shift) & 0xFF;
+            const int theirs = (reference[i] >> shift) & 0xFF;
+            worst = std::max(worst, std::abs(ours - theirs));
+        }
+        ASSERT_EQ(0xFF000000u, mListener.mPixels[i] & 0xFF000000u);
+    }
+    EXPECT_LE(worst, 3);
+}
+
+TEST_F(MediaCodecDecoderCaptureTest, OneCaptureAtATime) {
+    mSurface->setLastPicture(std::vector<uint8_t>(320 * 240 * 3 / 2, 128), 320, 240);
+    setSurface();
+    mListener.block(true);
+    ASSERT_TRUE(mDecoder->captureFrame(mFrame, &mListener));
+    EXPECT_FALSE(mDecoder->captureFrame(mFrame, &mListener));
+    EXPECT_TRUE(mTrace.contains("captureFrame: Capture is in progress"));
+    mListener.block(false);
+    ASSERT_TRUE(test::waitUntil([&] { return mListener.calls() == 1; }));
+    EXPECT_EQ(std::vector<uint32_t>(320 * 240, 0xFF808080u), mListener.mPixels);
+    // A finished capture is replaced by the next one.
+    ASSERT_TRUE(test::waitUntil([&] { return mDecoder->captureFrame(mFrame, &mListener); }));
+    EXPECT_TRUE(test::waitUntil([&] { return mListener.calls() == 2; }));
+}
+
+struct FailureCase {
+    std::string name;
+    std::function<void(MediaCodecDecoderCaptureTest&)> setUp;
+    bool started;
+    std::string message;
+};
+
+class CaptureFailureTest : public MediaCodecDecoderCaptureTest {
+public:
+    void TestBody() override {}
+};
+
+TEST(MediaCodecDecoderCaptureFailures, LogAndNeverCallTheListener) {
+    const std::vector<FailureCase> cases = {
+        {"NoSurface", [](auto&) {}, false, "captureFrame: m_pSurface is null fail to capture"},
+        {"DequeueFails",
+         [](auto& t) {
+             t.mSurface->dequeueStatus = -19;
+             t.setSurface();
+         },
+         false, "Surface::dequeueBuffer returned error -19"},
+        {"LockFails",
+         [](auto& t) {
+             t.mSurface->lockStatus = -22;
+             t.setSurface();
+         },
+         false, "mapper.lockYCbCr error -22"},
+        {"UnsupportedFormat",
+         [](auto& t) {
+             t.mFrame.mColorFormat = 19;
+             t.setSurface();
+         },
+         true, "threadLoop: Error converting frame"},
+    };
+    for (const FailureCase& c : cases) {
+        CaptureFailureTest t;
+        t.SetUp();
+        t.mSurface->setLastPicture(std::vector<uint8_t>(320 * 240 * 3 / 2, 16), 320, 240);
+        c.setUp(t);
+        EXPECT_EQ(c.started, t.mDecoder->captureFrame(t.mFrame, &t.mListener)) << c.name;
+        EXPECT_TRUE(test::waitUntil([&] { return t.mTrace.contains(c.message); }))
+            << c.name << "\n"
+            << t.mTrace.all();
+        if (c.name == "LockFails") {
+            EXPECT_EQ(1, t.mSurface->queuedBack) << "a dequeued buffer always goes back";
+        }
+        EXPECT_EQ(0, t.mListener.calls()) << c.name;
+    }
+}
+
+}  // namespace
+}  // namespace TavoPlayer

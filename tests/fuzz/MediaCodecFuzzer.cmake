@@ -1,0 +1,1 @@
+set(FUZZ_LIBRARIES tavo_platform_media)

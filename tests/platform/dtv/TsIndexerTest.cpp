@@ -1,0 +1,67 @@
+#include <gtest/gtest.h>
+
+#include <vector>
+
+#include "platform/dtv/PcrPacer.h"
+#include "platform/dtv/TsIndexer.h"
+
+namespace TavoPlayer {
+namespace {
+
+// A packet of `pid` carrying PCR base `base` (90 kHz), ISO/IEC 13818-1, 2.4.3.4.
+std::vector<uint8_t> pcrPacket(uint16_t pid, uint64_t base, bool discontinuity = false) {
+    std::vector<uint8_t> p(188, 0xFF);
+    p[0] = 0x47;
+    p[1] = static_cast<uint8_t>(pid >> 8);
+    p[2] = static_cast<uint8_t>(pid);
+    p[3] = 0x30;
+    p[4] = 7;
+    p[5] = static_cast<uint8_t>(0x10 | (discontinuity ? 0x80 : 0));
+    p[6] = static_cast<uint8_t>(base >> 25);
+    p[7] = static_cast<uint8_t>(base >> 17);
+    p[8] = static_cast<uint8_t>(base >> 9);
+    p[9] = static_cast<uint8_t>(base >> 1);
+    p[10] = static_cast<uint8_t>(((base & 1) << 7) | 0x7E);
+    p[11] = 0;
+    return p;
+}
+
+TEST(TsIndexerTest, TimeLineSumsPcrIntervalsAcrossWrapsAndNewTimeBases) {
+    constexpr uint64_t kWrap = uint64_t{1} << 33;
+    struct Step {
+        uint16_t pid;
+        uint64_t base;
+        bool discontinuity;
+        bool point;  // becomes an index point
+        uint32_t elapsedMs;
+    };
+    const Step steps[] = {
+        {0x100, kWrap - 4500, false, true, 0},  // the first PCR: 0 ms
+        {0x200, 99999, false, false, 0},        // another PID's PCR is not the clock
+        {0x100, kWrap - 900, false, true, 40},
+        {0x100, 2700, false, true, 80},    // wrapped: still 40 ms on
+        {0x100, 2700, false, false, 80},   // no new millisecond, no new point
+        {0x100, 500000, true, false, 80},  // a new time base adds nothing
+        {0x100, 503600, false, true, 120},
+        {0x100, 503600 + 5 * 90000, false, false, 120},  // a jump of 5 s: a new time base
+        {0x100, 503600 + 5 * 90000 + 9000, false, true, 220},
+    };
+    TsIndexer indexer;
+    uint64_t offset = 0;
+    for (const Step& s : steps) {
+        SCOPED_TRACE(offset / 188);
+        EXPECT_EQ(indexer.push(pcrPacket(s.pid, s.base, s.discontinuity).data(), offset), s.point);
+        EXPECT_EQ(indexer.elapsedMs(), s.elapsedMs);
+        if (s.point) {
+            EXPECT_EQ(indexer.points().back().offset, offset);
+            EXPECT_EQ(indexer.points().back().timeMs, s.elapsedMs);
+        }
+        offset += 188;
+    }
+    EXPECT_EQ(indexer.pcrPid(), 0x100);
+    EXPECT_EQ(indexer.takePoints().size(), 5u);
+    EXPECT_TRUE(indexer.points().empty());
+}
+
+}  // namespace
+}  // namespace TavoPlayer

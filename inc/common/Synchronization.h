@@ -60,6 +60,9 @@ public:
     void resume();
     // The current PCR of the driving source; 0 when no source drives the clock.
     Uint33 getPCR();
+    // The same under one lock, telling "no source" (false, *pcr untouched) apart
+    // from a PCR that happens to be 0.
+    bool getPCR(Uint33* pcr);
     // Not owned: the listener must outlive this clock.
     void addPCRListener(PCRListener* listener);
     // Drift guard; runs under the caller's lock (called by setBasePCR).

@@ -183,6 +183,14 @@ Uint33 Synchronization::getPCR() {
     return currentPCR_l(mCurrentModule, getTimestamp());
 }
 
+bool Synchronization::getPCR(Uint33* pcr) {
+    std::lock_guard<std::mutex> lock(mLock);
+    if (mCurrentModule == None)
+        return false;
+    *pcr = currentPCR_l(mCurrentModule, getTimestamp());
+    return true;
+}
+
 void Synchronization::addPCRListener(PCRListener* listener) {
     std::lock_guard<std::mutex> lock(mLock);
     mPCRListeners.push_back(listener);

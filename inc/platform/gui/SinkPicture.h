@@ -3,6 +3,7 @@
 // `width` bytes, then height / 2 rows of `width` bytes of Cb/Cr pairs, Cb first).
 #pragma once
 
+#include <cstddef>
 #include <cstdint>
 #include <vector>
 

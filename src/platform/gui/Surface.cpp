@@ -4,6 +4,7 @@
 #include <string>
 
 #include "platform/gui/NullVideoSink.h"
+#include "platform/gui/SdlVideoSink.h"
 #include "platform/gui/SinkSurface.h"
 #include "platform/gui/Y4mVideoSink.h"
 #include "platform/os/Properties.h"
@@ -18,6 +19,25 @@ SinkFactory nullFactory() {
     return [](ShowLog& log) { return std::make_unique<NullVideoSink>(log); };
 }
 
+SinkFactory sdlFactory() {
+    std::string mode = TavoPlayer::propertyGetString("tavoplayer.video.deinterlace", "auto");
+    if (mode.empty())
+        mode = "auto";
+    if (mode != "auto" && mode != "off") {
+        TAVO_LOGW("%s: tavoplayer.video.deinterlace is auto or off, not \"%s\"; using auto\n",
+                  __func__, mode.c_str());
+        mode = "auto";
+    }
+    const bool deinterlace = mode == "auto";
+    return [deinterlace](ShowLog& log) { return SdlVideoSink::open(log, deinterlace); };
+}
+
+bool displayPresent() {
+    const char* x11 = getenv("DISPLAY");
+    const char* wayland = getenv("WAYLAND_DISPLAY");
+    return (x11 != nullptr && *x11 != '\0') || (wayland != nullptr && *wayland != '\0');
+}
+
 }  // namespace
 
 sp<Surface> Surface::create() {
@@ -25,8 +45,18 @@ sp<Surface> Surface::create() {
     const std::string logPath = TavoPlayer::propertyGetString("tavoplayer.video.log", "");
 
     SinkFactory factory;
-    if (sink.empty() || sink == "null") {
+    if (sink.empty() && displayPresent()) {
+        // The window when SDL can open one; headless otherwise.
+        sp<SinkSurface> surface = new SinkSurface(logPath, sdlFactory());
+        if (surface->valid()) {
+            TAVO_LOGI("%s: video sink %s\n", __func__, surface->sinkName());
+            return surface;
+        }
         factory = nullFactory();
+    } else if (sink.empty() || sink == "null") {
+        factory = nullFactory();
+    } else if (sink == "sdl") {
+        factory = sdlFactory();
     } else if (sink.rfind("y4m:", 0) == 0) {
         const std::string path = sink.substr(4);
         factory = [path](ShowLog& log) { return Y4mVideoSink::open(path, log); };

@@ -1,0 +1,218 @@
+#include "platform/gui/SdlVideoSink.h"
+
+#include <pthread.h>
+
+#include <atomic>
+#include <cerrno>
+#include <chrono>
+
+#include <SDL2/SDL.h>
+
+extern "C" {
+#include <libavutil/frame.h>
+}
+
+#include "platform/gui/Deinterlacer.h"
+#include "platform/os/Trace.h"
+
+namespace android {
+
+namespace {
+
+// SDL's video subsystem may be started by one thread of the process at a time.
+std::atomic<bool> gWindowOpen{false};
+
+}  // namespace
+
+// Everything SDL: lives on the sink's thread only.
+class SdlVideoSink::Window {
+public:
+    Window(ShowLog& log, bool deinterlace) : mLog(log), mDeinterlace(deinterlace) {}
+    ~Window() {
+        if (mTexture != nullptr)
+            SDL_DestroyTexture(mTexture);
+        if (mRenderer != nullptr)
+            SDL_DestroyRenderer(mRenderer);
+        if (mWindow != nullptr)
+            SDL_DestroyWindow(mWindow);
+    }
+
+    void present(const SinkPicture& picture) {
+        if (picture.interlaced && mDeinterlace && mDeinterlacer.push(picture)) {
+            if (const AVFrame* frame = mDeinterlacer.pull()) {
+                if (upload(SDL_PIXELFORMAT_IYUV, frame->width, frame->height) &&
+                    SDL_UpdateYUVTexture(mTexture, nullptr, frame->data[0], frame->linesize[0],
+                                         frame->data[1], frame->linesize[1], frame->data[2],
+                                         frame->linesize[2]) == 0) {
+                    draw(static_cast<uint64_t>(frame->pts), frame->width, frame->height);
+                }
+                return;
+            }
+            // The filter runs one picture behind: until it gives its first, the
+            // window shows the woven picture rather than nothing.
+            if (mShownAny)
+                return;
+        }
+        if (upload(SDL_PIXELFORMAT_NV12, picture.width, picture.height) &&
+            SDL_UpdateNVTexture(mTexture, nullptr, picture.y(), picture.width, picture.uv(),
+                                picture.width) == 0) {
+            draw(picture.pts90k, picture.width, picture.height);
+        }
+    }
+
+    void handleEvents() {
+        SDL_Event event;
+        while (SDL_PollEvent(&event) != 0) {
+            // A resized or uncovered window is drawn again from the last texture;
+            // closing the window is the viewer application's business, not ours.
+            if (event.type == SDL_WINDOWEVENT &&
+                (event.window.event == SDL_WINDOWEVENT_SIZE_CHANGED ||
+                 event.window.event == SDL_WINDOWEVENT_EXPOSED)) {
+                redraw();
+            }
+        }
+    }
+
+private:
+    // Makes the window, renderer and texture fit a picture of this format and size.
+    bool upload(uint32_t format, int width, int height) {
+        if (mWindow == nullptr) {
+            mWindow =
+                SDL_CreateWindow("TavoPlayer", SDL_WINDOWPOS_UNDEFINED, SDL_WINDOWPOS_UNDEFINED,
+                                 width, height, SDL_WINDOW_RESIZABLE | SDL_WINDOW_SHOWN);
+            if (mWindow != nullptr)
+                mRenderer = SDL_CreateRenderer(mWindow, -1, 0);
+            if (mRenderer == nullptr) {
+                TAVO_LOGE("%s: no SDL window: %s\n", __func__, SDL_GetError());
+                return false;
+            }
+        } else if (width != mWidth || height != mHeight) {
+            SDL_SetWindowSize(mWindow, width, height);
+        }
+        if (mTexture != nullptr && format == mFormat && width == mWidth && height == mHeight)
+            return true;
+        if (mTexture != nullptr)
+            SDL_DestroyTexture(mTexture);
+        mTexture = SDL_CreateTexture(mRenderer, format, SDL_TEXTUREACCESS_STREAMING, width, height);
+        if (mTexture == nullptr) {
+            TAVO_LOGE("%s: no SDL texture of %dx%d: %s\n", __func__, width, height, SDL_GetError());
+            return false;
+        }
+        // Letterboxing to the picture's own size keeps its aspect ratio, whatever
+        // size the viewer gives the window.
+        SDL_RenderSetLogicalSize(mRenderer, width, height);
+        mFormat = format;
+        mWidth = width;
+        mHeight = height;
+        return true;
+    }
+
+    void draw(uint64_t pts90k, int width, int height) {
+        redraw();
+        mShownAny = true;
+        mLog.record(pts90k, width, height);
+    }
+
+    void redraw() {
+        if (mRenderer == nullptr || mTexture == nullptr)
+            return;
+        SDL_SetRenderDrawColor(mRenderer, 0, 0, 0, 255);
+        SDL_RenderClear(mRenderer);
+        SDL_RenderCopy(mRenderer, mTexture, nullptr, nullptr);
+        SDL_RenderPresent(mRenderer);
+    }
+
+    ShowLog& mLog;
+    const bool mDeinterlace;
+    Deinterlacer mDeinterlacer;
+    SDL_Window* mWindow = nullptr;
+    SDL_Renderer* mRenderer = nullptr;
+    SDL_Texture* mTexture = nullptr;
+    uint32_t mFormat = 0;
+    int mWidth = 0;
+    int mHeight = 0;
+    bool mShownAny = false;
+};
+
+std::unique_ptr<SdlVideoSink> SdlVideoSink::open(ShowLog& log, bool deinterlace) {
+    bool expected = false;
+    if (!gWindowOpen.compare_exchange_strong(expected, true)) {
+        TAVO_LOGE("%s: a window sink is open already\n", __func__);
+        return nullptr;
+    }
+    std::unique_ptr<SdlVideoSink> sink(new SdlVideoSink(log, deinterlace));
+    std::unique_lock<std::mutex> lock(sink->mLock);
+    sink->mThread = std::thread([raw = sink.get()] { raw->run(); });
+    // SDL answers at once whether it can reach a display; the bound only guards
+    // against a display server that never answers.
+    const bool answered = sink->mWake.wait_for(lock, std::chrono::seconds(10),
+                                               [&] { return sink->mStartup != Startup::Pending; });
+    const bool ready = answered && sink->mStartup == Startup::Ready;
+    lock.unlock();
+    if (!ready) {
+        if (!answered)
+            TAVO_LOGE("%s: the display did not answer\n", __func__);
+        return nullptr;  // the destructor joins the thread once it gives up
+    }
+    return sink;
+}
+
+SdlVideoSink::SdlVideoSink(ShowLog& log, bool deinterlace) : mLog(log), mDeinterlace(deinterlace) {}
+
+SdlVideoSink::~SdlVideoSink() {
+    {
+        std::lock_guard<std::mutex> lock(mLock);
+        mQuit = true;
+    }
+    mWake.notify_all();
+    if (mThread.joinable())
+        mThread.join();
+    gWindowOpen.store(false);
+}
+
+int SdlVideoSink::show(const std::shared_ptr<const SinkPicture>& picture) {
+    bool replaced = false;
+    {
+        std::lock_guard<std::mutex> lock(mLock);
+        replaced = mPending != nullptr;
+        mPending = picture;
+    }
+    if (replaced)
+        mLog.recordDropped();
+    mWake.notify_all();
+    return 0;
+}
+
+void SdlVideoSink::run() {
+    pthread_setname_np(pthread_self(), "SdlVideoSink");
+    const bool started = SDL_InitSubSystem(SDL_INIT_VIDEO) == 0;
+    if (!started)
+        TAVO_LOGI("%s: SDL cannot show video here: %s\n", __func__, SDL_GetError());
+    {
+        std::lock_guard<std::mutex> lock(mLock);
+        mStartup = started ? Startup::Ready : Startup::Failed;
+    }
+    mWake.notify_all();
+    if (!started)
+        return;
+    // BT.601 for standard definition, BT.709 above it, as the pictures are coded.
+    SDL_SetYUVConversionMode(SDL_YUV_CONVERSION_AUTOMATIC);
+    {
+        Window window(mLog, mDeinterlace);
+        std::unique_lock<std::mutex> lock(mLock);
+        while (!mQuit) {
+            mWake.wait_for(lock, std::chrono::milliseconds(kEventPollMs),
+                           [this] { return mQuit || mPending != nullptr; });
+            std::shared_ptr<const SinkPicture> picture = std::move(mPending);
+            mPending.reset();
+            lock.unlock();
+            if (picture != nullptr)
+                window.present(*picture);
+            window.handleEvents();
+            lock.lock();
+        }
+    }
+    SDL_QuitSubSystem(SDL_INIT_VIDEO);
+}
+
+}  // namespace android

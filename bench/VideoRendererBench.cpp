@@ -30,7 +30,8 @@ class NoopListener : public VideoFrameData::VideoListener {
 public:
     void renderFrame(bool render, VideoFrameData& frame) override {
         benchmark::DoNotOptimize(render);
-        benchmark::DoNotOptimize(frame.mPTS);
+        const Uint33 pts = frame.mPTS;  // a packed field: read by value
+        benchmark::DoNotOptimize(pts);
     }
     bool captureFrame(VideoFrameData&, CaptureFrameListener*) override { return false; }
 };

@@ -24,45 +24,38 @@ struct Shown {
     Uint33 pts;
 };
 
-class FakeVideoListener : public VideoFrameData::VideoListener {
-public:
+struct FakeVideoListener : VideoFrameData::VideoListener {
     void renderFrame(bool render, VideoFrameData& frame) override {
-        std::lock_guard<std::mutex> lock(mLock);
-        mCalls.push_back({render, frame.mPTS});
+        std::lock_guard<std::mutex> hold(lock);
+        calls.push_back({render, frame.mPTS});
     }
     bool captureFrame(VideoFrameData& frame, CaptureFrameListener*) override {
-        std::lock_guard<std::mutex> lock(mLock);
-        mCaptures.push_back(frame.mPTS);
-        return mCaptureSucceeds;
+        captures.push_back(frame.mPTS);
+        return captureSucceeds;
     }
-    std::vector<Shown> calls() {
-        std::lock_guard<std::mutex> lock(mLock);
-        return mCalls;
+    std::vector<Shown> snapshot() {
+        std::lock_guard<std::mutex> hold(lock);
+        return calls;
     }
-    std::mutex mLock;
-    std::vector<Shown> mCalls;
-    std::vector<Uint33> mCaptures;
-    bool mCaptureSucceeds = true;
+    std::mutex lock;
+    std::vector<Shown> calls;
+    std::vector<Uint33> captures;
+    bool captureSucceeds = true;
 };
 
-class FakeRenderedListener : public VideoRenderer::FrameRenderedListener {
-public:
+struct FakeRenderedListener : VideoRenderer::FrameRenderedListener {
     void onFrameRendered(int width, int height, Uint33 pts) override {
-        mReports.push_back({width, height, pts});
+        EXPECT_EQ(width, 1920);
+        EXPECT_EQ(height, 1080);
+        reports.push_back(pts);
     }
     void onFirstFrameRendered(int, int) override {}
-    struct Report {
-        int width;
-        int height;
-        Uint33 pts;
-    };
-    std::vector<Report> mReports;
+    std::vector<Uint33> reports;
 };
 
-class FakeErrorListener : public ErrorListener {
-public:
-    void onError(unsigned int code, const Module*) const override { mCodes.push_back(code); }
-    mutable std::vector<unsigned int> mCodes;
+struct FakeErrorListener : ErrorListener {
+    void onError(unsigned int code, const Module*) const override { codes.push_back(code); }
+    mutable std::vector<unsigned int> codes;
 };
 
 // One renderer on a ring, its clock driven by the real PCR, and fake listeners.
@@ -115,10 +108,9 @@ public:
     bool renderDue(Uint33 pts, uint8_t keyFrame = 0) {
         presentAt(pts);
         writeFrame(pts, keyFrame);
-        const size_t before = mVideo.calls().size();
+        const size_t before = mVideo.calls.size();
         mRenderer->render();
-        const std::vector<Shown> calls = mVideo.calls();
-        return calls.size() == before + 1 && calls.back().render;
+        return mVideo.calls.size() == before + 1 && mVideo.calls.back().render;
     }
     bool clockRunning() {
         Uint33 pcr = 0;
@@ -150,7 +142,7 @@ struct TimingCase {
     int avOffsetMs;
     bool outputEnabled;
     bool clockSource;
-    bool shown;     // renderFrame(true) and reported
+    bool shown;     // renderFrame(true)
     bool reported;  // onFrameRendered
     const char* warning;
     bool clockReset;
@@ -160,21 +152,14 @@ TEST(VideoRendererTimingTest, LateAndEarlyFramesAgainstTheClock) {
     const TimingCase cases[] = {
         {"500 ms late: shown at once", 500, 0, true, true, true, true, nullptr, false},
         {"999 ms late: shown at once", 999, 0, true, true, true, true, nullptr, false},
-        {"1000 ms late: dropped", 1000, 0, true, true, false, false, "bad rendering time: -1000",
-         false},
-        {"10,000 ms late: dropped", 10000, 0, true, true, false, false, "rendering time: -10000",
-         false},
-        {"10,001 ms late: dropped, clock reset", 10001, 0, true, true, false, false,
-         "interaval: -10001", true},
-        {"10,001 ms early: dropped, clock reset", -10001, 0, true, true, false, false,
-         "interaval: 10001", true},
-        {"offset brings 1500 ms late within reach", 1500, 600, true, true, true, true, nullptr,
-         false},
-        {"offset makes a due frame 1000 ms late", 0, -1000, true, true, false, false,
-         "rendering time: -1000", false},
-        {"output disabled: released but reported", 0, 0, false, true, false, true, nullptr, false},
-        {"no clock source: dropped", 0, 0, true, false, false, false, "rendering time: -1000",
-         false},
+        {"1000 ms late", 1000, 0, true, true, false, false, "bad rendering time: -1000", false},
+        {"10,000 ms late", 10000, 0, true, true, false, false, "time: -10000", false},
+        {"10,001 ms late", 10001, 0, true, true, false, false, "interaval: -10001", true},
+        {"10,001 ms early", -10001, 0, true, true, false, false, "interaval: 10001", true},
+        {"offset brings 1500 ms late in reach", 1500, 600, true, true, true, true, nullptr, false},
+        {"offset makes a due frame late", 0, -1000, true, true, false, false, "time: -1000", false},
+        {"output disabled", 0, 0, false, true, false, true, nullptr, false},
+        {"no clock source", 0, 0, true, false, false, false, "time: -1000", false},
     };
     for (const TimingCase& c : cases) {
         SCOPED_TRACE(c.name);
@@ -187,151 +172,131 @@ TEST(VideoRendererTimingTest, LateAndEarlyFramesAgainstTheClock) {
         const Uint33 pts = mask33(kBasePCR - c.lateMs * 90);
         h.writeFrame(pts);
         h.mRenderer->render();
-        const std::vector<Shown> calls = h.mVideo.calls();
-        ASSERT_EQ(calls.size(), 1u);
-        EXPECT_EQ(calls[0].render, c.shown);
-        ASSERT_EQ(h.mRendered.mReports.size(), c.reported ? 1u : 0u);
-        if (c.reported) {
-            EXPECT_EQ(h.mRendered.mReports[0].width, 1920);
-            EXPECT_EQ(h.mRendered.mReports[0].height, 1080);
-            EXPECT_EQ(h.mRendered.mReports[0].pts, pts);
-        }
-        if (c.warning != nullptr)
-            EXPECT_EQ(trace.count(TRACE_WARNING, c.warning), 1u) << trace.all();
-        else
-            EXPECT_EQ(trace.count(TRACE_WARNING, "discarding"), 0u) << trace.all();
+        ASSERT_EQ(h.mVideo.calls.size(), 1u);
+        EXPECT_EQ(h.mVideo.calls[0].render, c.shown);
+        EXPECT_EQ(h.mRendered.reports,
+                  c.reported ? std::vector<Uint33>{pts} : std::vector<Uint33>{});
+        EXPECT_EQ(trace.count(TRACE_WARNING, c.warning ? c.warning : "discarding"),
+                  c.warning ? 1u : 0u)
+            << trace.all();
         EXPECT_EQ(h.clockRunning(), c.clockSource && !c.clockReset);
         EXPECT_EQ(h.mRing->usedSpace(), 0u);
     }
 }
 
-class VideoRendererPTSTest : public testing::Test {
-protected:
-    // Frames 3003 ticks apart (29.97 Hz), each due when rendered.
-    void renderSteps(Uint33 from, int count) {
-        for (int i = 0; i < count; ++i)
-            ASSERT_TRUE(h.renderDue(mask33(from + i * 3003ull)));
-    }
-    Harness h;
-    test::TraceCapture trace;
+// Steps of `step` ticks after `head`.
+std::vector<int64_t> steps(std::vector<int64_t> head, int repeats, int64_t step = 3003) {
+    head.insert(head.end(), repeats, step);
+    return head;
+}
+
+struct PTSCase {
+    const char* name;
+    Uint33 first;
+    std::vector<int64_t> steps;  // PTS of each further frame, from the one before
+    int keyFrame;                // index of the frame flagged as key frame, or -1
+    int firstDropped, lastDropped;
+    const char* message;
+    size_t messageCount;
 };
 
-TEST_F(VideoRendererPTSTest, AStepOf25TimesTheFrameSpacingIsAnError) {
-    renderSteps(kBasePCR, 4);
-    const Uint33 last = kBasePCR + 3 * 3003;
-    ASSERT_TRUE(h.renderDue(last + 75074));  // 25 x 3003 - 1
-    EXPECT_EQ(h.mRenderer->detectedDeltaPTS(), 3003u);
-    EXPECT_FALSE(h.renderDue(last + 75074 + 75075));  // exactly 25 x 3003
-    EXPECT_TRUE(h.mRenderer->isPTSError());
-    EXPECT_EQ(trace.count("error detected - delta PTS = 75075; mDetectedDeltaPTS = 3003"), 1u)
-        << trace.all();
-    EXPECT_EQ(trace.count("discarding frame due to (delta) PTS Error"), 1u);
-}
-
-TEST_F(VideoRendererPTSTest, SkipsForOneSecondOfPTSWithoutAKeyFrame) {
-    renderSteps(kBasePCR, 3);
-    const Uint33 errorPTS = kBasePCR + 2 * 3003 + 25 * 3003;
-    EXPECT_FALSE(h.renderDue(errorPTS));
-    int skipped = 1;
-    Uint33 pts = errorPTS;
-    while (true) {
-        pts += 3003;
-        if (h.renderDue(pts))
-            break;
-        ASSERT_LT(++skipped, 100);
+TEST(VideoRendererPTSTest, StepsOf25TimesTheSpacingSkipUntilAKeyFrameOrOneSecond) {
+    const PTSCase cases[] = {
+        {"75,074 is no error, 75,075 is",
+         kBasePCR,
+         {3003, 3003, 3003, 75074, 75075},
+         -1,
+         5,
+         5,
+         "error detected - delta PTS = 75075; mDetectedDeltaPTS = 3003",
+         1},
+        // The frame that raised the error and 29 more are skipped: the 30th after it is
+        // 90,090 ticks on.
+        {"one second without a key frame", kBasePCR, steps({3003, 3003, 75075}, 31), -1, 3, 32,
+         "waited too much for IDR frame (1s); rendering available frames)", 1},
+        {"a key frame ends the skipping", kBasePCR, steps({3003, 3003, 75075}, 3), 5, 3, 4,
+         "detected IDR frame; recovering from PTS error", 1},
+        // Across 2^33 the step is still 3003; a step back is no step at all.
+        {"wrap and a step back", 0x1FFFFFFFFull - 3 * 3003, steps({}, 7), -1, -1, -1,
+         "error detected", 0},
+    };
+    for (const PTSCase& c : cases) {
+        SCOPED_TRACE(c.name);
+        Harness h;
+        test::TraceCapture trace;
+        h.rebase(c.first);
+        std::vector<int64_t> all = c.steps;
+        if (c.firstDropped < 0)
+            all.insert(all.end(), {-6005, 3003});
+        Uint33 pts = c.first;
+        for (size_t i = 0; i <= all.size(); ++i) {
+            const bool dropped =
+                static_cast<int>(i) >= c.firstDropped && static_cast<int>(i) <= c.lastDropped;
+            ASSERT_EQ(h.renderDue(pts, static_cast<int>(i) == c.keyFrame), !dropped)
+                << "frame " << i;
+            if (i < all.size())
+                pts = mask33(pts + all[i]);
+        }
+        EXPECT_EQ(trace.count(c.message), c.messageCount) << trace.all();
     }
-    // The frame that raised the error and 29 more: the 30th is 90,090 ticks on.
-    EXPECT_EQ(skipped, 30);
-    EXPECT_EQ(trace.count("waited too much for IDR frame (1s); rendering available frames)"), 1u);
-    EXPECT_EQ(trace.count("skip frame; waiting for next IDR frame"), 29u);
-    renderSteps(pts + 3003, 3);
 }
 
-TEST_F(VideoRendererPTSTest, AKeyFrameEndsTheSkipping) {
-    renderSteps(kBasePCR, 3);
-    const Uint33 errorPTS = kBasePCR + 2 * 3003 + 30 * 3003;
-    EXPECT_FALSE(h.renderDue(errorPTS));
-    EXPECT_FALSE(h.renderDue(errorPTS + 3003));
-    EXPECT_TRUE(h.renderDue(errorPTS + 6006, 1));
-    EXPECT_EQ(trace.count("detected IDR frame; recovering from PTS error"), 1u);
-}
-
-TEST_F(VideoRendererPTSTest, WrapsAndBackwardJumpsAreNoErrors) {
-    // Across 2^33 the step is still 3003; a jump back is not a step at all.
-    h.rebase(0x1FFFFFFFFull - 3 * 3003);
-    renderSteps(0x1FFFFFFFFull - 3 * 3003, 8);
-    ASSERT_TRUE(h.renderDue(3003 * 2));
-    ASSERT_TRUE(h.renderDue(3003 * 3));
-    EXPECT_FALSE(h.mRenderer->isPTSError());
-    EXPECT_EQ(h.mRenderer->detectedDeltaPTS(), 3003u);
-}
-
-TEST(VideoRendererCaptureTest, SeriesOfThreeFramesHalfASecondApart) {
-    Harness h;
-    int token = 0;
-    h.mRenderer->setCaptureFrameListener(reinterpret_cast<CaptureFrameListener*>(&token));
-    h.presentAt(kBasePCR);
-    h.mRenderer->getFrame(3, 500);
-    EXPECT_EQ(h.mRenderer->captureCount(), 3);
-    for (int i = 0; i <= 15; ++i) {
-        if (i == 3)
-            h.mRenderer->getFrame(5, 100);    // ignored: a series runs
-        h.renderDue(kBasePCR + i * 9000ull);  // 100 ms apart
+TEST(VideoRendererCaptureTest, SeriesTakeOneFramePerIntervalAndGiveUpAfterThreeFailures) {
+    struct {
+        bool succeeds;
+        int count, intervalMs;
+        std::vector<int> capturedFrames;  // of frames 100 ms apart
+    } cases[] = {{true, 3, 500, {0, 5, 10}}, {false, 1, 100, {0, 1, 2}}};
+    for (const auto& c : cases) {
+        Harness h;
+        int token = 0;
+        h.mVideo.captureSucceeds = c.succeeds;
+        h.mRenderer->setCaptureFrameListener(reinterpret_cast<CaptureFrameListener*>(&token));
+        h.presentAt(kBasePCR);
+        h.mRenderer->getFrame(c.count, c.intervalMs);
+        std::vector<Uint33> expected;
+        for (int i = 0; i <= 15; ++i) {
+            if (i == 1)
+                h.mRenderer->getFrame(5, 100);  // ignored: a series runs
+            ASSERT_TRUE(h.renderDue(kBasePCR + i * 9000ull));
+        }
+        for (int frame : c.capturedFrames)
+            expected.push_back(kBasePCR + frame * 9000ull);
+        EXPECT_EQ(h.mVideo.captures, expected);
+        EXPECT_EQ(h.mRenderer->captureCount(), 0);
     }
-    EXPECT_EQ(h.mVideo.mCaptures,
-              (std::vector<Uint33>{kBasePCR, kBasePCR + 45000, kBasePCR + 90000}));
-    EXPECT_EQ(h.mRenderer->captureCount(), 0);
-}
-
-TEST(VideoRendererCaptureTest, ACaptureThatFailsThreeTimesIsGivenUp) {
-    Harness h;
-    int token = 0;
-    h.mVideo.mCaptureSucceeds = false;
-    h.mRenderer->setCaptureFrameListener(reinterpret_cast<CaptureFrameListener*>(&token));
-    h.presentAt(kBasePCR);
-    h.mRenderer->getFrame(1, 100);
-    for (int i = 0; i < 5; ++i)
-        h.renderDue(kBasePCR + i * 9000ull);
-    EXPECT_EQ(h.mVideo.mCaptures.size(), 3u);
-    EXPECT_EQ(h.mRenderer->captureCount(), 0);
-    EXPECT_EQ(h.mVideo.calls().size(), 5u);  // the frames themselves were all shown
 }
 
 TEST(VideoRendererRecordTest, BadRecordsAreSkippedAndTheNextFrameIsShown) {
-    struct BadRecord {
+    struct {
         const char* name;
-        uint32_t type;
-        uint32_t claimed;
-        uint32_t written;
+        uint32_t type, claimed, written;
         const char* message;
         bool reported;
     } cases[] = {
         {"PES record", Data::TYPE_PES, 120, 120, "frame is not a video format", true},
-        {"audio record", Data::TYPE_AUDIO_FRAGMENT, 4000, 4000, "frame is not a video format",
-         true},
-        {"video record too short", Data::TYPE_VIDEO_FRAME, 40, 40, "frame is not a video format",
-         true},
+        {"audio record", Data::TYPE_AUDIO_FRAGMENT, 4000, 4000, "not a video format", true},
+        {"short video record", Data::TYPE_VIDEO_FRAME, 40, 40, "not a video format", true},
         {"size beyond the data", Data::TYPE_VIDEO_FRAME, 4096, 80, "RingBuffer inconsistency",
          false},
         {"size zero", Data::TYPE_PES, 0, 80, "RingBuffer inconsistency", false},
     };
-    for (const BadRecord& c : cases) {
+    for (const auto& c : cases) {
         SCOPED_TRACE(c.name);
         Harness h;
         test::TraceCapture trace;
         h.writeRaw(c.type, c.claimed, c.written);
-        if (c.written < VideoFrameData::kRecordSize)
-            h.writeFrame(kBasePCR);  // waitForData(80) needs more than the short record
+        h.writeFrame(kBasePCR);
         h.mRenderer->render();
         EXPECT_EQ(trace.count(c.message), 1u) << trace.all();
-        EXPECT_EQ(h.mErrors.mCodes,
+        EXPECT_EQ(h.mErrors.codes,
                   c.reported ? std::vector<unsigned int>{0x41003} : std::vector<unsigned int>{});
-        EXPECT_TRUE(h.mVideo.calls().empty());
-        if (c.written >= VideoFrameData::kRecordSize)
+        // An inconsistent ring is emptied, so the frame written after it was lost too.
+        if (!c.reported)
             h.writeFrame(kBasePCR);
         h.mRenderer->render();
-        ASSERT_EQ(h.mVideo.calls().size(), 1u);
-        EXPECT_TRUE(h.mVideo.calls()[0].render);
+        ASSERT_EQ(h.mVideo.calls.size(), 1u);
+        EXPECT_TRUE(h.mVideo.calls[0].render);
         EXPECT_EQ(h.mRing->usedSpace(), 0u);
     }
 }
@@ -354,10 +319,10 @@ TEST(VideoRendererThreadTest, StopCutsALongWaitShort) {
         EXPECT_LT(std::chrono::steady_clock::now() - before, std::chrono::seconds(2));
         EXPECT_EQ(h.mRenderer->state(), VideoRenderer::STATE_STOPPED);
         // Neither shown nor reported; its buffer goes back to the decoder.
-        const std::vector<Shown> calls = h.mVideo.calls();
+        const std::vector<Shown> calls = h.mVideo.snapshot();
         ASSERT_EQ(calls.size(), 1u);
         EXPECT_FALSE(calls[0].render);
-        EXPECT_TRUE(h.mRendered.mReports.empty());
+        EXPECT_TRUE(h.mRendered.reports.empty());
         EXPECT_EQ(trace.count("discarding"), 0u) << trace.all();
     }
 }

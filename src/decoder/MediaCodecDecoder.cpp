@@ -50,8 +50,8 @@ MediaCodecDecoder::~MediaCodecDecoder() {
     }
     if (mCaptureThread != nullptr) {
         android::sp<android::Thread> capture = mCaptureThread;
-        joinThread(capture);
         mCaptureThread.clear();
+        joinThread(capture);
     }
     if (mMediaCodec != nullptr)
         mMediaCodec->release();

@@ -39,6 +39,7 @@ status_t ALooper::stop() {
         if (mThread == nullptr)
             return OK;
         thread = mThread;
+        mThread.clear();  // `thread` is then this side's only reference
         mStopping = true;
         thread->requestExit();
         mQueueChanged.broadcast();
@@ -49,14 +50,13 @@ status_t ALooper::stop() {
     for (int i = 0; i < 1000 && thread->getStrongCount() > 1; ++i)
         usleep(1000);
     Mutex::Autolock lock(mLock);
-    mThread.clear();
     mQueue.clear();
     return result;
 }
 
 status_t ALooper::post(std::function<void()> work) {
     Mutex::Autolock lock(mLock);
-    if (mThread == nullptr || mStopping)
+    if (mThread == nullptr)
         return INVALID_OPERATION;
     mQueue.push_back(std::move(work));
     mQueueChanged.broadcast();

@@ -134,8 +134,7 @@ private:
 
     class OutputDeviceThread : public android::Thread {
     public:
-        explicit OutputDeviceThread(AudioRenderer* renderer)
-            : android::Thread(false), mRenderer(renderer) {}
+        OutputDeviceThread() : android::Thread(false) {}
         // requestExit and a wake-up of the one-second wait.
         void stopRequest();
 
@@ -145,7 +144,6 @@ private:
 
     private:
         bool threadLoop() override;
-        AudioRenderer* mRenderer;
         std::mutex mWaitLock;
         std::condition_variable mWaitCondition;
         bool mWake = false;
@@ -184,10 +182,8 @@ private:
     std::atomic<AudioRenderedListener*> mListener;
     android::sp<OutputDeviceThread> mOutputDeviceThread;
     std::mutex mLock;
+    // Guards the track and output device thread pointers (see above).
     std::mutex mTrackLock;
-    // Render thread only: the claimed size of a record that was not yet readable,
-    // waited for (at most 100 ms per pass) instead of spinning on it.
-    uint32_t mPendingRecordSize;
 };
 
 }  // namespace TavoPlayer

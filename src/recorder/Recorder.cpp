@@ -50,7 +50,11 @@ char* copyName(const std::map<std::string, std::string>& queries, const char* ke
 
 Recorder::Recorder() : mListener(nullptr) {}
 
-Recorder::~Recorder() = default;
+Recorder::~Recorder() {
+    // The recording service may still hold an event for this recorder (a refusal
+    // posted after the recording was given up): it must not arrive after us.
+    RecPlayerBinder_ForgetEvents(this);
+}
 
 void Recorder::start(const Uri* uri, int videoPid, int audioPid, int /*reserved*/, int isLATM) {
     const char* op = "start";

@@ -64,10 +64,10 @@ void MP4Controller::createInternalTimer() {
 }
 
 void MP4Controller::startInternalTimer() {
-    struct itimerspec spec {};
-    spec.it_value.tv_nsec = kTimeUpdateIntervalNs;
-    spec.it_interval.tv_nsec = kTimeUpdateIntervalNs;
-    if (!mTimerCreated || timer_settime(mTimer, 0, &spec, nullptr) != 0) {
+    struct itimerspec period {};
+    period.it_value.tv_nsec = kTimeUpdateIntervalNs;
+    period.it_interval.tv_nsec = kTimeUpdateIntervalNs;
+    if (!mTimerCreated || timer_settime(mTimer, 0, &period, nullptr) != 0) {
         const int error = mTimerCreated ? errno : EINVAL;
         TAVO_LOGE("%s: Error starting timer to update UI: %d (%s)\n", __func__, error,
                   strerror(error));
@@ -75,8 +75,8 @@ void MP4Controller::startInternalTimer() {
 }
 
 void MP4Controller::stopInternalTimer(const char* caller) {
-    struct itimerspec spec {};
-    if (!mTimerCreated || timer_settime(mTimer, 0, &spec, nullptr) != 0) {
+    struct itimerspec period {};
+    if (!mTimerCreated || timer_settime(mTimer, 0, &period, nullptr) != 0) {
         const int error = mTimerCreated ? errno : EINVAL;
         TAVO_LOGE("%s: Error stopping timer to update UI: %d (%s)\n", caller, error,
                   strerror(error));

@@ -31,6 +31,10 @@ public:
     // Waits until every event posted before the call has been delivered; false when
     // the time-out passed first. Must not be called from an event function.
     bool drain(std::chrono::milliseconds timeout);
+    // Drops the events still queued for `userData` and, unless called from an event
+    // function, waits until one being delivered to it has returned: its owner is
+    // about to go away.
+    void forget(void* userData);
     uint64_t delivered() const;
 
 private:
@@ -43,10 +47,11 @@ private:
 
     mutable std::mutex mLock;
     std::condition_variable mChanged;
-    std::deque<Event> mQueue;  // mLock
-    uint64_t mPosted = 0;      // mLock
-    uint64_t mDelivered = 0;   // mLock
-    bool mStop = false;        // mLock
+    std::deque<Event> mQueue;   // mLock
+    uint64_t mPosted = 0;       // mLock
+    uint64_t mDelivered = 0;    // mLock
+    void* mInFlight = nullptr;  // mLock: userData of the event being delivered
+    bool mStop = false;         // mLock
     std::thread mThread;
 };
 

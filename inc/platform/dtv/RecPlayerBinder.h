@@ -74,6 +74,10 @@ int RecPlayerBinder_DeleteTSRecorder();
 
 // --- recorded-clip playback ---------------------------------------------------
 int RecPlayerBinder_IsTSPlayerActive(RecPlayerEventCallback callback, void* userData);
+// No event reaches `userData` after this returns (queued ones are dropped, one being
+// delivered is waited for): whoever registered an event function calls it before
+// going away. Always 1.
+int RecPlayerBinder_ForgetEvents(void* userData);
 // notOnExternalCard: 1 when the clip path is not on the external storage card.
 RecDetails* RecPlayerBinder_GetRecClipDetails(const char* clipPath, int notOnExternalCard);
 int RecPlayerBinder_PauseTSPlayer();

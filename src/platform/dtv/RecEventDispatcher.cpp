@@ -30,6 +30,22 @@ bool RecEventDispatcher::drain(std::chrono::milliseconds timeout) {
     return mChanged.wait_for(lock, timeout, [&] { return mDelivered >= target; });
 }
 
+void RecEventDispatcher::forget(void* userData) {
+    std::unique_lock<std::mutex> lock(mLock);
+    for (auto it = mQueue.begin(); it != mQueue.end();) {
+        if (it->userData == userData) {
+            it = mQueue.erase(it);
+            ++mDelivered;  // counted as done, so that drain() still finishes
+        } else {
+            ++it;
+        }
+    }
+    if (std::this_thread::get_id() == mThread.get_id())
+        return;
+    while (mInFlight == userData && userData != nullptr)
+        mChanged.wait_for(lock, std::chrono::milliseconds(100));
+}
+
 uint64_t RecEventDispatcher::delivered() const {
     std::lock_guard<std::mutex> lock(mLock);
     return mDelivered;
@@ -49,9 +65,11 @@ void RecEventDispatcher::run() {
         }
         const Event e = mQueue.front();
         mQueue.pop_front();
+        mInFlight = e.userData;
         lock.unlock();
         e.callback(e.event, e.userData);
         lock.lock();
+        mInFlight = nullptr;
         ++mDelivered;
         mChanged.notify_all();
     }

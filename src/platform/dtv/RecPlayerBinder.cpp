@@ -54,6 +54,11 @@ int RecPlayerBinder_IsTSPlayerActive(RecPlayerEventCallback callback, void* user
     return service().isTSPlayerActive(callback, userData);
 }
 
+int RecPlayerBinder_ForgetEvents(void* userData) {
+    service().events().forget(userData);
+    return 1;
+}
+
 RecDetails* RecPlayerBinder_GetRecClipDetails(const char* clipPath, int notOnExternalCard) {
     return service().getRecClipDetails(clipPath, notOnExternalCard);
 }

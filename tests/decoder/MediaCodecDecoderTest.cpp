@@ -86,8 +86,9 @@ TEST_F(MediaCodecDecoderTest, EmptyInputQueuesEmptyBuffers) {
     EXPECT_EQ(0u, mOutput->usedSpace());
     EXPECT_EQ(0u, mDecoder->stop());
     EXPECT_EQ(1u, mDecoder->getStateForTest());
-    EXPECT_EQ(0u, test::threadsNamed("MCInputThread"));
-    EXPECT_EQ(0u, test::threadsNamed("MCOutputThread"));
+    // Joined libutils threads are detached: their tasks may linger a moment.
+    EXPECT_TRUE(test::waitUntil([] { return test::threadsNamed("MCInputThread") == 0; }));
+    EXPECT_TRUE(test::waitUntil([] { return test::threadsNamed("MCOutputThread") == 0; }));
     EXPECT_EQ(1u, mDecoder->stop());
     // Restartable, and the input ring was left free for its next reader.
     EXPECT_EQ(0u, mDecoder->start());

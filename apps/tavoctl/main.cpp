@@ -200,7 +200,8 @@ const Command kCommands[] = {
     {"pcr", "", "print the current PCR (90 kHz)"},
     {"dump", "", "ask the service for its dump (needs the dump permission)"},
     {"wait", "SECONDS", "wait, printing callbacks"},
-    {"waitfor", "CALLBACK [SECONDS]", "wait for the next callback of that name (default 30 s)"},
+    {"waitfor", "CALLBACK [SECONDS]",
+     "wait for a callback of that name not yet waited for (default 30 s)"},
 };
 
 void usage(FILE* out) {
@@ -396,7 +397,13 @@ private:
             if (w.size() < 2 || (w.size() > 2 && !toInt(w[2], &a[0])))
                 return false;
             const int32_t seconds = w.size() > 2 ? a[0] : 30;
-            return mClient->waitFor(w[1], mClient->count(w[1]), std::chrono::seconds(seconds));
+            // A callback that came while an earlier command ran counts: scripts
+            // cannot know whether it will come before or after they ask.
+            size_t& waited = mWaited[w[1]];
+            if (!mClient->waitFor(w[1], waited, std::chrono::seconds(seconds)))
+                return false;
+            waited = mClient->count(w[1]);
+            return true;
         }
         std::fprintf(stderr, "tavoctl: unknown command '%s' (see --help)\n", c.c_str());
         return false;
@@ -405,6 +412,7 @@ private:
     sp<ICTavoPlayer> mService;
     sp<Client> mClient;
     sp<android::Surface> mSurface;
+    std::map<std::string, size_t> mWaited;  // per callback: how many 'waitfor' consumed
 };
 
 }  // namespace

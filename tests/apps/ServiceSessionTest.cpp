@@ -1,0 +1,172 @@
+// The service as a client meets it: tavoplayerd serving a tsgen broadcast from a
+// file, driven by tavoctl over the socket transport, each a process of its own.
+#include <gtest/gtest.h>
+#include <signal.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <cstdio>
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <sstream>
+#include <string>
+#include <thread>
+
+namespace {
+
+namespace fs = std::filesystem;
+
+const std::string kBin = TAVO_BINARY_DIR "/apps/";
+constexpr const char* kLive =
+    "open 5 MTV://tuner/live?pcrPid=273;videoPid=273;audioPid=274;IsLATMAudio=1;"
+    "subtitlePid=304;";
+
+// Runs a shell command line, returning its exit status and its output.
+int run(const std::string& command, std::string* output) {
+    FILE* pipe = popen((command + " 2>&1").c_str(), "r");
+    if (pipe == nullptr)
+        return -1;
+    char buffer[4096];
+    size_t n;
+    while ((n = fread(buffer, 1, sizeof buffer, pipe)) > 0)
+        output->append(buffer, n);
+    const int status = pclose(pipe);
+    return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+}
+
+class ServiceSession : public testing::Test {
+protected:
+    static void SetUpTestSuite() {
+        sDir = fs::temp_directory_path() / ("tavo-session-" + std::to_string(getpid()));
+        fs::create_directories(sDir);
+        std::string out;
+        ASSERT_EQ(run(std::string(TAVO_TSGEN_PATH) + " -o " + (sDir / "live.ts").string() +
+                          " -d 14 --caption 2:Olá --caption 5:'Ação, você'",
+                      &out),
+                  0)
+            << out;
+    }
+    static void TearDownTestSuite() { fs::remove_all(sDir); }
+
+    void SetUp() override {
+        const std::string env = environment();
+        mDaemon = fork();
+        ASSERT_GE(mDaemon, 0);
+        if (mDaemon == 0) {
+            execl("/bin/sh", "sh", "-c",
+                  (env + " exec " + kBin + "tavoplayerd/tavoplayerd --log-level warning 2>" +
+                   (sDir / "daemon.log").string())
+                      .c_str(),
+                  nullptr);
+            _exit(127);
+        }
+        // The service is there once its socket is.
+        for (int i = 0; i < 100 && !fs::exists(sDir / "svc" / "TavoPlayer"); ++i)
+            std::this_thread::sleep_for(std::chrono::milliseconds(50));
+        ASSERT_TRUE(fs::exists(sDir / "svc" / "TavoPlayer"));
+    }
+    void TearDown() override {
+        if (mDaemon > 0) {
+            kill(mDaemon, SIGTERM);
+            int status = 0;
+            waitpid(mDaemon, &status, 0);
+            EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0)
+                << "tavoplayerd did not exit 0 on SIGTERM";
+        }
+    }
+
+    static std::string environment() {
+        return "TAVOPLAYER_SERVICE_DIR=" + (sDir / "svc").string() +
+               " TAVOPLAYER_PROP_tavoplayer_demux_source=file:" + (sDir / "live.ts").string() +
+               " TAVOPLAYER_PROP_tavoplayer_video_sink=null"
+               " TAVOPLAYER_PROP_tavoplayer_audio_sink=null"
+               " TAVOPLAYER_PROP_tavoplayer_recordings_dir=" +
+               (sDir / "rec").string();
+    }
+    // tavoctl with the given commands, each one argument.
+    static int tavoctl(const std::string& commands, std::string* output) {
+        return run("timeout 90 env " + environment() + " " + kBin + "tavoctl/tavoctl " + commands,
+                   output);
+    }
+
+    static fs::path sDir;
+    pid_t mDaemon = -1;
+};
+
+fs::path ServiceSession::sDir;
+
+TEST_F(ServiceSession, AWholeSessionGivesItsCallbacksInOrderAndAReadablePicture) {
+    const std::string png = (sDir / "capture.png").string();
+    std::string out;
+    const int status = tavoctl(std::string("'") + kLive +
+                                   "' start 'waitfor onStartVideoTask 20' 'waitfor onBufferingEnd "
+                                   "20' 'capture 320 240 " +
+                                   png +
+                                   "' pause resume 'record FILE://rec/session?channelName=t;' "
+                                   "'waitfor closedCaptionText 20' "
+                                   "'wait 1' stoprecord 'waitfor onRecorderStopped 10' stop close",
+                               &out);
+    EXPECT_EQ(status, 0) << out;
+    // Each callback in the order the session must see them.
+    size_t at = 0;
+    for (const char* expected :
+         {"<- onBufferingBegin()", "<- openUriComplete(0)", "<- startComplete(0)",
+          "<- onStartVideoTask(1920, 1080)", "<- onBufferingEnd()",
+          "<- onCaptureFrame(1920, 1080, 0)", "<- onPaused(0)", "<- onResumed(0)",
+          "<- onRecorderStarted(", "<- closedCaptionText(16) \"Olá", "<- onRecorderStopped("}) {
+        const size_t found = out.find(expected, at);
+        ASSERT_NE(found, std::string::npos) << "missing or out of order: " << expected << "\n"
+                                            << out;
+        at = found;
+    }
+    std::string probe;
+    ASSERT_EQ(run("ffprobe -v error -show_entries stream=width,height -of csv=p=0 " + png, &probe),
+              0);
+    EXPECT_EQ(probe, "320,240\n");
+}
+
+TEST_F(ServiceSession, AClientThatDiesMidPlaybackLeavesTheServiceReadyForTheNext) {
+    std::string out;
+    // Killed by timeout while playing: the service sees the hang-up as a death.
+    run("timeout -s KILL 6 env " + environment() + " " + kBin + "tavoctl/tavoctl '" + kLive +
+            "' start 'wait 30'",
+        &out);
+    std::string next;
+    EXPECT_EQ(tavoctl(std::string("state '") + kLive +
+                          "' start 'waitfor onStartVideoTask 20' stop close state",
+                      &next),
+              0)
+        << next;
+    // The first line is the state the dead client left: Closed.
+    EXPECT_NE(next.find("state 1 Closed"), std::string::npos) << next;
+    std::ifstream log(sDir / "daemon.log");
+    std::stringstream text;
+    text << log.rdbuf();
+    EXPECT_NE(text.str().find("binderDied"), std::string::npos) << text.str();
+}
+
+TEST_F(ServiceSession, CommandsThatFailGiveANonZeroExit) {
+    const struct {
+        const char* commands;
+        int status;
+    } cases[] = {
+        {"'open 5 NOT A URI'", 1},
+        {"'open 3 MTV://x/y?a=1;'", 1},
+        {"start", 1},  // Closed: startComplete(1)
+        {"bogus", 1},
+        {"'seek abc'", 1},
+    };
+    for (const auto& c : cases) {
+        std::string out;
+        EXPECT_EQ(tavoctl(c.commands, &out), c.status) << c.commands << "\n" << out;
+    }
+    kill(mDaemon, SIGTERM);
+    waitpid(mDaemon, nullptr, 0);
+    mDaemon = -1;
+    std::string out;
+    EXPECT_EQ(tavoctl("state", &out), 3) << out;
+}
+
+}  // namespace

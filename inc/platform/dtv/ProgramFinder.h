@@ -44,6 +44,9 @@ class ProgramFinder {
 public:
     // Looks for the programme whose PMT lists `pid`.
     explicit ProgramFinder(uint16_t pid);
+    // Looks for the programme of that program_number instead; 0 takes the first
+    // programme whose PMT arrives (a capture may hold the PMT of only some).
+    static std::unique_ptr<ProgramFinder> forProgram(uint16_t programNumber);
     ~ProgramFinder();
     ProgramFinder(const ProgramFinder&) = delete;
     ProgramFinder& operator=(const ProgramFinder&) = delete;
@@ -61,6 +64,8 @@ public:
 
 private:
     uint16_t mPid;
+    bool mByProgram = false;
+    uint16_t mProgramNumber = 0;
     bool mHavePat = false;
     uint16_t mTransportStreamId = 0;
     std::vector<uint16_t> mPmtPids;

@@ -83,6 +83,8 @@ struct ProgramFinder::Decoders {
         bool carries = false;
         for (const dvbpsi_pmt_es_t* es = pmt->p_first_es; es != nullptr; es = es->p_next)
             carries = carries || es->i_pid == finder.mPid;
+        if (finder.mByProgram)
+            carries = finder.mProgramNumber == 0 || pmt->i_program_number == finder.mProgramNumber;
         if (carries && !finder.mProgram) {
             ProgramInfo info;
             info.transportStreamId = finder.mTransportStreamId;
@@ -128,6 +130,13 @@ const ProgramStream* ProgramInfo::captionStream() const {
         }
     }
     return nullptr;
+}
+
+std::unique_ptr<ProgramFinder> ProgramFinder::forProgram(uint16_t programNumber) {
+    auto finder = std::make_unique<ProgramFinder>(0);
+    finder->mByProgram = true;
+    finder->mProgramNumber = programNumber;
+    return finder;
 }
 
 ProgramFinder::ProgramFinder(uint16_t pid) : mPid(pid), mDecoders(std::make_unique<Decoders>()) {

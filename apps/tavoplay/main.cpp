@@ -1,0 +1,529 @@
+// tavoplay: watch a broadcast with one command. It reads the source's PAT and PMT
+// to find the programme, starts a private tavoplayerd on that source, opens the
+// "MTV" URI, starts playback and shows what the service reports: captions as they
+// arrive and a status line (state, signal, buffering, frame rate, time).
+//
+// Exit status, as mpv's: 0 at the end of the stream or on quit, 1 when the service
+// fails or dies, 2 when the source cannot be played (with a one-line reason).
+#include <arpa/inet.h>
+#include <fcntl.h>
+#include <getopt.h>
+#include <netinet/in.h>
+#include <poll.h>
+#include <signal.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <termios.h>
+#include <unistd.h>
+
+#include <atomic>
+#include <chrono>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <filesystem>
+#include <mutex>
+#include <string>
+#include <thread>
+
+#include "StreamProbe.h"
+#include "platform/binder/IServiceManager.h"
+#include "platform/binder/ProcessState.h"
+#include "platform/gui/Surface.h"
+#include "service/BnCTavoPlayerClient.h"
+#include "service/ICTavoPlayer.h"
+
+using android::sp;
+using tavoplay::AudioCoding;
+using tavoplay::ProbedProgram;
+namespace fs = std::filesystem;
+
+namespace {
+
+constexpr size_t kProbeLimit = 16 << 20;  // a PAT/PMT period is well under this
+
+[[noreturn]] void fail(int status, const std::string& reason) {
+    std::fprintf(stderr, "tavoplay: %s\n", reason.c_str());
+    std::exit(status);
+}
+
+void usage(FILE* out) {
+    std::fprintf(out,
+                 "Usage: tavoplay [OPTIONS] SOURCE\n"
+                 "Plays the first programme (or --program N) of SOURCE: a TS file,\n"
+                 "udp://GROUP:PORT or - (standard input).\n\n"
+                 "  -p, --program N   programme number to play\n"
+                 "      --headless    null video and audio outputs (chosen by itself when\n"
+                 "                    there is no display or no sound card)\n"
+                 "      --loop        play a file again and again\n"
+                 "      --probe       print the programme found and its MTV URI, then exit\n"
+                 "  -h, --help        this text\n\n"
+                 "Keys: space pause/resume, c capture to PNG, r record on/off,\n"
+                 "      a next audio PID, s captions on/off, q quit.\n"
+                 "Exit status: 0 end or quit, 1 the service failed, 2 cannot play SOURCE.\n");
+}
+
+std::string utf32ToUtf8(const uint8_t* text, int32_t length) {
+    std::string out;
+    for (int32_t i = 0; i + 4 <= length; i += 4) {
+        uint32_t cp;
+        std::memcpy(&cp, text + i, 4);
+        if (cp < 0x80) {
+            out += static_cast<char>(cp);
+        } else if (cp < 0x800) {
+            out += static_cast<char>(0xC0 | (cp >> 6));
+            out += static_cast<char>(0x80 | (cp & 0x3F));
+        } else if (cp < 0x10000) {
+            out += static_cast<char>(0xE0 | (cp >> 12));
+            out += static_cast<char>(0x80 | ((cp >> 6) & 0x3F));
+            out += static_cast<char>(0x80 | (cp & 0x3F));
+        }
+    }
+    return out;
+}
+
+// What the service reported, shown on one status line.
+class Viewer : public TavoPlayer::BnCTavoPlayerClient {
+public:
+    std::atomic<int> openStatus{-1};
+    std::atomic<int> startStatus{-1};
+    std::atomic<int> signal{0};
+    std::atomic<bool> signalLost{false};
+    std::atomic<bool> captionsOn{true};
+    std::atomic<int> errorCode{0};
+
+    void status(const char* state, int frameRate) {
+        std::lock_guard<std::mutex> lock(mLock);
+        static const char* const kSignal[] = {"good", "late", "lost"};
+        const int s = signal.load();
+        std::fprintf(stderr, "\r[%s] signal %s, buffering %d%%, %d fps, video %dx%d   ", state,
+                     s >= 0 && s < 3 ? kSignal[s] : "?", mBuffering, frameRate, mWidth, mHeight);
+        std::fflush(stderr);
+    }
+
+    void openUriComplete(int32_t s) override { openStatus = s; }
+    void startComplete(int32_t s) override { startStatus = s; }
+    void onCaptureFrame(uint8_t*, int32_t w, int32_t h, int32_t) override {
+        line("captured a %dx%d frame", w, h);
+    }
+    void onSignalStatusChanged(int32_t, int32_t current) override {
+        signal = current;
+        if (current == 2)
+            signalLost = true;
+    }
+    void closedCaptionText(const uint8_t* text, int32_t length) override {
+        if (captionsOn)
+            line("caption: %s", utf32ToUtf8(text, length).c_str());
+    }
+    void onStopComplete(int32_t) override {}
+    void onError(int32_t code) override {
+        errorCode = code;
+        line("service error 0x%x", static_cast<unsigned>(code));
+    }
+    void onBufferingBegin() override { setBuffering(0); }
+    void onBufferingEnd() override { setBuffering(100); }
+    void onBuffering(int32_t p) override { setBuffering(p); }
+    void onAudioSessionId(int32_t) override {}
+    void onStartVideoTask(int32_t w, int32_t h) override {
+        std::lock_guard<std::mutex> lock(mLock);
+        mWidth = w;
+        mHeight = h;
+    }
+    void onTimeUpdate(int32_t) override {}
+    void onEndOfContent() override { line("end of content"); }
+    void onRecorderStarted(int32_t s) override { line("recording started (%d)", s); }
+    void onRecorderStopped(int32_t s) override { line("recording stopped (%d)", s); }
+    void onPaused(int32_t) override {}
+    void onResumed(int32_t) override {}
+    void onSeeked(int32_t) override {}
+
+    template <typename... Args>
+    void line(const char* format, Args... args) {
+        std::lock_guard<std::mutex> lock(mLock);
+        std::fprintf(stderr, "\r\033[K");
+        std::printf(format, args...);
+        std::printf("\n");
+        std::fflush(stdout);
+    }
+
+private:
+    void setBuffering(int p) {
+        std::lock_guard<std::mutex> lock(mLock);
+        mBuffering = p;
+    }
+    std::mutex mLock;
+    int mBuffering = 0;
+    int mWidth = 0;
+    int mHeight = 0;
+};
+
+// Reads the start of the source into the probe. For '-', the bytes read are kept:
+// they go to the service first.
+std::string probeSource(const std::string& source, tavoplay::StreamProbe& probe,
+                        std::string* consumed) {
+    std::vector<uint8_t> buffer(64 * 1024);
+    size_t total = 0;
+    if (source.rfind("udp://", 0) == 0) {
+        const std::string hostPort = source.substr(6);
+        const size_t colon = hostPort.rfind(':');
+        if (colon == std::string::npos)
+            return "udp source needs GROUP:PORT";
+        const std::string host = hostPort.substr(0, colon);
+        const int port = std::atoi(hostPort.c_str() + colon + 1);
+        const int fd = socket(AF_INET, SOCK_DGRAM, 0);
+        int one = 1;
+        setsockopt(fd, SOL_SOCKET, SO_REUSEADDR, &one, sizeof one);
+        sockaddr_in addr{};
+        addr.sin_family = AF_INET;
+        addr.sin_port = htons(static_cast<uint16_t>(port));
+        in_addr group{};
+        if (inet_pton(AF_INET, host.c_str(), &group) != 1) {
+            ::close(fd);
+            return "udp source needs a numeric IPv4 address";
+        }
+        const bool multicast = (ntohl(group.s_addr) >> 28) == 14;
+        addr.sin_addr.s_addr = multicast ? group.s_addr : htonl(INADDR_ANY);
+        if (bind(fd, reinterpret_cast<sockaddr*>(&addr), sizeof addr) != 0) {
+            ::close(fd);
+            return "cannot listen on " + source + ": " + std::strerror(errno);
+        }
+        if (multicast) {
+            ip_mreq mreq{};
+            mreq.imr_multiaddr = group;
+            setsockopt(fd, IPPROTO_IP, IP_ADD_MEMBERSHIP, &mreq, sizeof mreq);
+        }
+        const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(5);
+        bool done = false;
+        while (!done && total < kProbeLimit && std::chrono::steady_clock::now() < deadline) {
+            pollfd p{fd, POLLIN, 0};
+            if (poll(&p, 1, 200) <= 0)
+                continue;
+            const ssize_t n = recv(fd, buffer.data(), buffer.size(), 0);
+            if (n > 0) {
+                total += static_cast<size_t>(n);
+                done = probe.feed(buffer.data(), static_cast<size_t>(n));
+            }
+        }
+        ::close(fd);
+        if (total == 0)
+            return "nothing arrived on " + source + " within 5 s";
+        return "";
+    }
+    const bool isStdin = source == "-";
+    const int fd = isStdin ? STDIN_FILENO : open(source.c_str(), O_RDONLY);
+    if (fd < 0)
+        return "cannot open " + source + ": " + std::strerror(errno);
+    bool done = false;
+    while (!done && total < kProbeLimit) {
+        const ssize_t n = read(fd, buffer.data(), buffer.size());
+        if (n <= 0)
+            break;
+        total += static_cast<size_t>(n);
+        if (isStdin)
+            consumed->append(reinterpret_cast<const char*>(buffer.data()), static_cast<size_t>(n));
+        done = probe.feed(buffer.data(), static_cast<size_t>(n));
+    }
+    if (!isStdin)
+        ::close(fd);
+    return "";
+}
+
+// The tavoplayerd beside this program (build tree or installed), else from PATH.
+std::string daemonPath(const char* argv0) {
+    std::error_code ec;
+    const fs::path self = fs::canonical("/proc/self/exe", ec);
+    for (const fs::path& candidate :
+         {self.parent_path() / "tavoplayerd",
+          self.parent_path().parent_path() / "tavoplayerd" / "tavoplayerd"})
+        if (!ec && access(candidate.c_str(), X_OK) == 0)
+            return candidate.string();
+    (void)argv0;
+    return "tavoplayerd";
+}
+
+bool haveSoundCard() {
+    FILE* cards = std::fopen("/proc/asound/cards", "r");
+    if (cards == nullptr)
+        return false;
+    char line[256] = {};
+    const bool any = std::fgets(line, sizeof line, cards) != nullptr &&
+                     std::strstr(line, "no soundcards") == nullptr;
+    std::fclose(cards);
+    return any;
+}
+
+struct RawTerminal {
+    termios saved{};
+    bool active = false;
+    RawTerminal() {
+        if (!isatty(STDIN_FILENO) || tcgetattr(STDIN_FILENO, &saved) != 0)
+            return;
+        termios raw = saved;
+        raw.c_lflag &= static_cast<tcflag_t>(~(ICANON | ECHO));
+        raw.c_cc[VMIN] = 0;
+        raw.c_cc[VTIME] = 0;
+        active = tcsetattr(STDIN_FILENO, TCSANOW, &raw) == 0;
+    }
+    ~RawTerminal() {
+        if (active)
+            tcsetattr(STDIN_FILENO, TCSANOW, &saved);
+    }
+};
+
+std::atomic<bool> gQuit{false};
+
+}  // namespace
+
+int main(int argc, char** argv) {
+    static const option kOptions[] = {
+        {"program", required_argument, nullptr, 'p'}, {"headless", no_argument, nullptr, 'H'},
+        {"loop", no_argument, nullptr, 'L'},          {"probe", no_argument, nullptr, 'P'},
+        {"help", no_argument, nullptr, 'h'},          {nullptr, 0, nullptr, 0}};
+    int program = 0;
+    bool headless = false;
+    bool loop = false;
+    bool probeOnly = false;
+    int opt;
+    while ((opt = getopt_long(argc, argv, "p:h", kOptions, nullptr)) != -1) {
+        switch (opt) {
+            case 'p':
+                program = std::atoi(optarg);
+                if (program <= 0 || program > 0xFFFF)
+                    fail(2, std::string("bad programme number '") + optarg + "'");
+                break;
+            case 'H':
+                headless = true;
+                break;
+            case 'L':
+                loop = true;
+                break;
+            case 'P':
+                probeOnly = true;
+                break;
+            case 'h':
+                usage(stdout);
+                return 0;
+            default:
+                usage(stderr);
+                return 2;
+        }
+    }
+    if (optind != argc - 1) {
+        usage(stderr);
+        return 2;
+    }
+    const std::string source = argv[optind];
+    if (source.rfind("dvb:", 0) == 0)
+        fail(2,
+             "dvb: sources are not supported by tavoplay yet; use tavoplayerd with "
+             "tavoplayer.demux.source=dvb:N and tavoctl");
+
+    // 1. The programme.
+    tavoplay::StreamProbe probe(static_cast<uint16_t>(program));
+    std::string consumed;
+    std::string reason = probeSource(source, probe, &consumed);
+    ProbedProgram found;
+    if (reason.empty())
+        reason = probe.finish(&found);
+    if (!reason.empty())
+        fail(2, source + ": " + reason);
+    std::printf(
+        "programme %u: video PID %u, audio PID %s%s, captions %s, PCR %s\n", found.programNumber,
+        found.videoPid,
+        found.audioPids.empty() ? "none" : std::to_string(found.audioPids[0]).c_str(),
+        found.audioPids.empty()
+            ? ""
+            : (std::string(" ") + tavoplay::codingName(found.audioCoding) +
+               (found.audioCodingFromPayload ? " (from the payload; the PMT differs)" : ""))
+                  .c_str(),
+        found.captionPid ? std::to_string(found.captionPid).c_str() : "none",
+        found.pcrPid == 0x1FFF ? "none (playing on PTS)" : std::to_string(found.pcrPid).c_str());
+
+    if (probeOnly) {
+        std::printf("%s\n", found.uri().c_str());
+        return 0;
+    }
+
+    // 2. Outputs.
+    std::string videoSink = "sdl";
+    std::string audioSink;  // the audio track's own default
+    if (headless || getenv("DISPLAY") == nullptr || !haveSoundCard()) {
+        if (!headless)
+            std::printf("no %s here: playing to the null outputs\n",
+                        getenv("DISPLAY") == nullptr ? "display" : "sound card");
+        if (headless || getenv("DISPLAY") == nullptr)
+            videoSink = "null";
+        if (headless || !haveSoundCard())
+            audioSink = "null";
+    }
+
+    // 3. A private service on this source.
+    char dirTemplate[] = "/tmp/tavoplay-XXXXXX";
+    if (mkdtemp(dirTemplate) == nullptr)
+        fail(1, std::string("cannot make a service directory: ") + std::strerror(errno));
+    const std::string dir = dirTemplate;
+    std::string demux;
+    if (source == "-")
+        demux = "stdin";
+    else if (source.rfind("udp://", 0) == 0)
+        demux = source;
+    else
+        demux = "file:" + fs::absolute(source).string() + (loop ? "?loop=1" : "");
+    int feed[2] = {-1, -1};
+    if (source == "-" && pipe(feed) != 0)
+        fail(1, "cannot make a pipe");
+    const pid_t daemon = fork();
+    if (daemon == 0) {
+        setenv("TAVOPLAYER_SERVICE_DIR", (dir + "/svc").c_str(), 1);
+        setenv("TAVOPLAYER_PROP_tavoplayer_demux_source", demux.c_str(), 1);
+        setenv("TAVOPLAYER_PROP_tavoplayer_video_sink", videoSink.c_str(), 1);
+        if (!audioSink.empty())
+            setenv("TAVOPLAYER_PROP_tavoplayer_audio_sink", audioSink.c_str(), 1);
+        if (getenv("TAVOPLAYER_PROP_tavoplayer_recordings_dir") == nullptr)
+            setenv("TAVOPLAYER_PROP_tavoplayer_recordings_dir", (dir + "/recordings").c_str(), 1);
+        if (feed[0] >= 0) {
+            dup2(feed[0], STDIN_FILENO);
+            ::close(feed[0]);
+            ::close(feed[1]);
+        } else {
+            const int null = open("/dev/null", O_RDONLY);
+            dup2(null, STDIN_FILENO);
+        }
+        const int log =
+            open((dir + "/tavoplayerd.log").c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0644);
+        dup2(log, STDERR_FILENO);
+        const std::string path = daemonPath(argv[0]);
+        execlp(path.c_str(), path.c_str(), "--log-level", "warning", nullptr);
+        _exit(127);
+    }
+    if (daemon < 0)
+        fail(1, "cannot start tavoplayerd");
+    std::thread pump;
+    if (feed[1] >= 0) {
+        ::close(feed[0]);
+        // Standard input goes on to the service: first what the probe read.
+        pump = std::thread([&consumed, out = feed[1]] {
+            signal(SIGPIPE, SIG_IGN);
+            if (write(out, consumed.data(), consumed.size()) >= 0) {
+                char buffer[65536];
+                ssize_t n;
+                while (!gQuit && (n = read(STDIN_FILENO, buffer, sizeof buffer)) > 0)
+                    if (write(out, buffer, static_cast<size_t>(n)) != n)
+                        break;
+            }
+            ::close(out);
+        });
+        pump.detach();
+    }
+    setenv("TAVOPLAYER_SERVICE_DIR", (dir + "/svc").c_str(), 1);
+    setenv("TAVOPLAYER_PROP_tavoplayer_video_sink", "null", 1);  // our own stand-in only
+    auto cleanUp = [&](int status) {
+        gQuit = true;
+        kill(daemon, SIGTERM);
+        waitpid(daemon, nullptr, 0);
+        fs::remove_all(dir + "/svc");
+        std::error_code ec;
+        fs::remove(dir + "/tavoplayerd.log", ec);
+        fs::remove(dir, ec);  // keeps recordings made here
+        std::exit(status);
+    };
+
+    sp<android::IBinder> binder =
+        android::defaultServiceManager()->getService(android::String16("TavoPlayer"));
+    sp<TavoPlayer::ICTavoPlayer> service =
+        android::interface_cast<TavoPlayer::ICTavoPlayer>(binder);
+    if (service == nullptr) {
+        std::fprintf(stderr, "tavoplay: tavoplayerd did not start (log: %s/tavoplayerd.log)\n",
+                     dir.c_str());
+        gQuit = true;
+        kill(daemon, SIGTERM);
+        waitpid(daemon, nullptr, 0);
+        return 1;
+    }
+    sp<Viewer> viewer = new Viewer();
+    service->registerClient(viewer);
+    service->setSurface(android::Surface::create());
+    service->openUri(found.uri().c_str(), 5);
+    service->start();
+    if (viewer->openStatus != 0 || viewer->startStatus != 0) {
+        std::fprintf(stderr, "tavoplay: the service refused the stream (open %d, start %d)\n",
+                     viewer->openStatus.load(), viewer->startStatus.load());
+        cleanUp(1);
+    }
+
+    // 4. Keys and status until the end.
+    signal(SIGINT, [](int) { gQuit = true; });
+    signal(SIGTERM, [](int) { gQuit = true; });
+    RawTerminal terminal;
+    const bool keys = terminal.active && source != "-";
+    size_t audioIndex = 0;
+    bool paused = false;
+    bool recording = false;
+    int captures = 0;
+    while (!gQuit) {
+        int status = 0;
+        if (waitpid(daemon, &status, WNOHANG) == daemon) {
+            std::fprintf(stderr, "\ntavoplay: the service died\n");
+            std::exit(1);
+        }
+        if (viewer->signalLost && !loop && source != "-" && source.rfind("udp://", 0) != 0) {
+            viewer->line("end of stream");
+            break;
+        }
+        if (viewer->signalLost && source == "-") {
+            viewer->line("end of input");
+            break;
+        }
+        viewer->status(paused ? "paused" : "playing", service->getFrameRate());
+        pollfd p{STDIN_FILENO, POLLIN, 0};
+        if (!keys || poll(&p, 1, 250) <= 0) {
+            if (!keys)
+                std::this_thread::sleep_for(std::chrono::milliseconds(250));
+            continue;
+        }
+        char key = 0;
+        if (read(STDIN_FILENO, &key, 1) != 1)
+            continue;
+        switch (key) {
+            case ' ':
+                paused ? service->resume() : service->pause();
+                paused = !paused;
+                break;
+            case 'c':
+                service->getFrame(1, 0);
+                ++captures;
+                viewer->line("capture %d requested", captures);
+                break;
+            case 'r':
+                if (recording)
+                    service->stopRecorder(1);
+                else if (service->startRecorder("FILE://rec/tavoplay?channelName=tavoplay;") != 0)
+                    viewer->line("recording could not start");
+                recording = !recording;
+                break;
+            case 'a':
+                if (found.audioPids.size() > 1) {
+                    audioIndex = (audioIndex + 1) % found.audioPids.size();
+                    service->setAudioPID(found.audioPids[audioIndex]);
+                    viewer->line("audio PID %u", found.audioPids[audioIndex]);
+                } else {
+                    viewer->line("the programme has one audio stream");
+                }
+                break;
+            case 's':
+                viewer->captionsOn = !viewer->captionsOn;
+                viewer->line("captions %s", viewer->captionsOn ? "on" : "off");
+                break;
+            case 'q':
+                gQuit = true;
+                break;
+            default:
+                break;
+        }
+    }
+    std::fprintf(stderr, "\n");
+    service->stop();
+    service->close();
+    cleanUp(0);
+}

@@ -314,6 +314,9 @@ int main(int argc, char** argv) {
         return 2;
     }
     const std::string source = argv[optind];
+    // This process's own messages (and the service's, in its log) stay out of the
+    // picture unless asked for.
+    setenv("TAVOPLAYER_LOG_LEVEL", "warning", 0);
     if (source.rfind("dvb:", 0) == 0)
         fail(2,
              "dvb: sources are not supported by tavoplay yet; use tavoplayerd with "
@@ -444,8 +447,20 @@ int main(int argc, char** argv) {
     sp<Viewer> viewer = new Viewer();
     service->registerClient(viewer);
     service->setSurface(android::Surface::create());
+    // The answers are one-way callbacks: wait for each before going on.
+    auto answered = [&](const std::atomic<int>& status) {
+        for (int i = 0; i < 300 && status == -1; ++i) {
+            if (waitpid(daemon, nullptr, WNOHANG) == daemon)
+                break;
+            std::this_thread::sleep_for(std::chrono::milliseconds(100));
+        }
+        return status.load();
+    };
     service->openUri(found.uri().c_str(), 5);
-    service->start();
+    if (answered(viewer->openStatus) == 0) {
+        service->start();
+        answered(viewer->startStatus);
+    }
     if (viewer->openStatus != 0 || viewer->startStatus != 0) {
         std::fprintf(stderr, "tavoplay: the service refused the stream (open %d, start %d)\n",
                      viewer->openStatus.load(), viewer->startStatus.load());
@@ -467,7 +482,9 @@ int main(int argc, char** argv) {
             std::fprintf(stderr, "\ntavoplay: the service died\n");
             std::exit(1);
         }
-        if (viewer->signalLost && !loop && source != "-" && source.rfind("udp://", 0) != 0) {
+        // A file does not come back once its packets stop: its end is the first
+        // "signal late" (3 s without pictures or sound).
+        if (viewer->signal >= 1 && !loop && source != "-" && source.rfind("udp://", 0) != 0) {
             viewer->line("end of stream");
             break;
         }

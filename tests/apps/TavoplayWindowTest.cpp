@@ -1,0 +1,81 @@
+// tavoplay under a virtual X display: the picture reaches a real window, captions
+// reach the terminal and the end of the file ends the program with status 0.
+#include <gtest/gtest.h>
+#include <signal.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <cstdio>
+#include <filesystem>
+#include <set>
+#include <string>
+#include <thread>
+#include <vector>
+
+namespace {
+
+namespace fs = std::filesystem;
+
+TEST(TavoplayWindow, ShowsTheTestPatternAndPrintsCaptions) {
+    if (system("command -v Xvfb >/dev/null && command -v ffmpeg >/dev/null") != 0)
+        GTEST_SKIP() << "Xvfb or ffmpeg is not installed";
+    const fs::path dir = fs::temp_directory_path() / ("tavo-window-" + std::to_string(getpid()));
+    fs::create_directories(dir);
+    const std::string ts = (dir / "s.ts").string();
+    ASSERT_EQ(system((std::string(TAVO_TSGEN_PATH) + " -o " + ts +
+                      " -d 8 --caption '2:Olá' >/dev/null 2>&1")
+                         .c_str()),
+              0);
+    const std::string display = ":" + std::to_string(100 + getpid() % 100);
+    const pid_t xvfb = fork();
+    if (xvfb == 0) {
+        execlp("Xvfb", "Xvfb", display.c_str(), "-screen", "0", "1920x1080x24", "-nolisten", "tcp",
+               nullptr);
+        _exit(127);
+    }
+    std::this_thread::sleep_for(std::chrono::seconds(2));
+    const std::string env = "DISPLAY=" + display + " ";
+    const std::string out = (dir / "out.txt").string();
+    FILE* player = popen((env + TAVO_BINARY_DIR "/apps/tavoplay/tavoplay " + ts + " >" + out +
+                          " 2>&1 </dev/null; echo $?")
+                             .c_str(),
+                         "r");
+    ASSERT_NE(player, nullptr);
+    // The picture, grabbed from the screen while the stream plays, scaled down.
+    std::this_thread::sleep_for(std::chrono::seconds(6));
+    std::vector<unsigned char> rgb(160 * 90 * 3);
+    FILE* grab = popen((env + "ffmpeg -v error -f x11grab -video_size 1920x1080 -i " + display +
+                        " -frames:v 1 -vf scale=160:90 -f rawvideo -pix_fmt rgb24 -")
+                           .c_str(),
+                       "r");
+    ASSERT_NE(grab, nullptr);
+    const size_t got = fread(rgb.data(), 1, rgb.size(), grab);
+    pclose(grab);
+    char status[16] = {};
+    fgets(status, sizeof status, player);
+    pclose(player);
+    kill(xvfb, SIGTERM);
+    waitpid(xvfb, nullptr, 0);
+    ASSERT_EQ(got, rgb.size());
+    // Colour bars: most of the screen lit, in several clearly different colours.
+    size_t lit = 0;
+    std::set<int> colours;
+    for (size_t i = 0; i < rgb.size(); i += 3) {
+        if (rgb[i] + rgb[i + 1] + rgb[i + 2] > 60)
+            ++lit;
+        colours.insert((rgb[i] >> 6) << 4 | (rgb[i + 1] >> 6) << 2 | (rgb[i + 2] >> 6));
+    }
+    EXPECT_GT(lit, rgb.size() / 3 / 2) << "the window is mostly black";
+    EXPECT_GE(colours.size(), 5u) << "the window does not show the colour bars";
+    EXPECT_STREQ(status, "0\n");
+    FILE* text = fopen(out.c_str(), "r");
+    ASSERT_NE(text, nullptr);
+    std::string printed(1 << 16, '\0');
+    printed.resize(fread(printed.data(), 1, printed.size(), text));
+    fclose(text);
+    EXPECT_NE(printed.find("caption: Olá"), std::string::npos) << printed;
+    fs::remove_all(dir);
+}
+
+}  // namespace

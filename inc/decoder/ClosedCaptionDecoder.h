@@ -19,6 +19,7 @@
 
 #include "common/Module.h"
 #include "common/data/PESData.h"
+#include "platform/os/ThreadName.h"
 
 namespace TavoPlayer {
 
@@ -65,6 +66,10 @@ private:
             : android::Thread(false), mDecoder(decoder) {}
 
     private:
+        android::status_t readyToRun() override {
+            setCurrentThreadName("CCWorkerThread");
+            return android::OK;
+        }
         bool threadLoop() override {
             mDecoder->WorkerThreadRunner();
             return true;

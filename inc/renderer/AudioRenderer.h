@@ -40,6 +40,7 @@
 #include "common/Module.h"
 #include "common/Synchronization.h"
 #include "common/Uint33.h"
+#include "platform/os/ThreadName.h"
 
 namespace android {
 class AudioTrack;
@@ -127,6 +128,10 @@ private:
             : android::Thread(false), mRenderer(renderer) {}
 
     private:
+        android::status_t readyToRun() override {
+            setCurrentThreadName("AudioRenderer");
+            return android::OK;
+        }
         bool threadLoop() override;
         AudioRenderer* mRenderer;
         unsigned int mLastStatus = 0;
@@ -143,6 +148,10 @@ private:
         std::atomic<bool> mChanged{false};
 
     private:
+        android::status_t readyToRun() override {
+            setCurrentThreadName("OutputDeviceThread");
+            return android::OK;
+        }
         bool threadLoop() override;
         std::mutex mWaitLock;
         std::condition_variable mWaitCondition;

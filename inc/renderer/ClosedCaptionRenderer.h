@@ -22,6 +22,7 @@
 
 #include "common/Module.h"
 #include "common/Synchronization.h"
+#include "platform/os/ThreadName.h"
 #include "renderer/ClosedCaptionListener.h"
 
 namespace TavoPlayer {
@@ -62,6 +63,10 @@ private:
             : android::Thread(false), mRenderer(renderer) {}
 
     private:
+        android::status_t readyToRun() override {
+            setCurrentThreadName("CCWorkerThreadRenderer");
+            return android::OK;
+        }
         bool threadLoop() override {
             mRenderer->renderFrame();
             return true;

@@ -35,6 +35,7 @@
 #include "common/Module.h"
 #include "common/Synchronization.h"
 #include "common/data/PESData.h"
+#include "platform/os/ThreadName.h"
 #include "tsparser/PESPacketParser.h"
 #include "tsparser/TSPacketParser.h"
 
@@ -82,6 +83,10 @@ private:
         bool exitRequested() { return exitPending(); }
 
     private:
+        android::status_t readyToRun() override {
+            setCurrentThreadName("TSParser");
+            return android::OK;
+        }
         // Rounds run here rather than in the base class's loop, so that the thread
         // can only end through releaseOnExit(): the base would otherwise leave
         // between two rounds, holding the first output's writer lock.

@@ -11,7 +11,8 @@
 //
 // A packet is held until the PCR after it is known, so the pacer reads at most one
 // PCR interval ahead. A PCR discontinuity (the discontinuity_indicator, a PCR that
-// goes backwards, or a jump of more than kMaxPcrGapTicks, as when a file loops)
+// goes backwards, or a jump forward of more than kMaxPcrGapTicks, as when a file
+// loops or its PCR is rebased without the indicator)
 // re-anchors the time line where it stood, so the stream continues without a burst
 // or a stall. Packets before the first PCR are due at once; packets after the last
 // PCR of a stream are spread at the last rate seen.
@@ -30,9 +31,12 @@ public:
     static constexpr size_t kPacketSize = 188;
     // The PCR counts 27 MHz ticks modulo 2^33 * 300.
     static constexpr uint64_t kPcrModulus = (uint64_t{1} << 33) * 300;
-    // A step larger than one second between PCRs of one PID is no interval that a
-    // multiplexer would send (the limit is 100 ms); it is taken as a discontinuity.
-    static constexpr uint64_t kMaxPcrGapTicks = 27'000'000;
+    // PCRs of one PID come at most 100 ms apart (ISO/IEC 13818-1, 2.7.2), so a
+    // longer step is either a stretch with no packets at all, while the PCR ran on
+    // (a signal loss kept in a recording), or a new time base. Steps up to 15 s are
+    // replayed as the silence they were, so that a file shows a receiver what the
+    // loss looked like; longer ones are taken as a discontinuity.
+    static constexpr uint64_t kMaxPcrGapTicks = 15ull * 27'000'000;
     // Packets held without any PCR before they are timed at the last rate anyway,
     // so that a stream that stops sending PCRs neither stalls nor grows memory.
     static constexpr size_t kMaxUntimedPackets = 16384;

@@ -4,9 +4,10 @@
 // The time of a packet is read from the PCR (ISO/IEC 13818-1, 2.4.2.2) of one PID:
 // elapsed milliseconds since the first PCR, summed PCR interval by PCR interval so
 // that the 2^33 wrap and a new time base (discontinuity_indicator, a step back, or
-// a step of more than a second, as PcrPacer treats them) add nothing. Each PCR
-// packet becomes an index point (elapsed ms, byte offset of the packet): a reader
-// moved there finds the PCR at once, and the pacing of the feed re-anchors on it.
+// a step of more than 15 s, as PcrPacer treats them) add nothing; a shorter silence
+// counts, as the clip's pacing replays it. Each PCR packet becomes an index point (elapsed ms, byte
+// offset of the packet): a reader moved there finds the PCR at once, and the pacing of the feed
+// re-anchors on it.
 //
 // Pure: packets and offsets in; one thread.
 #pragma once

@@ -142,8 +142,8 @@ INSTANTIATE_TEST_SUITE_P(
         JumpCase{"WrapOf33Bits", (1ull << 33) - 5400, 1800, false, false, 80},
         // Backwards (a loop to the start of a file): continue at the last rate.
         JumpCase{"Backwards", 900000, 1000, false, true, 80},
-        // Ten seconds ahead: not an interval any multiplexer sends.
-        JumpCase{"FarAhead", 90000, 90000 + 900000, false, true, 80},
+        // Twenty seconds ahead: a new time base, not a silence to wait out.
+        JumpCase{"FarAhead", 90000, 90000 + 1800000, false, true, 80},
         // The discontinuity_indicator says so even for a plausible step.
         JumpCase{"Indicator", 90000, 90000 + 7200, true, true, 80}),
     [](const ::testing::TestParamInfo<JumpCase>& info) { return std::string(info.param.name); });

@@ -43,8 +43,9 @@ TEST(TsIndexerTest, TimeLineSumsPcrIntervalsAcrossWrapsAndNewTimeBases) {
         {0x100, 2700, false, false, 80},   // no new millisecond, no new point
         {0x100, 500000, true, false, 80},  // a new time base adds nothing
         {0x100, 503600, false, true, 120},
-        {0x100, 503600 + 5 * 90000, false, false, 120},  // a jump of 5 s: a new time base
-        {0x100, 503600 + 5 * 90000 + 9000, false, true, 220},
+        {0x100, 503600 + 5 * 90000, false, true, 5120},    // 5 s without packets: time passed
+        {0x100, 503600 + 25 * 90000, false, false, 5120},  // a jump of 20 s: a new time base
+        {0x100, 503600 + 25 * 90000 + 9000, false, true, 5220},
     };
     TsIndexer indexer;
     uint64_t offset = 0;
@@ -59,7 +60,7 @@ TEST(TsIndexerTest, TimeLineSumsPcrIntervalsAcrossWrapsAndNewTimeBases) {
         offset += 188;
     }
     EXPECT_EQ(indexer.pcrPid(), 0x100);
-    EXPECT_EQ(indexer.takePoints().size(), 5u);
+    EXPECT_EQ(indexer.takePoints().size(), 6u);
     EXPECT_TRUE(indexer.points().empty());
 }
 

@@ -27,6 +27,7 @@
 #include "platform/os/Trace.h"
 #include "service/BnCTavoPlayerClient.h"
 #include "service/ICTavoPlayer.h"
+#include "tavoapps/CaptionText.h"
 
 using android::sp;
 using android::String16;
@@ -35,32 +36,6 @@ using TavoPlayer::ICTavoPlayer;
 namespace {
 
 constexpr auto kReplyWait = std::chrono::seconds(30);
-
-// Caption text is UTF-32 code points in the stream's byte order of the service
-// (host order); rows are separated by code point 10.
-std::string utf32ToUtf8(const uint8_t* text, int32_t length) {
-    std::string out;
-    for (int32_t i = 0; i + 4 <= length; i += 4) {
-        uint32_t cp;
-        std::memcpy(&cp, text + i, 4);
-        if (cp < 0x80) {
-            out += static_cast<char>(cp);
-        } else if (cp < 0x800) {
-            out += static_cast<char>(0xC0 | (cp >> 6));
-            out += static_cast<char>(0x80 | (cp & 0x3F));
-        } else if (cp < 0x10000) {
-            out += static_cast<char>(0xE0 | (cp >> 12));
-            out += static_cast<char>(0x80 | ((cp >> 6) & 0x3F));
-            out += static_cast<char>(0x80 | (cp & 0x3F));
-        } else if (cp < 0x110000) {
-            out += static_cast<char>(0xF0 | (cp >> 18));
-            out += static_cast<char>(0x80 | ((cp >> 12) & 0x3F));
-            out += static_cast<char>(0x80 | ((cp >> 6) & 0x3F));
-            out += static_cast<char>(0x80 | (cp & 0x3F));
-        }
-    }
-    return out;
-}
 
 // The callbacks: each is printed as "name(args)" on its own line and counted, so
 // that commands and 'waitfor' can wait for one.
@@ -122,7 +97,7 @@ public:
         event("onSignalStatusChanged", {p, c});
     }
     void closedCaptionText(const uint8_t* text, int32_t length) override {
-        event("closedCaptionText", {length}, "\"" + utf32ToUtf8(text, length) + "\"");
+        event("closedCaptionText", {length}, "\"" + tavoapps::captionToUtf8(text, length) + "\"");
     }
     void onStopComplete(int32_t s) override { event("onStopComplete", {s}); }
     void onError(int32_t code) override { event("onError", {code}); }

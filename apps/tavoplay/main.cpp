@@ -33,6 +33,7 @@
 #include "platform/gui/Surface.h"
 #include "service/BnCTavoPlayerClient.h"
 #include "service/ICTavoPlayer.h"
+#include "tavoapps/CaptionText.h"
 
 using android::sp;
 using tavoplay::AudioCoding;
@@ -62,25 +63,6 @@ void usage(FILE* out) {
                  "Keys: space pause/resume, c capture to PNG, r record on/off,\n"
                  "      a next audio PID, s captions on/off, q quit.\n"
                  "Exit status: 0 end or quit, 1 the service failed, 2 cannot play SOURCE.\n");
-}
-
-std::string utf32ToUtf8(const uint8_t* text, int32_t length) {
-    std::string out;
-    for (int32_t i = 0; i + 4 <= length; i += 4) {
-        uint32_t cp;
-        std::memcpy(&cp, text + i, 4);
-        if (cp < 0x80) {
-            out += static_cast<char>(cp);
-        } else if (cp < 0x800) {
-            out += static_cast<char>(0xC0 | (cp >> 6));
-            out += static_cast<char>(0x80 | (cp & 0x3F));
-        } else if (cp < 0x10000) {
-            out += static_cast<char>(0xE0 | (cp >> 12));
-            out += static_cast<char>(0x80 | ((cp >> 6) & 0x3F));
-            out += static_cast<char>(0x80 | (cp & 0x3F));
-        }
-    }
-    return out;
 }
 
 // What the service reported, shown on one status line.
@@ -114,7 +96,7 @@ public:
     }
     void closedCaptionText(const uint8_t* text, int32_t length) override {
         if (captionsOn)
-            line("caption: %s", utf32ToUtf8(text, length).c_str());
+            line("caption: %s", tavoapps::captionToUtf8(text, length).c_str());
     }
     void onStopComplete(int32_t) override {}
     void onError(int32_t code) override {

@@ -12,29 +12,19 @@
 #include <fstream>
 #include <sstream>
 #include <string>
+
 #include <thread>
+#include "support/RunCommand.h"
 
 namespace {
 
 namespace fs = std::filesystem;
+using TavoPlayer::test::runCommand;
 
 const std::string kBin = TAVO_BINARY_DIR "/apps/";
 constexpr const char* kLive =
     "open 5 MTV://tuner/live?pcrPid=273;videoPid=273;audioPid=274;IsLATMAudio=1;"
     "subtitlePid=304;";
-
-// Runs a shell command line, returning its exit status and its output.
-int run(const std::string& command, std::string* output) {
-    FILE* pipe = popen((command + " 2>&1").c_str(), "r");
-    if (pipe == nullptr)
-        return -1;
-    char buffer[4096];
-    size_t n;
-    while ((n = fread(buffer, 1, sizeof buffer, pipe)) > 0)
-        output->append(buffer, n);
-    const int status = pclose(pipe);
-    return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
-}
 
 class ServiceSession : public testing::Test {
 protected:
@@ -42,9 +32,9 @@ protected:
         sDir = fs::temp_directory_path() / ("tavo-session-" + std::to_string(getpid()));
         fs::create_directories(sDir);
         std::string out;
-        ASSERT_EQ(run(std::string(TAVO_TSGEN_PATH) + " -o " + (sDir / "live.ts").string() +
-                          " -d 14 --caption 2:Olá --caption 5:'Ação, você'",
-                      &out),
+        ASSERT_EQ(runCommand(std::string(TAVO_TSGEN_PATH) + " -o " + (sDir / "live.ts").string() +
+                                 " -d 14 --caption 2:Olá --caption 5:'Ação, você'",
+                             &out),
                   0)
             << out;
     }
@@ -87,8 +77,8 @@ protected:
     }
     // tavoctl with the given commands, each one argument.
     static int tavoctl(const std::string& commands, std::string* output) {
-        return run("timeout 90 env " + environment() + " " + kBin + "tavoctl/tavoctl " + commands,
-                   output);
+        return runCommand(
+            "timeout 90 env " + environment() + " " + kBin + "tavoctl/tavoctl " + commands, output);
     }
 
     static fs::path sDir;
@@ -122,17 +112,18 @@ TEST_F(ServiceSession, AWholeSessionGivesItsCallbacksInOrderAndAReadablePicture)
         at = found;
     }
     std::string probe;
-    ASSERT_EQ(run("ffprobe -v error -show_entries stream=width,height -of csv=p=0 " + png, &probe),
-              0);
+    ASSERT_EQ(
+        runCommand("ffprobe -v error -show_entries stream=width,height -of csv=p=0 " + png, &probe),
+        0);
     EXPECT_EQ(probe, "320,240\n");
 }
 
 TEST_F(ServiceSession, AClientThatDiesMidPlaybackLeavesTheServiceReadyForTheNext) {
     std::string out;
     // Killed by timeout while playing: the service sees the hang-up as a death.
-    run("timeout -s KILL 6 env " + environment() + " " + kBin + "tavoctl/tavoctl '" + kLive +
-            "' start 'wait 30'",
-        &out);
+    runCommand("timeout -s KILL 6 env " + environment() + " " + kBin + "tavoctl/tavoctl '" + kLive +
+                   "' start 'wait 30'",
+               &out);
     std::string next;
     EXPECT_EQ(tavoctl(std::string("state '") + kLive +
                           "' start 'waitfor onStartVideoTask 20' stop close state",

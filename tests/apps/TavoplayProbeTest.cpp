@@ -7,21 +7,12 @@
 #include <filesystem>
 #include <string>
 
+#include "support/RunCommand.h"
+
 namespace {
 
 namespace fs = std::filesystem;
-
-int run(const std::string& command, std::string* output) {
-    FILE* pipe = popen((command + " 2>&1").c_str(), "r");
-    if (pipe == nullptr)
-        return -1;
-    char buffer[4096];
-    size_t n;
-    while ((n = fread(buffer, 1, sizeof buffer, pipe)) > 0)
-        output->append(buffer, n);
-    const int status = pclose(pipe);
-    return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
-}
+using TavoPlayer::test::runCommand;
 
 std::string lastLine(const std::string& text) {
     const size_t end = text.find_last_not_of('\n');
@@ -57,10 +48,12 @@ TEST(TavoplayProbe, FindsEachProgrammesPidsAndTrustsTheAudioPayload) {
         const std::string file = (dir / ("s" + std::to_string(index++) + ".ts")).string();
         std::string out;
         ASSERT_EQ(
-            run(std::string(TAVO_TSGEN_PATH) + " -o " + file + " -d 1 " + c.tsgenOptions, &out), 0)
+            runCommand(std::string(TAVO_TSGEN_PATH) + " -o " + file + " -d 1 " + c.tsgenOptions,
+                       &out),
+            0)
             << out;
         out.clear();
-        EXPECT_EQ(run(kTavoplay + file, &out), 0) << out;
+        EXPECT_EQ(runCommand(kTavoplay + file, &out), 0) << out;
         const std::string expected = std::string("MTV://tuner/live?") + c.uri;
         EXPECT_EQ(lastLine(out), expected);
     }
@@ -84,7 +77,7 @@ TEST(TavoplayProbe, SourcesThatCannotBePlayedGiveTheirReasonAndStatus2) {
             continue;
         }
         std::string out;
-        EXPECT_EQ(run(kTavoplay + c.source, &out), 2) << c.source;
+        EXPECT_EQ(runCommand(kTavoplay + c.source, &out), 2) << c.source;
         EXPECT_NE(out.find(c.reason), std::string::npos) << out;
     }
 }
@@ -95,7 +88,7 @@ TEST(TavoplayProbe, ARealIsdbTbCaptureIn204BytePackets) {
     if (!fs::exists(file))
         GTEST_SKIP() << "the shared sample streams are absent";
     std::string out;
-    ASSERT_EQ(run(kTavoplay + file, &out), 0) << out;
+    ASSERT_EQ(runCommand(kTavoplay + file, &out), 0) << out;
     // Service 23584: PCR 0x100, H.264 0x111, LATM 0x112, captions 0x116.
     EXPECT_EQ(lastLine(out),
               "MTV://tuner/live?pcrPid=256;videoPid=273;audioPid=274;"

@@ -34,12 +34,12 @@ public:
     // Whether the bytes written are kept (and so must carry the track's volume).
     virtual bool keepsSamples() const { return true; }
 
-    // The sink named by `spec` ("alsa[:DEVICE]", "wav:PATH", "null"); null for an
+    // The sink named by `choice` ("alsa[:DEVICE]", "wav:PATH", "null"); null for an
     // unknown name. *name receives the sink's full name.
-    static std::unique_ptr<AudioSink> create(const std::string& spec, std::string* name);
+    static std::unique_ptr<AudioSink> create(const std::string& choice, std::string* name);
     // The sink used when tavoplayer.audio.sink is unset: "alsa" when a sound card
     // exists, "null" otherwise.
-    static std::string defaultSpec();
+    static std::string defaultChoice();
 };
 
 }  // namespace android

@@ -6,25 +6,25 @@
 
 namespace android {
 
-std::unique_ptr<AudioSink> AudioSink::create(const std::string& spec, std::string* name) {
-    if (spec == "null") {
+std::unique_ptr<AudioSink> AudioSink::create(const std::string& choice, std::string* name) {
+    if (choice == "null") {
         *name = "null";
         return std::make_unique<NullAudioSink>();
     }
-    if (spec.rfind("wav:", 0) == 0 && spec.size() > 4) {
-        *name = spec;
-        return std::make_unique<WavAudioSink>(spec.substr(4));
+    if (choice.rfind("wav:", 0) == 0 && choice.size() > 4) {
+        *name = choice;
+        return std::make_unique<WavAudioSink>(choice.substr(4));
     }
-    if (spec == "alsa" || (spec.rfind("alsa:", 0) == 0 && spec.size() > 5)) {
-        const std::string device = spec == "alsa" ? "default" : spec.substr(5);
+    if (choice == "alsa" || (choice.rfind("alsa:", 0) == 0 && choice.size() > 5)) {
+        const std::string device = choice == "alsa" ? "default" : choice.substr(5);
         *name = "alsa:" + device;
         return std::make_unique<AlsaAudioSink>(device);
     }
-    *name = spec;
+    *name = choice;
     return nullptr;
 }
 
-std::string AudioSink::defaultSpec() {
+std::string AudioSink::defaultChoice() {
     return AlsaAudioSink::soundCardPresent() ? "alsa" : "null";
 }
 

@@ -54,13 +54,13 @@ AudioTrack::AudioTrack(audio_stream_type_t streamType, uint32_t sampleRate, audi
     if (mSessionId == AUDIO_SESSION_ALLOCATE)
         mSessionId = AudioSystem::newAudioSessionId();
 
-    std::string spec = TavoPlayer::propertyGetString("tavoplayer.audio.sink", "");
-    if (spec.empty())
-        spec = AudioSink::defaultSpec();
-    mSink = AudioSink::create(spec, &mSinkName);
+    std::string choice = TavoPlayer::propertyGetString("tavoplayer.audio.sink", "");
+    if (choice.empty())
+        choice = AudioSink::defaultChoice();
+    mSink = AudioSink::create(choice, &mSinkName);
     if (mSink == nullptr) {
         TAVO_LOGE("%s: unknown audio sink \"%s\" (alsa[:DEVICE], wav:PATH or null)\n", "AudioTrack",
-                  spec.c_str());
+                  choice.c_str());
         return;
     }
     const status_t opened = mSink->open(sampleRate, mChannelCount);

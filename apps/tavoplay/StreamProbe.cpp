@@ -66,14 +66,15 @@ std::string ProbedProgram::uri() const {
     // A stream without PCR plays on its PTS: the clock runs on the streams' time
     // stamps when no PCR arrives, so the video PID stands in.
     const uint16_t pcr = pcrPid == 0x1FFF ? videoPid : pcrPid;
-    std::string u = "MTV://tuner/live?pcrPid=" + std::to_string(pcr) +
-                    ";videoPid=" + std::to_string(videoPid) +
-                    ";audioPid=" + std::to_string(audioPids.empty() ? 0 : audioPids.front()) +
-                    ";IsLATMAudio=" + (audioCoding == AudioCoding::Latm ? "1" : "0") +
-                    ";isMPEG2Audio=" + (audioCoding == AudioCoding::MpegAudio ? "1" : "0") + ";";
-    if (captionPid != 0)
-        u += "subtitlePid=" + std::to_string(captionPid) + ";";
-    return u;
+    // A chain the programme does not have gets a PID no stream uses: a missing key
+    // reads as PID 0, which would feed the PAT to that chain's PES parser.
+    constexpr uint16_t kUnused = 0x1FFE;
+    return "MTV://tuner/live?pcrPid=" + std::to_string(pcr) +
+           ";videoPid=" + std::to_string(videoPid) +
+           ";audioPid=" + std::to_string(audioPids.empty() ? kUnused : audioPids.front()) +
+           ";IsLATMAudio=" + (audioCoding == AudioCoding::Latm ? "1" : "0") +
+           ";isMPEG2Audio=" + (audioCoding == AudioCoding::MpegAudio ? "1" : "0") +
+           ";subtitlePid=" + std::to_string(captionPid != 0 ? captionPid : kUnused) + ";";
 }
 
 struct StreamProbe::State {

@@ -31,7 +31,7 @@ TEST(TavoplayProbe, FindsEachProgrammesPidsAndTrustsTheAudioPayload) {
     } cases[] = {
         {"", "pcrPid=273;videoPid=273;audioPid=274;IsLATMAudio=1;isMPEG2Audio=0;subtitlePid=304;"},
         {"--pcr-pid 0x200 --no-caption-stream",
-         "pcrPid=512;videoPid=273;audioPid=274;IsLATMAudio=1;isMPEG2Audio=0;"},
+         "pcrPid=512;videoPid=273;audioPid=274;IsLATMAudio=1;isMPEG2Audio=0;subtitlePid=8190;"},
         {"--audio adts",
          "pcrPid=273;videoPid=273;audioPid=274;IsLATMAudio=0;isMPEG2Audio=0;subtitlePid=304;"},
         {"--audio mp2",

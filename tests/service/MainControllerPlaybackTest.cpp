@@ -166,8 +166,21 @@ protected:
     android::sp<MainController> mController;
 };
 
-TEST_F(LivePlayback, LatmWithCaptionsShowsPicturesSoundAndCaptionsInOrder) {
-    play("-d 9 --caption '2:Um' --caption '4:Dois'");
+// One row per way a programme carries its audio and clock.
+struct Carriage {
+    const char* name;
+    const char* tsgenOptions;
+    std::map<std::string, std::string> config;
+};
+void PrintTo(const Carriage& c, std::ostream* os) {
+    *os << c.name;
+}
+
+class LiveCarriage : public LivePlayback, public testing::WithParamInterface<Carriage> {};
+
+TEST_P(LiveCarriage, ShowsPicturesPlaysSoundAndCaptionsInOrder) {
+    play(std::string("-d 9 --caption '2:Um' --caption '4:Dois' ") + GetParam().tsgenOptions,
+         GetParam().config);
     sleepUntil(6);
     const int fps = mController->getFrameRate();
     sleepUntil(9);
@@ -184,6 +197,25 @@ TEST_F(LivePlayback, LatmWithCaptionsShowsPicturesSoundAndCaptionsInOrder) {
     mController->stop();
     // The tone reached the output: seconds of 48 kHz stereo 16-bit PCM.
     EXPECT_GT(fs::file_size(wavPath()), 3u * 48000 * 4) << eventLog();
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Tsgen, LiveCarriage,
+    testing::Values(Carriage{"Latm", "", {}},
+                    Carriage{"Adts", "--audio adts", {{"IsLATMAudio", "0"}}},
+                    Carriage{"Mp2", "--audio mp2", {{"IsLATMAudio", "0"}, {"isMPEG2Audio", "1"}}},
+                    Carriage{"SeparatePcrPid", "--pcr-pid 0x200", {{"pcrPid", "512"}}}),
+    [](const testing::TestParamInfo<Carriage>& info) { return std::string(info.param.name); });
+
+TEST_F(LivePlayback, WithoutAudioThePlaybackTimerEnablesTheOutputs) {
+    // An audio PID that no packet carries (PID 0 would feed the PAT to the audio chain).
+    play("-d 20 --audio none", {{"audioPid", "8190"}});
+    sleepUntil(18.5);
+    // Nothing else ends the buffering: the 17 s timer does.
+    const double end = mViewer.firstAt("BUFFERING_END");
+    EXPECT_GT(end, 16.5) << eventLog();
+    EXPECT_LT(end, 18.5) << eventLog();
+    EXPECT_GE(mViewer.firstAt("START_VIDEO_TASK(1920,1080)"), 0) << eventLog();
 }
 
 TEST_F(LivePlayback, ASignalGapIsReportedLateThenLostThenGoodAgain) {

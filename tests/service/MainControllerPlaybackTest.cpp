@@ -8,10 +8,12 @@
 #include <time.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <chrono>
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
+#include <iterator>
 #include <map>
 #include <mutex>
 #include <set>
@@ -133,14 +135,18 @@ protected:
                           " >/dev/null 2>&1")
                              .c_str()),
                   0);
-        setenv("TAVOPLAYER_PROP_tavoplayer_demux_source", ("file:" + ts).c_str(), 1);
+        ASSERT_EQ(startOn("file:" + ts, std::move(extra)), 0u);
+    }
+    // Configures a controller on `source` and starts it: start's result.
+    unsigned int startOn(const std::string& source, std::map<std::string, std::string> extra) {
+        setenv("TAVOPLAYER_PROP_tavoplayer_demux_source", source.c_str(), 1);
         std::map<std::string, std::string> config = {{"sourceType", "0"},  {"pcrPid", "273"},
                                                      {"videoPid", "273"},  {"audioPid", "274"},
                                                      {"IsLATMAudio", "1"}, {"subtitlePid", "304"}};
         for (const auto& [key, value] : extra)
             config[key] = value;
         mController = new MainController();
-        ASSERT_EQ(mController->configure(config), 0u);
+        EXPECT_EQ(mController->configure(config), 0u);
         mController->setServiceControllerListener(&mViewer);
         mController->setVideoRenderedListener(&mViewer);
         mController->setAudioRenderedListener(&mViewer);
@@ -148,7 +154,7 @@ protected:
         android::sp<android::Surface> surface = android::Surface::create();
         mController->setSurface(surface);
         mViewer.started = Clock::now();
-        ASSERT_EQ(mController->start(), 0u);
+        return mController->start();
     }
     void sleepUntil(double sec) {
         std::this_thread::sleep_until(mViewer.started +
@@ -283,6 +289,250 @@ TEST_F(LivePlayback, EveryPipelineThreadIsNamedAndNoneOutlivesStop) {
     for (const std::string& name : after)
         EXPECT_EQ(name.rfind("tavo_", 0), 0u) << "left behind: " << name;
 }
+
+// One row per stream fault that the pipeline must ride out: pictures and sound go on
+// after it, and the viewer is never told of a signal loss. Every fault lands 2 s into
+// the stream, shown about 4.7 s after start (0.7 s of multiplex lead plus the 2 s
+// offset); frames are counted over the 5 s after that.
+struct Fault {
+    const char* name;
+    const char* tsgenOptions;
+};
+void PrintTo(const Fault& f, std::ostream* os) {
+    *os << f.name;
+}
+
+class LiveFault : public LivePlayback, public testing::WithParamInterface<Fault> {};
+
+TEST_P(LiveFault, PicturesAndSoundCarryOnWithoutASignalLoss) {
+    play(std::string("-d 11 ") + GetParam().tsgenOptions);
+    sleepUntil(6);
+    const size_t before = mViewer.frameCount();
+    sleepUntil(11);
+    // 29.97 pictures a second: 150 in 5 s; a stall of a second or more falls short.
+    EXPECT_GT(mViewer.frameCount() - before, 110u) << eventLog();
+    EXPECT_LT(mViewer.firstAt("SIGNAL"), 0) << eventLog();
+    mController->stop();
+    EXPECT_GT(fs::file_size(wavPath()), 6u * 48000 * 4) << eventLog();
+}
+
+// Video runs at about 5,300 packets a second and audio at about 90 in tsgen's
+// default multiplex: the indices below fall near 2 s.
+INSTANTIATE_TEST_SUITE_P(
+    Tsgen, LiveFault,
+    testing::Values(
+        // The PCR alone runs 25 s ahead of the PTS for 3 s, with no discontinuity
+        // announced (ISO/IEC 13818-1, 2.4.3.5): the clock ignores it while it is more
+        // than 20 s off and takes it back once it is near the PTS again.
+        Fault{"PcrJump25s", "--pcr-jump 2:25000 --pcr-jump 5:-25000"},
+        // An announced new time base: PCR and PTS move together.
+        Fault{"AnnouncedTimeBaseJump", "--timebase-jump 2:5000"},
+        Fault{"ContinuityErrors", "--cc-error 0x111:13000:3 --cc-error 0x112:230:2"},
+        Fault{"DroppedPackets", "--drop 0x111:13500:40 --drop 0x112:240:3"}),
+    [](const testing::TestParamInfo<Fault>& info) { return std::string(info.param.name); });
+
+// The audio that reaches the output is FFmpeg's decode of the same frames: from 2 s to
+// 6 s of the stream every sample is FFmpeg's, give or take the last bit of its float to
+// 16-bit rounding, and none is missing (the renderer may only add silence before the
+// first frame and cut frames that are late at the start).
+TEST_F(LivePlayback, TheSoundIsFFmpegsDecodeOfTheStream) {
+    play("-d 8 --no-caption-stream");
+    sleepUntil(10.5);
+    ASSERT_EQ(mController->stop(), 0u);
+    const std::string reference = (mDir / "ref.pcm").string();
+    ASSERT_EQ(system(("ffmpeg -v error -i " + (mDir / "s.ts").string() +
+                      " -map 0:a:0 -f s16le -acodec pcm_s16le " + reference)
+                         .c_str()),
+              0);
+    auto samples = [](const std::string& path, size_t skip) {
+        std::ifstream in(path, std::ios::binary);
+        const std::string bytes(std::istreambuf_iterator<char>(in), {});
+        std::vector<int16_t> out((bytes.size() - std::min(skip, bytes.size())) / 2);
+        memcpy(out.data(), bytes.data() + skip, out.size() * 2);
+        return out;
+    };
+    const std::vector<int16_t> played = samples(wavPath(), 44);
+    const std::vector<int16_t> expected = samples(reference, 0);
+    constexpr size_t kSecond = 48000 * 2;
+    ASSERT_GE(expected.size(), 6 * kSecond);
+    // Align on the first 32 samples from 2 s on that stand in the output exactly.
+    std::ptrdiff_t shift = -1;
+    for (size_t at = 2 * kSecond; shift < 0 && at < 3 * kSecond; at += 64) {
+        auto hit = std::search(played.begin(), played.end(), expected.begin() + at,
+                               expected.begin() + at + 32);
+        if (hit != played.end())
+            shift = (hit - played.begin()) - static_cast<std::ptrdiff_t>(at);
+    }
+    ASSERT_GE(shift, 0) << "FFmpeg's PCM is nowhere in the output";
+    ASSERT_GE(played.size(), shift + 6 * kSecond);
+    size_t off = 0;
+    for (size_t i = 2 * kSecond; i < 6 * kSecond; ++i)
+        off += std::abs(played[shift + i] - expected[i]) > 1;
+    EXPECT_EQ(off, 0u) << "samples more than 1 off FFmpeg's";
+}
+
+// The viewer switches the audio to a PID that carries sound and turns captions on for
+// a programme that had none, both while playing.
+TEST_F(LivePlayback, AudioAndCaptionPidsChangeWhilePlaying) {
+    // Caption management every second, as broadcasters send it: the caption's PES is
+    // handed on when the next one starts.
+    play("-d 8 --caption-mgmt-interval 1 --caption '5:Cinco'",
+         {{"audioPid", "8190"}, {"subtitlePid", "8189"}});
+    sleepUntil(1);
+    EXPECT_EQ(mController->setAudioPID(274), 0u);
+    EXPECT_EQ(mController->setCCPID(304), 0u);
+    sleepUntil(9);
+    mController->stop();
+    EXPECT_GT(mViewer.firstAt("CAPTION Cinco"), 0) << eventLog();
+    EXPECT_GT(fs::file_size(wavPath()), 3u * 48000 * 4) << eventLog();
+}
+
+// A tsgen stream dropped into the recordings folder plays as a recorded clip: the
+// service catalogues it on first use.
+TEST_F(LivePlayback, RecordedClipPausesSeeksAndEndsOnce) {
+    const std::string recordings = (mDir / "recordings").string();
+    fs::create_directories(recordings);
+    setenv("TAVOPLAYER_PROP_tavoplayer_recordings_dir", recordings.c_str(), 1);
+    ASSERT_EQ(system((std::string(TAVO_TSGEN_PATH) + " -o " + recordings +
+                      "/1.ts -d 8 --pcr-interval-ms 100 >/dev/null 2>&1")
+                         .c_str()),
+              0);
+    // As the URI parser leaves a FILE path: without its last character.
+    play("-d 1", {{"sourceType", "2"}, {"filePath", recordings + "/1.t"}});
+    sleepUntil(3);
+    // The clock stands still while paused, and the clip with it.
+    const int64_t paused = mController->getPCRValue();
+    ASSERT_EQ(mController->pause(), 0u);
+    std::this_thread::sleep_for(std::chrono::milliseconds(1500));
+    ASSERT_EQ(mController->resume(), 0u);
+    const int64_t resumed = mController->getPCRValue();
+    EXPECT_GT(paused, 0);
+    EXPECT_LT(std::llabs(resumed - paused), 27000) << "more than 0.3 s moved during the pause";
+
+    // A seek puts a new video decoder first among the modules.
+    ASSERT_EQ(mController->seek(1000), 0u);
+    char* text = nullptr;
+    size_t size = 0;
+    FILE* out = open_memstream(&text, &size);
+    mController->dump(out, android::Vector<android::String16>(), 0);
+    fclose(out);
+    const std::string dump(text, size);
+    free(text);
+    const size_t modules = dump.find("+ Modules:");
+    ASSERT_NE(modules, std::string::npos) << dump;
+    EXPECT_EQ(dump.find("Module Name: MediaCodecDecoder", modules),
+              dump.find("Module Name:", modules))
+        << dump;
+
+    sleepUntil(16);
+    size_t ends = 0;
+    for (const Event& e : mViewer.events())
+        ends += e.what == "EOC(0,0)";
+    EXPECT_EQ(ends, 1u) << eventLog();
+    unsetenv("TAVOPLAYER_PROP_tavoplayer_recordings_dir");
+}
+
+// Start/stop and whole controllers over and over: no descriptor, thread or mapping
+// may be left behind.
+TEST_F(LivePlayback, RepeatedCyclesLeaveNothingBehind) {
+    auto count = [](const char* path) {
+        size_t n = 0;
+        for ([[maybe_unused]] const auto& entry : fs::directory_iterator(path))
+            ++n;
+        return n;
+    };
+    auto mappings = [] {
+        std::ifstream maps("/proc/self/maps");
+        return static_cast<size_t>(std::count(std::istreambuf_iterator<char>(maps), {}, '\n'));
+    };
+    const size_t threadsBefore = count("/proc/self/task");
+    play("-d 2 --size 320x240 --mux-rate 1500000");
+    ASSERT_EQ(mController->stop(), 0u);
+    const size_t fds = count("/proc/self/fd");
+    const size_t maps = mappings();
+    for (int i = 0; i < 100; ++i) {
+        ASSERT_EQ(mController->start(), 0u);
+        ASSERT_EQ(mController->stop(), 0u);
+    }
+    mController.clear();
+    std::map<std::string, std::string> config = {{"pcrPid", "273"}, {"videoPid", "273"}};
+    for (int i = 0; i < 100; ++i) {
+        android::sp<MainController> controller = new MainController();
+        std::map<std::string, std::string> map = config;
+        ASSERT_EQ(controller->configure(map), 0u);
+    }
+    // The controller's own rings and threads are gone with it.
+    EXPECT_LE(count("/proc/self/fd"), fds);
+    EXPECT_LE(mappings(), maps + 8);  // allocator arenas may grow a little
+    size_t threads = 0;
+    for (int i = 0; i < 50; ++i) {
+        threads = count("/proc/self/task");
+        if (threads <= threadsBefore + 1)
+            break;
+        std::this_thread::sleep_for(std::chrono::milliseconds(100));
+    }
+    // glibc keeps one SIGEV_THREAD helper for the playback timer.
+    EXPECT_LE(threads, threadsBefore + 1) << testing::PrintToString(threadNames());
+}
+
+// What a viewer's application may hand over or tune to that cannot play: each row
+// gives the designed result of start and leaves a controller that stops and goes away
+// without a hang or a leaked descriptor.
+struct BadInput {
+    const char* name;
+    const char* source;  // "" for a tsgen stream, "nulls" for a file of null packets
+    std::map<std::string, std::string> config;
+    unsigned int started;
+};
+void PrintTo(const BadInput& b, std::ostream* os) {
+    *os << b.name;
+}
+
+class LiveBadInput : public LivePlayback, public testing::WithParamInterface<BadInput> {};
+
+TEST_P(LiveBadInput, StartGivesTheDesignedResultAndTheControllerGoesAway) {
+    const size_t fds = std::distance(fs::directory_iterator("/proc/self/fd"), {});
+    std::string source = GetParam().source;
+    if (source.empty() || source == "nulls") {
+        const std::string ts = (mDir / "s.ts").string();
+        if (source.empty()) {
+            ASSERT_EQ(system((std::string(TAVO_TSGEN_PATH) + " -o " + ts +
+                              " -d 3 --size 320x240 --mux-rate 1500000 >/dev/null 2>&1")
+                                 .c_str()),
+                      0);
+        } else {
+            // Null packets only (ISO/IEC 13818-1, 2.4.3.3: PID 0x1FFF).
+            std::string nulls;
+            for (int i = 0; i < 10000; ++i)
+                nulls += std::string("\x47\x1F\xFF\x10", 4) + std::string(184, '\xFF');
+            std::ofstream(ts, std::ios::binary) << nulls;
+        }
+        source = "file:" + ts;
+    }
+    EXPECT_EQ(startOn(source, GetParam().config), GetParam().started);
+    sleepUntil(3);
+    // Nothing that plays was there to show.
+    if (GetParam().started != 0 || GetParam().source[0] != '\0') {
+        EXPECT_LT(mViewer.firstAt("START_VIDEO_TASK"), 0) << eventLog();
+    }
+    mController->stop();
+    mController.clear();
+    EXPECT_LE(std::distance(fs::directory_iterator("/proc/self/fd"), {}), fds);
+}
+
+INSTANTIATE_TEST_SUITE_P(Tsgen, LiveBadInput,
+                         testing::Values(
+                             // PIDs are 13 bits: the receiver's filter refuses a larger one.
+                             BadInput{"VideoPidAbove8191", "", {{"videoPid", "9000"}}, 0x11004},
+                             BadInput{"NegativeCaptionPid", "", {{"subtitlePid", "-5"}}, 0x11004},
+                             // Numbers are read with atoi: a word or nothing reads 0 and plays on.
+                             BadInput{"AudioPidNotANumber", "", {{"audioPid", "abc"}}, 0},
+                             BadInput{"EmptySourceType", "", {{"sourceType", ""}}, 0},
+                             BadInput{"SourceWithoutPackets", "udp://127.0.0.1:45987", {}, 0},
+                             BadInput{"OnlyNullPackets", "nulls", {}, 0}),
+                         [](const testing::TestParamInfo<BadInput>& info) {
+                             return std::string(info.param.name);
+                         });
 
 }  // namespace
 }  // namespace TavoPlayer

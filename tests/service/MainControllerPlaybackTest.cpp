@@ -534,5 +534,94 @@ INSTANTIATE_TEST_SUITE_P(Tsgen, LiveBadInput,
                              return std::string(info.param.name);
                          });
 
+// Streams that no one here wrote, from ../shared/streams: every packet of their video
+// and audio PIDs reaches the receiver's rings (a capture's 16-byte ISDB-T trailers
+// dropped), and whatever complete pictures and sound they carry reach the outputs.
+struct Capture {
+    const char* file;
+    size_t packetSize;
+    std::map<std::string, std::string> config;
+    const char* picture;  // the first picture's announcement, or nullptr when none is whole
+};
+void PrintTo(const Capture& c, std::ostream* os) {
+    *os << c.file;
+}
+
+class LiveCapture : public LivePlayback, public testing::WithParamInterface<Capture> {
+protected:
+    // Packets of `pid` in the capture.
+    size_t packetsOf(const std::string& path, int pid) {
+        std::ifstream in(path, std::ios::binary);
+        const std::string bytes(std::istreambuf_iterator<char>(in), {});
+        size_t n = 0;
+        for (size_t at = 0; at + 188 <= bytes.size(); at += GetParam().packetSize)
+            n += ((bytes[at + 1] & 0x1F) << 8 | static_cast<uint8_t>(bytes[at + 2])) == pid;
+        return n;
+    }
+    // Bytes ever written into the named ring, from its dump's head counter.
+    uint64_t writtenInto(const char* ring) {
+        for (const auto& r : mController->rings()) {
+            if (r->name() != ring)
+                continue;
+            char* text = nullptr;
+            size_t size = 0;
+            FILE* out = open_memstream(&text, &size);
+            r->dump(out, 0);
+            fclose(out);
+            const std::string dump(text, size);
+            free(text);
+            const size_t head = dump.find("Head: ");
+            return head == std::string::npos ? 0 : std::stoull(dump.substr(head + 6));
+        }
+        return 0;
+    }
+};
+
+TEST_P(LiveCapture, EveryPacketReachesItsRingAndWholeUnitsReachTheOutputs) {
+    const std::string path = std::string(TAVO_SHARED_STREAMS_DIR) + "/" + GetParam().file;
+    if (!fs::exists(path))
+        GTEST_SKIP() << "no " << path << " (the shared sample streams are not beside the checkout)";
+    ASSERT_EQ(startOn("file:" + path, GetParam().config), 0u);
+    sleepUntil(13);  // the longest capture lasts 10 s
+    const int video = atoi(GetParam().config.at("videoPid").c_str());
+    const int audio = atoi(GetParam().config.at("audioPid").c_str());
+    EXPECT_EQ(writtenInto("VideoTS"), 188 * packetsOf(path, video));
+    EXPECT_EQ(writtenInto("AudioTS"), 188 * packetsOf(path, audio));
+    if (GetParam().picture != nullptr) {
+        EXPECT_GE(mViewer.firstAt(GetParam().picture), 0) << eventLog();
+        mController->stop();
+        EXPECT_GT(fs::file_size(wavPath()), 5u * 48000 * 4) << eventLog();
+    } else {
+        EXPECT_LT(mViewer.firstAt("START_VIDEO_TASK"), 0) << eventLog();
+    }
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    SharedStreams, LiveCapture,
+    testing::Values(
+        // TV Integração (ISDB-Tb), 204-byte packets: 156 video packets without a whole
+        // access unit, one LATM PES start.
+        Capture{"isdbtb_br_tvintegracao_rs204_pcap_329pkts.ts",
+                204,
+                {{"pcrPid", "256"},
+                 {"videoPid", "273"},
+                 {"audioPid", "274"},
+                 {"IsLATMAudio", "1"},
+                 {"subtitlePid", "278"}},
+                nullptr},
+        // 10 s of 1080p H.264 with MPEG-1 Layer II audio, PCR on the video PID.
+        Capture{"dvb_h264_1080_mpeg1audio_0x03.ts",
+                188,
+                {{"pcrPid", "256"},
+                 {"videoPid", "256"},
+                 {"audioPid", "257"},
+                 {"IsLATMAudio", "0"},
+                 {"isMPEG2Audio", "1"},
+                 {"subtitlePid", "8189"}},
+                "START_VIDEO_TASK(1920,1080)"}),
+    [](const testing::TestParamInfo<Capture>& info) {
+        return std::string(info.param.file).substr(0, std::string(info.param.file).find('.'));
+    });
+
 }  // namespace
 }  // namespace TavoPlayer

@@ -254,13 +254,24 @@ TEST_F(LivePlayback, TimeStampsWrappingAt2Pow33KeepThePicturesComing) {
     EXPECT_GT(afterWrap, 80u) << eventLog();
 }
 
-TEST_F(LivePlayback, MislabelledAudioStillPlays) {
-    // LATM in a stream whose PMT says ADTS, played as the PMT says.
-    play("-d 7 --latm-as-adts", {{"IsLATMAudio", "0"}});
+// AAC whose PMT names the other transport (LATM as ADTS and the reverse), played as the
+// PMT says: the extractor finds the real one and the sound still reaches the output.
+class LiveMislabelledAudio
+    : public LivePlayback,
+      public testing::WithParamInterface<std::pair<std::string, std::string>> {};
+
+TEST_P(LiveMislabelledAudio, StillPlays) {
+    play("-d 7 " + GetParam().first, {{"IsLATMAudio", GetParam().second}});
     sleepUntil(7);
     mController->stop();
     EXPECT_GT(fs::file_size(wavPath()), 2u * 48000 * 4) << eventLog();
 }
+
+INSTANTIATE_TEST_SUITE_P(
+    Tsgen, LiveMislabelledAudio,
+    testing::Values(std::make_pair(std::string("--latm-as-adts"), std::string("0")),
+                    std::make_pair(std::string("--audio adts --adts-as-latm"), std::string("1"))),
+    [](const auto& info) { return std::string(info.index == 0 ? "LatmAsAdts" : "AdtsAsLatm"); });
 
 TEST_F(LivePlayback, EveryPipelineThreadIsNamedAndNoneOutlivesStop) {
     const std::vector<std::string> before = threadNames();

@@ -176,7 +176,6 @@ TEST_F(DemuxTest, SlowFilterDropsItsOldestPacketsWithoutHoldingBackTheOthers) {
     const auto stream =
         buildStream({.pids = {0x100, 0x101}, .rounds = 100, .pcrPid = 0x101, .pcrIntervalMs = 10});
     FileSource source(stream, "?queue=16");
-    TraceCapture trace;
     const int slow = start(0x100);
     const int fast = start(0x101);
     auto expected = packetsByPid(stream);
@@ -191,10 +190,6 @@ TEST_F(DemuxTest, SlowFilterDropsItsOldestPacketsWithoutHoldingBackTheOthers) {
     // What is left is the newest sixteen, in order.
     EXPECT_EQ(summary(readPackets(slow, 16)),
               summary(std::vector<TsPacket>(expected[0x100].end() - 16, expected[0x100].end())));
-    EXPECT_TRUE(trace.contains("PID 256 is not read fast enough"));
-    stop(slow);
-    EXPECT_TRUE(trace.contains("PID 256 (handle"));
-    EXPECT_TRUE(trace.contains("lost 84 packets"));
 }
 
 TEST_F(DemuxTest, UnpacedFileWaitsForASlowReaderInsteadOfDropping) {
@@ -312,8 +307,6 @@ TEST_F(DemuxTest, GarbageBetweenPacketsIsSkippedAndTheRestDelivered) {
     EXPECT_EQ(summary(readPackets(start(0x100), 50, 3s)), summary(packetsByPid(clean)[0x100]));
     ASSERT_TRUE(sourceEnded());
     EXPECT_GT(Demux::instance().sourceStats().bytesSkipped, 0u);
-    EXPECT_TRUE(trace.contains("TS sync lost on file")) << trace.all();
-    EXPECT_TRUE(trace.contains("ends with 165 bytes that are no whole TS packet")) << trace.all();
 }
 
 // --- UDP ------------------------------------------------------------------------
@@ -373,8 +366,6 @@ TEST_F(DemuxTest, UdpDatagramsOfOneToSevenPacketsArriveIntact) {
     // The very last packet waits for a sync byte after it that never comes.
     expected[0x101].pop_back();
     EXPECT_EQ(summary(readPackets(other, 143)), summary(expected[0x101]));
-    EXPECT_TRUE(trace.contains("UDP datagram of 812 bytes is not a whole number of TS packets"))
-        << trace.all();
 }
 
 TEST_F(DemuxTest, UdpMulticastGroupIsJoinedOnTheGivenInterface) {

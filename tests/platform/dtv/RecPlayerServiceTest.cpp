@@ -26,6 +26,7 @@
 #include <sqlite3.h>
 #include <functional>
 #include <map>
+#include "support/ScopedEnv.h"
 #include "support/TraceCapture.h"
 #include "support/TsTestUtil.h"
 
@@ -42,51 +43,13 @@ constexpr uint16_t kVideo = 0x111;
 constexpr uint16_t kAudio = 0x112;
 constexpr uint16_t kCaptions = 0x130;
 
-// A tsgen stream of `seconds`, made once per test program.
+// A tsgen stream of `seconds` with two captions, made once per test program.
 const std::string& tsgenStream(int seconds) {
-    static std::map<int, std::string> made;
-    auto it = made.find(seconds);
-    if (it != made.end())
-        return it->second;
-    const std::string path = (fs::temp_directory_path() / ("tavo_rec_" + std::to_string(getpid()) +
-                                                           "_" + std::to_string(seconds) + ".ts"))
-                                 .string();
-    bool ok = false;
-    runCommand(std::string(TAVO_TSGEN_PATH) + " -o " + path + " -d " + std::to_string(seconds) +
-                   " --size 320x240 --caption 2:Hello --caption 12:World 2>&1",
-               &ok);
-    EXPECT_TRUE(ok) << "tsgen failed";
-    static struct Cleanup {
-        ~Cleanup() {
-            for (auto& [s, p] : made)
-                unlink(p.c_str());
-        }
-    } cleanup;
-    return made[seconds] = path;
+    return test::tsgenStream(seconds, "--caption 2:Hello --caption 12:World");
 }
 
-class ScopedEnv {
-public:
-    ScopedEnv(std::string name, const std::string& value) : mName(std::move(name)) {
-        const char* old = getenv(mName.c_str());
-        mHad = old != nullptr;
-        if (mHad)
-            mOld = old;
-        setenv(mName.c_str(), value.c_str(), 1);
-    }
-    ~ScopedEnv() {
-        if (mHad)
-            setenv(mName.c_str(), mOld.c_str(), 1);
-        else
-            unsetenv(mName.c_str());
-    }
-
-private:
-    std::string mName, mOld;
-    bool mHad = false;
-};
-
-// Events from the service, as the recorder and the clip player receive them.
+// Events from the service,// Events from the service, as the recorder and the clip player receive
+// them.
 struct EventLog {
     static void callback(int event, void* userData) {
         auto* self = static_cast<EventLog*>(userData);
@@ -140,18 +103,11 @@ void freeDetails(RecDetails* d) {
 // Every test has a recordings folder of its own and leaves the service idle.
 class RecordingServiceTest : public ::testing::Test {
 protected:
-    void SetUp() override {
-        char name[] = "/tmp/tavo_recordings_XXXXXX";
-        ASSERT_NE(mkdtemp(name), nullptr);
-        dir = name;
-        recordingsDir =
-            std::make_unique<ScopedEnv>("TAVOPLAYER_PROP_tavoplayer_recordings_dir", dir);
-    }
+    void SetUp() override { ASSERT_FALSE(dir.empty()); }
     void TearDown() override {
         RecPlayerBinder_DeleteTSRecorder();
         EXPECT_TRUE(RecPlayerService::instance().events().drain(kDeadline));
         EXPECT_FALSE(Demux::instance().sourceStats().open);
-        fs::remove_all(dir);
     }
     // Creates and starts a recording of the tsgen PIDs; returns its number.
     int record(EventLog& events, const std::string& station = "TV Tavo",
@@ -188,8 +144,8 @@ protected:
         EXPECT_TRUE(e.has_value()) << "no row " << number;
         return e.value_or(RecordingCatalog::Entry());
     }
-    std::string dir;
-    std::unique_ptr<ScopedEnv> recordingsDir;
+    ScopedRecordingsDir recordings;
+    const std::string dir = recordings.path();
 };
 
 TEST_F(RecordingServiceTest, RecordsTheLivePacketsOfItsPidsUnchangedInOrderInAPlayableFile) {

@@ -15,11 +15,14 @@
 
 #include "platform/media/MediaPlayerOutputs.h"
 #include "support/MediaTestFiles.h"
+#include "support/NamedRow.h"
 #include "support/TraceCapture.h"
 #include "support/TsTestUtil.h"
 
 namespace TavoPlayer::test {
 namespace {
+
+using test::PrintTo;
 
 using android::MediaPlayer;
 using android::sp;

@@ -8,7 +8,9 @@
 namespace TavoPlayer::test {
 
 template <typename Row>
-    requires requires(const Row& row) { *static_cast<std::ostream*>(nullptr) << row.name; }
+requires requires(const Row& row) {
+    *static_cast<std::ostream*>(nullptr) << row.name;
+}
 void PrintTo(const Row& row, std::ostream* os) {
     *os << row.name;
 }

@@ -53,8 +53,8 @@ const std::string& tsgenStream(const std::string& tsgen, int seconds, const std:
     auto it = made.find(key);
     if (it != made.end())
         return it->second;
-    const std::string path = "/tmp/tavo_stream_" + std::to_string(getpid()) + "_" +
-                             std::to_string(made.size()) + ".ts";
+    const std::string path =
+        "/tmp/tavo_stream_" + std::to_string(getpid()) + "_" + std::to_string(made.size()) + ".ts";
     bool ok = false;
     runCommand(tsgen + " -o " + path + " -d " + std::to_string(seconds) + " --size 320x240 " +
                    options + " 2>&1",

@@ -14,6 +14,7 @@
 #include <set>
 #include <thread>
 
+#include "DemuxTestUtil.h"
 #include "platform/dtv/Demux.h"
 #include "platform/dtv/DemuxBinder.h"
 #include "support/TraceCapture.h"
@@ -25,26 +26,9 @@ namespace {
 using namespace std::chrono_literals;
 using namespace test;
 
-// Reads a filter until `packets` have arrived or the deadline passes.
 std::vector<TsPacket> readPackets(int handle, size_t packets,
                                   std::chrono::milliseconds deadline = kDeadline) {
-    std::vector<TsPacket> got;
-    std::vector<uint8_t> buffer(188 * 50);
-    const auto end = std::chrono::steady_clock::now() + deadline;
-    while (got.size() < packets && std::chrono::steady_clock::now() < end) {
-        DemuxHandleSet set;
-        DemuxBinder_HandleZERO(&set);
-        DemuxBinder_HandleSET(handle, &set);
-        if (DemuxBinder_Select(&set, 30) <= 0)
-            continue;
-        const int n = DemuxBinder_ReadData(handle, buffer.data(), static_cast<int>(buffer.size()));
-        EXPECT_EQ(n % 188, 0);
-        if (n <= 0)
-            continue;
-        const auto more = toPackets(std::vector<uint8_t>(buffer.begin(), buffer.begin() + n));
-        got.insert(got.end(), more.begin(), more.end());
-    }
-    return got;
+    return readFilter(handle, packets, deadline);
 }
 
 bool sourceEnded() {

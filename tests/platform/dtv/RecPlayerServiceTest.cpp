@@ -1,6 +1,4 @@
-#include <fcntl.h>
 #include <signal.h>
-#include <spawn.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -26,11 +24,10 @@
 #include <sqlite3.h>
 #include <functional>
 #include <map>
+#include "DemuxTestUtil.h"
 #include "support/ScopedEnv.h"
 #include "support/TraceCapture.h"
 #include "support/TsTestUtil.h"
-
-extern char** environ;
 
 namespace TavoPlayer {
 namespace {
@@ -256,61 +253,37 @@ TEST_F(RecordingServiceTest, ASecondRecordingIsRefusedAndTheFirstGoesOn) {
     EXPECT_TRUE(first.all().empty() || first.all() == std::vector<int>{kRecEventDemuxLost});
 }
 
-// A recording in a child process of its own, started from a demux source.
+// A recording in a child process of its own, started from a demux source. The shell
+// prints its process id, which exec hands on to the recording program.
 class ChildRecording {
 public:
-    ChildRecording(const std::string& mode, const std::string& dir, const std::string& source) {
-        int fds[2];
-        EXPECT_EQ(pipe(fds), 0);
-        posix_spawn_file_actions_t actions;
-        posix_spawn_file_actions_init(&actions);
-        posix_spawn_file_actions_adddup2(&actions, fds[1], STDOUT_FILENO);
-        posix_spawn_file_actions_addclose(&actions, fds[0]);
-        std::vector<std::string> env;
-        for (char** e = environ; *e != nullptr; ++e) {
-            if (strncmp(*e, "TAVOPLAYER_PROP_tavoplayer_", 27) != 0)
-                env.emplace_back(*e);
-        }
-        env.push_back("TAVOPLAYER_PROP_tavoplayer_recordings_dir=" + dir);
-        env.push_back("TAVOPLAYER_PROP_tavoplayer_demux_source=" + source);
-        std::vector<char*> envp;
-        for (auto& e : env)
-            envp.push_back(e.data());
-        envp.push_back(nullptr);
-        std::string program = TAVO_RECORDING_CHILD_PATH;
-        std::string arg = mode;
-        char* argv[] = {program.data(), arg.data(), nullptr};
-        EXPECT_EQ(posix_spawn(&mPid, program.c_str(), &actions, nullptr, argv, envp.data()), 0);
-        posix_spawn_file_actions_destroy(&actions);
-        close(fds[1]);
-        mOut = fdopen(fds[0], "r");
-    }
-    ~ChildRecording() {
-        if (mPid > 0) {
-            kill(mPid, SIGKILL);
-            wait();
-        }
-        if (mOut != nullptr)
-            fclose(mOut);
-    }
+    ChildRecording(const std::string& mode, const std::string& dir, const std::string& source)
+        : mOut(popen(("echo $$; exec env TAVOPLAYER_PROP_tavoplayer_recordings_dir='" + dir +
+                      "' TAVOPLAYER_PROP_tavoplayer_demux_source='" + source + "' " +
+                      TAVO_RECORDING_CHILD_PATH + " " + mode)
+                         .c_str(),
+                     "r")),
+          mPid(std::atoi(line().c_str())) {}
+    ~ChildRecording() { killNow(); }
     std::string line() {
         char buffer[256] = {};
-        return fgets(buffer, sizeof buffer, mOut) != nullptr ? std::string(buffer) : std::string();
+        return mOut != nullptr && fgets(buffer, sizeof buffer, mOut) != nullptr ? buffer : "";
     }
+    // The exit status.
     int wait() {
-        int status = 0;
-        waitpid(mPid, &status, 0);
-        mPid = -1;
+        const int status = mOut != nullptr ? pclose(mOut) : -1;
+        mOut = nullptr;
         return status;
     }
     void killNow() {
-        kill(mPid, SIGKILL);
+        if (mOut != nullptr && mPid > 0)
+            kill(mPid, SIGKILL);
         wait();
     }
 
 private:
-    pid_t mPid = -1;
-    FILE* mOut = nullptr;
+    FILE* mOut;
+    pid_t mPid;
 };
 
 TEST_F(RecordingServiceTest, AKilledRecordingLeavesAPlayableFileMarkedIncomplete) {
@@ -355,22 +328,7 @@ TEST_F(RecordingServiceTest, AFullDiskStopsTheRecordingCleanlyWithItsEvent) {
 
 // Packets that reach a filter within `window`.
 std::vector<TsPacket> readFor(int handle, std::chrono::milliseconds window) {
-    std::vector<TsPacket> got;
-    std::vector<uint8_t> buffer(188 * 100);
-    const auto end = std::chrono::steady_clock::now() + window;
-    while (std::chrono::steady_clock::now() < end) {
-        DemuxHandleSet set;
-        DemuxBinder_HandleZERO(&set);
-        DemuxBinder_HandleSET(handle, &set);
-        if (DemuxBinder_Select(&set, 20) <= 0)
-            continue;
-        const int n = DemuxBinder_ReadData(handle, buffer.data(), static_cast<int>(buffer.size()));
-        if (n > 0) {
-            const auto more = toPackets(std::vector<uint8_t>(buffer.begin(), buffer.begin() + n));
-            got.insert(got.end(), more.begin(), more.end());
-        }
-    }
-    return got;
+    return readFilter(handle, std::numeric_limits<size_t>::max(), window);
 }
 
 // The time (ms since the clip's first PCR) of the first packet read that has a PCR.

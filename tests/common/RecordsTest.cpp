@@ -65,26 +65,6 @@ TEST_F(RecordInRingTest, PesRecordSizeAndAdvance) {
     }
 }
 
-TEST_F(RecordInRingTest, VideoFrameAlwaysAdvancesByEighty) {
-    for (int i = 0; i < 3; ++i) {
-        ASSERT_TRUE(ring->waitForSpace(VideoFrameData::kRecordSize));
-        auto* frame = new (ring->writePointer()) VideoFrameData;
-        frame->mBufferIndex = i;
-        ring->commitWrite(frame->mSize);
-    }
-    EXPECT_EQ(240u, ring->head());
-}
-
-TEST_F(RecordInRingTest, CaptionRecordOfTenBytesTakesFortyFour) {
-    ASSERT_TRUE(ring->waitForSpace(44));
-    auto* caption = new (ring->writePointer()) ClosedCaptionFragmentData;
-    caption->mSize = ClosedCaptionFragmentData::kHeaderSize + 10;
-    memcpy(caption->textBytes(), "0123456789", 10);
-    ring->commitWrite(caption->mSize);
-    EXPECT_EQ(42u, caption->mSize);
-    EXPECT_EQ(44u, ring->head());
-}
-
 // ---------------------------------------------------------------------------------
 // Byte layouts, read back from the raw bytes of each record.
 

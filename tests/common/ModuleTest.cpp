@@ -6,6 +6,8 @@
 #include <cstdio>
 #include <vector>
 
+#include "support/TsTestUtil.h"
+
 namespace TavoPlayer {
 namespace {
 
@@ -39,32 +41,15 @@ private:
     std::vector<Call>* mCalls;
 };
 
-std::string dumpToString(Module& module, FILE* (*open)(), int indent) {
-    FILE* f = open();
-    module.dump(f, indent);
-    fflush(f);
-    rewind(f);
-    std::string text;
-    char buffer[256];
-    size_t n;
-    while ((n = fread(buffer, 1, sizeof buffer, f)) > 0)
-        text.append(buffer, n);
-    fclose(f);
-    return text;
-}
-
 class ModuleTest : public ::testing::Test {
 protected:
     android::sp<TestModule> module = new TestModule("TS Parser");
     std::vector<Call> calls;
 };
 
-TEST_F(ModuleTest, OnErrorWithoutListenersReturnsZero) {
-    EXPECT_EQ(0u, module->onError(0x21003));
-    EXPECT_TRUE(calls.empty());
-}
-
 TEST_F(ModuleTest, OnErrorReachesListenersInOrderWithTheModule) {
+    EXPECT_EQ(0u, module->onError(0x21003));  // none yet
+    EXPECT_TRUE(calls.empty());
     RecordingListener first(1, &calls);
     RecordingListener second(2, &calls);
     module->addErrorListener(first);
@@ -117,8 +102,9 @@ TEST_F(ModuleTest, SetInputReplacesTheReference) {
 
 TEST_F(ModuleTest, DumpWritesIndentedName) {
     EXPECT_EQ(0u, module->dump(nullptr, 2));
-    EXPECT_EQ("\t\t - Module Name: TS Parser\n", dumpToString(*module, tmpfile, 2));
-    EXPECT_EQ(" - Module Name: TS Parser\n", dumpToString(*module, tmpfile, 0));
+    EXPECT_EQ("\t\t - Module Name: TS Parser\n",
+              test::printed([&](FILE* f) { module->dump(f, 2); }));
+    EXPECT_EQ(" - Module Name: TS Parser\n", test::printed([&](FILE* f) { module->dump(f, 0); }));
 }
 
 }  // namespace

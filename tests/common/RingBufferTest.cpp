@@ -24,53 +24,33 @@ const unsigned int kPage = static_cast<unsigned int>(sysconf(_SC_PAGE_SIZE));
 // ---------------------------------------------------------------------------------
 // Configuration
 
-class RingBufferConfigureTest : public ::testing::Test {
-protected:
+TEST(RingBufferConfigureTest, OnlyTheFirstValidConfigurationCounts) {
     TraceCapture trace;
     android::sp<RingBuffer> ring = new RingBuffer;
-};
-
-TEST_F(RingBufferConfigureTest, BelowOnePageIsRefusedAndLeavesTheRingUnconfigured) {
-    EXPECT_EQ(1u, ring->configureWithSize("small", kPage - 4));
+    // Below one page: refused, and the ring stays unconfigured.
+    EXPECT_EQ(1u, ring->configureWithSize("first", kPage - 4));
     EXPECT_EQ(0u, ring->size());
-    EXPECT_EQ(1u, trace.count(TRACE_ERROR, "configureWithSize: Size must be multiple of " +
-                                               std::to_string(kPage)));
-    // Still unconfigured, so a proper size is accepted afterwards.
-    EXPECT_EQ(0u, ring->configureWithSize("small", kPage));
+    EXPECT_EQ(0u, ring->configureWithSize("first", kPage));
     EXPECT_EQ(kPage, ring->size());
-}
-
-TEST_F(RingBufferConfigureTest, ExactlyOnePageIsAccepted) {
-    EXPECT_EQ(0u, ring->configureWithSize("page", kPage));
-    EXPECT_EQ(1u, trace.count(TRACE_INFO, "configureWithSize: mSize: " + std::to_string(kPage)));
-    EXPECT_EQ("page", ring->name());
-}
-
-TEST_F(RingBufferConfigureTest, SecondConfigurationIsRefusedAndChangesNothing) {
-    ASSERT_EQ(0u, ring->configure("first", 16));
+    // A second configuration, of either kind, changes nothing.
     EXPECT_EQ(1u, ring->configure("second", 17));
     EXPECT_EQ(1u, ring->configureWithSize("third", 3 * kPage));
-    EXPECT_EQ(65536u, ring->size());
+    EXPECT_EQ(kPage, ring->size());
     EXPECT_EQ("first", ring->name());
-    EXPECT_EQ(1u, trace.count("configure: RingBuffer already configured"));
-    EXPECT_EQ(1u, trace.count("configureWithSize: RingBuffer already configured"));
+
+    android::sp<RingBuffer> mod = new RingBuffer;
+    ASSERT_EQ(0u, mod->configure("mod", 46));  // log2 size taken modulo 32: 1 << 14
+    EXPECT_EQ(16384u, mod->size());
+
+    // Not a page multiple: the second mapping fails, and the size it left set makes
+    // any later attempt "already configured".
+    android::sp<RingBuffer> odd = new RingBuffer;
+    EXPECT_EQ(1u, odd->configureWithSize("odd", kPage + 100));
+    EXPECT_EQ(1u, odd->configureWithSize("odd", 2 * kPage));
 }
 
-TEST_F(RingBufferConfigureTest, Log2SizeIsTakenModulo32) {
-    // 32 + 14 = 46 -> 1 << 14.
-    ASSERT_EQ(0u, ring->configure("mod", 46));
-    EXPECT_EQ(16384u, ring->size());
-}
-
-TEST_F(RingBufferConfigureTest, SizeThatIsNotAPageMultipleFailsAtTheSecondMapping) {
-    EXPECT_EQ(1u, ring->configureWithSize("odd", kPage + 100));
-    EXPECT_TRUE(trace.contains("configureWithSize: mmap failed 3"));
-    // The failed attempt leaves mSize set: a later attempt is "already configured".
-    EXPECT_EQ(1u, ring->configureWithSize("odd", 2 * kPage));
-    EXPECT_TRUE(trace.contains("RingBuffer already configured"));
-}
-
-TEST_F(RingBufferConfigureTest, FailedConfigurationsLeakNoDescriptor) {
+TEST(RingBufferConfigureTest, FailedConfigurationsLeakNoDescriptor) {
+    TraceCapture trace;
     auto openDescriptors = [] {
         int n = 0;
         for (int fd = 0; fd < 1024; ++fd) {
@@ -107,7 +87,6 @@ protected:
         }
     }
 
-    TraceCapture trace;
     android::sp<RingBuffer> ring = new RingBuffer;
 };
 
@@ -143,11 +122,20 @@ TEST_F(RingBufferAccessTest, RecordStartingEightBytesBeforeTheEndIsContiguous) {
     EXPECT_EQ(0u, ring->usedSpace());
 }
 
-TEST_F(RingBufferAccessTest, FullRingRefusesMoreAfterOneWait) {
+// Each side gives up after one wait of the time-out; the writer's failed wait has
+// released its lock, so the reader side still works.
+TEST_F(RingBufferAccessTest, WaitsGiveUpAfterOneTimeOut) {
+    auto timed = [](const std::function<bool()>& wait) {
+        const auto start = std::chrono::steady_clock::now();
+        EXPECT_FALSE(wait());
+        return std::chrono::steady_clock::now() - start;
+    };
+    const auto empty = timed([&] { return ring->waitForData(40); });
+    EXPECT_GE(empty, 95ms);
+    EXPECT_LT(empty, 5s);
     ASSERT_TRUE(ring->waitForSpace(kPage));
     ring->commitWrite(kPage);
-    EXPECT_FALSE(ring->waitForSpace(4));
-    // The writer lock was released: the reader side can still work.
+    EXPECT_GE(timed([&] { return ring->waitForSpace(4); }), 95ms);
     ASSERT_TRUE(ring->waitForData(kPage));
     ring->consume(kPage);
     EXPECT_TRUE(ring->waitForSpace(4));
@@ -155,160 +143,117 @@ TEST_F(RingBufferAccessTest, FullRingRefusesMoreAfterOneWait) {
 }
 
 // ---------------------------------------------------------------------------------
-// Waits and wake-ups, with generous deadlines: the assertions are about who wakes
-// whom, not about how fast.
+// Wake-ups: a waiter woken by the other side returns before its 100 ms time-out.
+// The wait runs on a thread; the waking side acts 10 ms after it started, so that
+// the wake-up finds it inside its wait. The assertions are about who wakes whom.
 
-class RingBufferWaitTest : public ::testing::Test {
-protected:
-    void SetUp() override { ASSERT_EQ(0u, ring->configureWithSize("wait", kPage)); }
-    android::sp<RingBuffer> ring = new RingBuffer;
+struct WakeCase {
+    const char* name;
+    bool fullFirst;                         // fill the ring before the wait
+    std::function<bool(RingBuffer&)> wait;  // on the waiting thread
+    std::function<void(RingBuffer&)> wake;  // on the test's thread
+    bool result;
 };
 
-TEST_F(RingBufferWaitTest, ReaderOnEmptyRingGivesUpAfterItsWait) {
-    const auto start = std::chrono::steady_clock::now();
-    EXPECT_FALSE(ring->waitForData(40));
-    const auto waited = std::chrono::steady_clock::now() - start;
-    EXPECT_GE(waited, 95ms);  // it did wait, once
-    EXPECT_LT(waited, 5s);    // and did not wait forever
-}
-
-TEST_F(RingBufferWaitTest, WriterOnFullRingGivesUpAfterItsWait) {
-    ASSERT_TRUE(ring->waitForSpace(kPage));
-    ring->commitWrite(kPage);
-    const auto start = std::chrono::steady_clock::now();
-    EXPECT_FALSE(ring->waitForSpace(40));
-    EXPECT_GE(std::chrono::steady_clock::now() - start, 95ms);
-}
-
-// A waiter woken by the other side returns before its 100 ms time-out. Each test
-// runs the wait on a thread that reports how long it waited; the waking side acts
-// 10 ms after the waiter started, so that the wake-up finds it inside its wait.
-class Waiter {
-public:
-    explicit Waiter(std::function<bool()> wait) {
-        mThread = std::thread([this, wait = std::move(wait)] {
-            mStarted = true;
+TEST(RingBufferWakeTest, TheOtherSideOrAResetEndsTheWait) {
+    const WakeCase cases[] = {
+        {"commit wakes a reader", false,
+         [](RingBuffer& r) {
+             const bool ok = r.waitForData(40);
+             if (ok)
+                 r.consume(40);
+             return ok;
+         },
+         [](RingBuffer& r) {
+             ASSERT_TRUE(r.waitForSpace(40));
+             r.commitWrite(40);
+         },
+         true},
+        {"consume wakes a writer", true,
+         [](RingBuffer& r) {
+             const bool ok = r.waitForSpace(400);
+             if (ok)
+                 r.abortWrite();
+             return ok;
+         },
+         [](RingBuffer& r) {
+             ASSERT_TRUE(r.waitForData(400));
+             r.consume(400);
+         },
+         true},
+        {"reset wakes a writer", true,
+         [](RingBuffer& r) {
+             const bool ok = r.waitForSpace(kPage);
+             if (ok)
+                 r.abortWrite();
+             return ok;
+         },
+         [](RingBuffer& r) { r.reset(); }, true},
+        // The ring is empty after the reset: still nothing to read.
+        {"reset wakes a reader", false, [](RingBuffer& r) { return r.waitForData(40); },
+         [](RingBuffer& r) { r.reset(); }, false},
+    };
+    for (const WakeCase& c : cases) {
+        SCOPED_TRACE(c.name);
+        android::sp<RingBuffer> ring = new RingBuffer;
+        ASSERT_EQ(0u, ring->configureWithSize("wait", kPage));
+        if (c.fullFirst) {
+            ASSERT_TRUE(ring->waitForSpace(kPage));
+            ring->commitWrite(kPage);
+        }
+        std::atomic<bool> started{false};
+        bool result = !c.result;
+        std::chrono::steady_clock::duration waited{};
+        std::thread waiter([&] {
+            started = true;
             const auto start = std::chrono::steady_clock::now();
-            mResult = wait();
-            mWaited = std::chrono::steady_clock::now() - start;
+            result = c.wait(*ring);
+            waited = std::chrono::steady_clock::now() - start;
         });
-        while (!mStarted)
+        while (!started)
             std::this_thread::yield();
+        std::this_thread::sleep_for(10ms);
+        c.wake(*ring);
+        waiter.join();
+        EXPECT_EQ(result, c.result);
+        EXPECT_LT(waited, std::chrono::nanoseconds(RingBuffer::kWaitTimeoutNs) * 9 / 10);
     }
-    bool result() {
-        join();
-        return mResult;
-    }
-    bool wokenBeforeTimeout() {
-        join();
-        return mWaited < std::chrono::nanoseconds(RingBuffer::kWaitTimeoutNs) * 9 / 10;
-    }
-    ~Waiter() { join(); }
-
-private:
-    void join() {
-        if (mThread.joinable())
-            mThread.join();
-    }
-    std::thread mThread;
-    std::atomic<bool> mStarted{false};
-    bool mResult = false;
-    std::chrono::steady_clock::duration mWaited{};
-};
-
-TEST_F(RingBufferWaitTest, CommitWakesAWaitingReader) {
-    Waiter reader([&] {
-        const bool ok = ring->waitForData(40);
-        if (ok)
-            ring->consume(40);
-        return ok;
-    });
-    std::this_thread::sleep_for(10ms);
-    ASSERT_TRUE(ring->waitForSpace(40));
-    ring->commitWrite(40);
-    EXPECT_TRUE(reader.result());
-    EXPECT_TRUE(reader.wokenBeforeTimeout());
-}
-
-TEST_F(RingBufferWaitTest, ConsumeWakesAWaitingWriter) {
-    ASSERT_TRUE(ring->waitForSpace(kPage));
-    ring->commitWrite(kPage);
-    Waiter writer([&] {
-        const bool ok = ring->waitForSpace(400);
-        if (ok)
-            ring->abortWrite();
-        return ok;
-    });
-    std::this_thread::sleep_for(10ms);
-    ASSERT_TRUE(ring->waitForData(400));
-    ring->consume(400);
-    EXPECT_TRUE(writer.result());
-    EXPECT_TRUE(writer.wokenBeforeTimeout());
-}
-
-TEST_F(RingBufferWaitTest, ResetWakesAWriterWaitingForSpace) {
-    ASSERT_TRUE(ring->waitForSpace(kPage));
-    ring->commitWrite(kPage);
-    Waiter writer([&] {
-        const bool ok = ring->waitForSpace(kPage);
-        if (ok)
-            ring->abortWrite();
-        return ok;
-    });
-    std::this_thread::sleep_for(10ms);
-    ring->reset();
-    EXPECT_TRUE(writer.result());
-    EXPECT_TRUE(writer.wokenBeforeTimeout());
-    EXPECT_EQ(0u, ring->head());
-    EXPECT_EQ(0u, ring->tail());
-}
-
-TEST_F(RingBufferWaitTest, ResetWakesAReaderWaitingForData) {
-    Waiter reader([&] { return ring->waitForData(40); });
-    std::this_thread::sleep_for(10ms);
-    ring->reset();
-    EXPECT_FALSE(reader.result());  // the ring is empty after reset: still nothing
-    EXPECT_TRUE(reader.wokenBeforeTimeout());
 }
 
 // ---------------------------------------------------------------------------------
-// Picture and dump
+// Picture and dump: the dump's text is part of the service's diagnostic output.
 
-class RingBufferDumpTest : public ::testing::Test {
-protected:
-    void SetUp() override { ASSERT_EQ(0u, ring->configureWithSize("VideoPES", 8 * kPage)); }
+std::string dumpText(RingBuffer& r, int indent) {
+    char* buffer = nullptr;
+    size_t length = 0;
+    FILE* f = open_memstream(&buffer, &length);
+    r.dump(f, indent);
+    fclose(f);
+    std::string text(buffer, length);
+    free(buffer);
+    return text;
+}
 
-    void fill(uint32_t head, uint32_t tail) {
-        // Consume first so that both counters end where asked.
-        if (head > 0) {
-            ASSERT_TRUE(ring->waitForSpace(head));
-            ring->commitWrite(head);
-        }
-        if (tail > 0) {
-            ASSERT_TRUE(ring->waitForData(tail));
-            ring->consume(tail);
-        }
-    }
-
-    static std::string dumpText(RingBuffer& r, int indent) {
-        char* buffer = nullptr;
-        size_t length = 0;
-        FILE* f = open_memstream(&buffer, &length);
-        r.dump(f, indent);
-        fclose(f);
-        std::string text(buffer, length);
-        free(buffer);
-        return text;
-    }
-
+// A ring of eight pages whose counters first move on by `wrap`, then to `head`
+// (written) and `tail` (consumed) from there.
+android::sp<RingBuffer> filled(uint32_t head, uint32_t tail, uint32_t wrap = 0) {
     android::sp<RingBuffer> ring = new RingBuffer;
-    const std::string red = "\e[01;31m", green = "\e[01;32m", bar = "\e[01;33m|";
-};
+    EXPECT_EQ(0u, ring->configureWithSize("VideoPES", 8 * kPage));
+    for (const auto& [write, read] : {std::pair{wrap, wrap}, std::pair{head, tail}}) {
+        if (write > 0 && ring->waitForSpace(write))
+            ring->commitWrite(write);
+        if (read > 0 && ring->waitForData(read))
+            ring->consume(read);
+    }
+    return ring;
+}
 
-// The picture for head and tail positions given in eighths of the ring: used bytes
-// red, free bytes green, 80 columns between yellow bars.
-TEST_F(RingBufferDumpTest, UsedBytesAreRedAndFreeBytesGreen) {
-    const std::string r = red, g = green;
+const std::string kRed = "\e[01;31m", kGreen = "\e[01;32m", kBar = "\e[01;33m|";
+
+// Head and tail positions in eighths of the ring: used bytes red, free bytes green,
+// 80 columns between yellow bars.
+TEST(RingBufferDumpTest, UsedBytesAreRedAndFreeBytesGreen) {
+    const std::string r = kRed, g = kGreen;
     const struct {
         const char* name;
         uint32_t headEighths, tailEighths, wrapEighths;  // wrap: write and read this first
@@ -323,63 +268,40 @@ TEST_F(RingBufferDumpTest, UsedBytesAreRedAndFreeBytesGreen) {
          r + std::string(20, '=') + g + std::string(20, '=') + r + std::string(40, '=')},
     };
     for (const auto& c : cases) {
-        android::sp<RingBuffer> fresh = new RingBuffer;
-        ASSERT_EQ(0u, fresh->configureWithSize("picture", 8 * kPage));
-        ring = fresh;
-        fill(c.wrapEighths * kPage, c.wrapEighths * kPage);
-        fill(c.headEighths * kPage, c.tailEighths * kPage);
-        EXPECT_EQ(bar + c.picture + bar + "\e[m", ring->getRepresentation()) << c.name;
+        auto ring = filled(c.headEighths * kPage, c.tailEighths * kPage, c.wrapEighths * kPage);
+        EXPECT_EQ(kBar + c.picture + kBar + "\e[m", ring->getRepresentation()) << c.name;
     }
 }
 
-TEST_F(RingBufferDumpTest, DumpOfUnconfiguredRingIsTwoLines) {
+TEST(RingBufferDumpTest, DumpListsCountersLocksPictureAndCarets) {
     android::sp<RingBuffer> unconfigured = new RingBuffer;
     EXPECT_EQ("\e[2K\r\t - RingBuffer \n\e[2K\r\t\tRingBuffer is not configured.\n",
               dumpText(*unconfigured, 1));
-}
 
-TEST_F(RingBufferDumpTest, DumpListsCountersLocksPictureAndCarets) {
     const uint32_t size = 8 * kPage;
-    fill(size / 2, size / 4);
+    auto ring = filled(size / 2, size / 4);
     char pointer[32];
     snprintf(pointer, sizeof pointer, "%p", static_cast<void*>(ring->readPointer() - size / 4));
     const std::string head = std::to_string(size / 2), tail = std::to_string(size / 4);
-    const std::string expected =
-        "\e[2K\r - RingBuffer VideoPES\n"
-        "\e[2K\r\tSize: " +
-        std::to_string(size) +
-        "\n"
-        "\e[2K\r\tHead: " +
-        head + " (" + head +
-        ")\n"
-        "\e[2K\r\tTail: " +
-        tail + " (" + tail +
-        ")\n"
-        "\e[2K\r\tUsed: 25.00%\n"
-        "\e[2K\r\tPointer: " +
-        pointer +
-        "\n"
-        "\e[2K\r\tWriteLock: \e[01;32mUnlocked\e[m\n"
-        "\e[2K\r\tReadLock: \e[01;32mUnlocked\e[m\n"
-        "\e[2K\r\t" +
-        ring->getRepresentation() +
-        "\n"
-        "\e[2K\r\t" +
-        std::string(40, ' ') +
-        "^ head\n"
-        "\e[2K\r\t" +
-        std::string(20, ' ') + "^ tail\n\n";
-    EXPECT_EQ(expected, dumpText(*ring, 0));
-}
+    std::string expected;
+    for (const std::string& line :
+         {std::string(" - RingBuffer VideoPES"), "\tSize: " + std::to_string(size),
+          "\tHead: " + head + " (" + head + ")", "\tTail: " + tail + " (" + tail + ")",
+          std::string("\tUsed: 25.00%"), "\tPointer: " + std::string(pointer),
+          "\tWriteLock: " + kGreen + "Unlocked\e[m", "\tReadLock: " + kGreen + "Unlocked\e[m",
+          "\t" + ring->getRepresentation(), "\t" + std::string(40, ' ') + "^ head",
+          "\t" + std::string(20, ' ') + "^ tail"})
+        expected += "\e[2K\r" + line + "\n";
+    EXPECT_EQ(expected + "\n", dumpText(*ring, 0));
 
-TEST_F(RingBufferDumpTest, DumpShowsAHeldLock) {
+    // A lock held by another thread shows red.
     ASSERT_TRUE(ring->waitForSpace(4));
     std::string text;
     std::thread other([&] { text = dumpText(*ring, 2); });
     other.join();
     ring->abortWrite();
-    EXPECT_NE(std::string::npos, text.find("\t\t\tWriteLock: \e[01;31mLocked\e[m\n"));
-    EXPECT_NE(std::string::npos, text.find("\t\t\tReadLock: \e[01;32mUnlocked\e[m\n"));
+    EXPECT_NE(std::string::npos, text.find("\t\t\tWriteLock: " + kRed + "Locked\e[m\n"));
+    EXPECT_NE(std::string::npos, text.find("\t\t\tReadLock: " + kGreen + "Unlocked\e[m\n"));
     EXPECT_EQ(0u, text.find("\e[2K\r\t\t - RingBuffer VideoPES\n"));
 }
 

@@ -10,9 +10,9 @@
 #include <string>
 #include <vector>
 
-#include "RecorderTestUtil.h"
 #include "common/Uri.h"
 #include "platform/dtv/RecPlayerBinder.h"
+#include "support/ScopedEnv.h"
 #include "support/TraceCapture.h"
 #include "support/TsTestUtil.h"
 
@@ -56,14 +56,11 @@ TEST(RecorderCallbackTest, EventTable) {
         TraceCapture trace;
         Recorder::recorderCallback(c.event, recorder.get());
         EXPECT_EQ(listener.errors, c.errors) << c.event;
-        EXPECT_EQ(trace.count("recorderCallback event received: " + std::to_string(c.event)), 1u);
     }
     TraceCapture trace;
-    Recorder::recorderCallback(0, nullptr);
-    EXPECT_EQ(trace.count(TRACE_ERROR, "recorderCallback: userData is null!"), 1u);
+    Recorder::recorderCallback(0, nullptr);  // neither may crash
     recorder->setListener(nullptr);
     Recorder::recorderCallback(0, recorder.get());
-    EXPECT_EQ(trace.count(TRACE_ERROR, "recorderCallback: no IRecorderListener set!"), 1u);
 }
 
 // The in-process recording service records a paced tsgen stream from the demux.
@@ -72,7 +69,7 @@ protected:
     static constexpr int kVideo = 0x111, kAudio = 0x112, kCaptions = 0x130;
 
     void SetUp() override {
-        const std::string& stream = test::smallTsgenStream(20);
+        const std::string& stream = test::tsgenStream(20);
         ASSERT_FALSE(stream.empty()) << "tsgen failed";
         ASSERT_FALSE(dir.path().empty());
         demux = std::make_unique<test::ScopedDemuxSource>("file:" + stream + "?loop=1");
@@ -139,21 +136,6 @@ TEST_F(RecorderServiceTest, StartFillsTheDetailsFromTheQueryAndStopKeepsOrCancel
         free(d->prgName);
         free(d);
 
-        // The details are logged field by field in their fixed order (names apart).
-        std::string logged;
-        for (const auto& line : trace.lines()) {
-            const auto at = line.text.find("start recDetails->");
-            if (at == std::string::npos)
-                continue;
-            const std::string field = line.text.substr(at + 18, line.text.find(':') - at - 18);
-            if (field != "stationName" && field != "prgName")
-                logged += field + " ";
-        }
-        EXPECT_EQ(logged,
-                  "fileNumName stationNameLength prgNameLength creationTime durationOfRec "
-                  "sizeOfRec recMode recLocation bCanPlay playbackDuration recStartTime "
-                  "recEndTime iV_PID iA_PID isLATM ");
-
         recorder->stop(c.stopReason);
         EXPECT_EQ(listener.stopped, std::vector<int>{1});
         EXPECT_EQ(std::filesystem::exists(fileOf(number)), c.fileKept);
@@ -172,8 +154,6 @@ TEST_F(RecorderServiceTest, ARefusedSecondRecordingReportsZeroOnceAndItsError) {
     TraceCapture trace;
     refused->start(uri.get(), kVideo, kAudio, kCaptions, 1);
     EXPECT_EQ(second.started, std::vector<int>{0});
-    EXPECT_EQ(trace.count(TRACE_ERROR, "start: recDetails == null!"), 1u);
-    EXPECT_EQ(trace.count(TRACE_ERROR, "start RecPlayerBinder_CreateTSRecorder failed"), 1u);
     EXPECT_EQ(second.waitForErrors(), std::vector<int>{0x60004});
 
     // The refused attempt's stop fails: it reports 0 and attempts no delete;

@@ -17,8 +17,6 @@
 namespace TavoPlayer::test {
 namespace {
 
-constexpr const char* kSourceEnv = "TAVOPLAYER_PROP_tavoplayer_demux_source";
-
 size_t payloadOffset(const uint8_t* packet) {
     const uint8_t control = (packet[3] >> 4) & 3;
     if (control == 1)
@@ -221,26 +219,6 @@ TempFile::TempFile(const std::vector<uint8_t>& bytes, const std::string& suffix)
 
 TempFile::~TempFile() {
     unlink(mPath.c_str());
-}
-
-ScopedDemuxSource::ScopedDemuxSource(const std::string& value) {
-    const char* previous = getenv(kSourceEnv);
-    mHadPrevious = previous != nullptr;
-    if (previous != nullptr)
-        mPrevious = previous;
-    set(value);
-}
-
-ScopedDemuxSource::~ScopedDemuxSource() {
-    if (mHadPrevious) {
-        setenv(kSourceEnv, mPrevious.c_str(), 1);
-    } else {
-        unsetenv(kSourceEnv);
-    }
-}
-
-void ScopedDemuxSource::set(const std::string& value) {
-    setenv(kSourceEnv, value.c_str(), 1);
 }
 
 StdinPipe::StdinPipe() {

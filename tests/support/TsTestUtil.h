@@ -8,6 +8,7 @@
 #include <condition_variable>
 #include <cstdint>
 #include <cstdio>
+#include <cstdlib>
 #include <functional>
 #include <map>
 #include <mutex>
@@ -19,6 +20,7 @@
 #include <utils/StrongPointer.h>
 
 #include "common/RingBuffer.h"
+#include "support/ScopedEnv.h"
 #include "support/TsPacketBuilder.h"
 
 namespace TavoPlayer::test {
@@ -114,13 +116,12 @@ private:
 // Sets tavoplayer.demux.source (through its environment override) while it lives.
 class ScopedDemuxSource {
 public:
-    explicit ScopedDemuxSource(const std::string& value);
-    ~ScopedDemuxSource();
-    void set(const std::string& value);
+    explicit ScopedDemuxSource(const std::string& value) : mEnv(kVariable, value) {}
+    void set(const std::string& value) { setenv(kVariable, value.c_str(), 1); }
 
 private:
-    std::string mPrevious;
-    bool mHadPrevious;
+    static constexpr const char* kVariable = "TAVOPLAYER_PROP_tavoplayer_demux_source";
+    ScopedEnv mEnv;
 };
 
 // `bytes` in a temporary file that is the demux source, with these options.

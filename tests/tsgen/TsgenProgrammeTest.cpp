@@ -8,6 +8,7 @@
 #include <sstream>
 
 #include "TsgenTestUtil.h"
+#include "support/NamedRow.h"
 
 namespace TavoPlayer::test {
 namespace {
@@ -42,7 +43,6 @@ struct ProbeCase {
     // ffprobe's view as "key=value" items; codec_tag is the PMT's stream_type.
     std::string probe;
     double audioSeconds;  // audio comes in whole frames of 1024 or 1152 samples
-    friend void PrintTo(const ProbeCase& c, std::ostream* os) { *os << c.name; }
 };
 
 // Three seconds of 320x240 at 29.97 interlaced, with a caption, on the default PIDs.

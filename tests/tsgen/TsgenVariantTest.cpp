@@ -8,6 +8,7 @@
 #include <algorithm>
 
 #include "TsgenTestUtil.h"
+#include "support/NamedRow.h"
 
 namespace TavoPlayer::test {
 namespace {
@@ -58,7 +59,6 @@ struct VariantCase {
     const char* args;
     // Checks the variant; `clean` is the same stream without it.
     std::function<void(const Generated& variant, const Generated& clean)> check;
-    friend void PrintTo(const VariantCase& c, std::ostream* os) { *os << c.name; }
 };
 
 class TsgenVariantTest : public ::testing::TestWithParam<VariantCase> {};

@@ -2,16 +2,18 @@
 
 #include <gtest/gtest.h>
 
-#include <ostream>
 #include <string>
 #include <vector>
 
+#include "support/NamedRow.h"
 #include "support/PesBuilder.h"
 #include "support/TraceCapture.h"
 #include "support/TsPacketBuilder.h"
 
 namespace TavoPlayer {
 namespace {
+
+using test::PrintTo;
 
 using test::PesBuilder;
 using test::ramp;
@@ -24,17 +26,13 @@ struct LayoutCase {
     std::vector<uint8_t> pes;
     uint32_t esOffset;
     bool optionalHeaderParsed;
-    const char* message = nullptr;  // expected log fragment (else: nothing logged)
 };
-void PrintTo(const LayoutCase& c, std::ostream* os) {
-    *os << c.name;
-}
 
 class PESPacketParserLayoutTest : public ::testing::TestWithParam<LayoutCase> {};
 
 TEST_P(PESPacketParserLayoutTest, ElementaryStreamPosition) {
     const LayoutCase& c = GetParam();
-    TraceCapture trace;
+    TraceCapture trace;  // keeps the parser's lines out of the output
     PESPacketParser parser;
     PESParsedData data;
     ASSERT_EQ(parser.parse(c.pes.data(), c.pes.size(), &data), 1u) << trace.all();
@@ -43,11 +41,6 @@ TEST_P(PESPacketParserLayoutTest, ElementaryStreamPosition) {
     EXPECT_EQ(data.mElementaryStream, c.pes.data() + c.esOffset);
     EXPECT_EQ(data.mElementaryStreamSize, c.pes.size() - c.esOffset);
     EXPECT_EQ(data.mHeaderDataLength, c.optionalHeaderParsed ? c.pes[8] : 0);
-    if (c.message != nullptr) {
-        EXPECT_TRUE(trace.contains(c.message)) << trace.all();
-    } else {
-        EXPECT_TRUE(trace.lines().empty()) << trace.all();
-    }
 }
 
 PesBuilder pes(uint8_t streamId) {
@@ -66,13 +59,8 @@ const LayoutCase kLayouts[] = {
     // The header data length alone places the payload, whatever the flags say.
     {"LengthWinsOverFlags", pes(0xE0).pts(1).dts(2).headerDataLength(3).payload(ramp(20)).build(),
      12, true},
-    {"BadStartBitsAccepted", pes(0xE0).byte6(0x40).pts(1).payload(ramp(20)).build(), 6, false,
-     "parseOptHeader - bad optional header start bits!"},
-    {"TruncatedOptionalHeader",
-     {0, 0, 1, 0xE0, 0, 2, 0x80, 0x80},
-     6,
-     false,
-     "truncated optional header"},
+    {"BadStartBitsAccepted", pes(0xE0).byte6(0x40).pts(1).payload(ramp(20)).build(), 6, false},
+    {"TruncatedOptionalHeader", {0, 0, 1, 0xE0, 0, 2, 0x80, 0x80}, 6, false},
 };
 INSTANTIATE_TEST_SUITE_P(StreamIds, PESPacketParserLayoutTest, ::testing::ValuesIn(kLayouts),
                          [](const auto& info) { return std::string(info.param.name); });
@@ -100,21 +88,6 @@ TEST(PESPacketParserTimeTest, PtsBytesAtTheirPositions) {
         EXPECT_EQ(data.mPTS, c.value);
         EXPECT_EQ(data.mPTSDTSFlags, 2);
         EXPECT_EQ(data.mElementaryStreamSize, 2u);
-    }
-}
-
-TEST(PESPacketParserTimeTest, BuilderRoundTripAtBoundaries) {
-    const uint64_t values[] = {0, 1, 0x7FFF, 0x8000, 0xFFFFFFFFull, 0x100000000ull, 0x1FFFFFFFFull};
-    PESPacketParser parser;
-    for (uint64_t pts : values) {
-        for (uint64_t dts : values) {
-            const auto pes = PesBuilder(0xE0).pts(pts).dts(dts).payload({1}).build();
-            PESParsedData data;
-            ASSERT_EQ(parser.parse(pes.data(), pes.size(), &data), 1u);
-            EXPECT_EQ(data.mPTS, pts);
-            EXPECT_EQ(data.mDTS, dts);
-            EXPECT_EQ(data.mPTSDTSFlags, 3);
-        }
     }
 }
 
@@ -177,33 +150,20 @@ TEST(PESPacketParserFieldsTest, ExtensionFields) {
 // --- failures ---------------------------------------------------------------------
 
 TEST(PESPacketParserFailureTest, RefusedInputs) {
-    struct FailureCase {
-        const char* name;
-        std::vector<uint8_t> bytes;
-        std::vector<const char*> messages;
-    };
-    const FailureCase cases[] = {
-        {"NoStartCode",
-         {0, 0, 2, 0xE0, 0, 0, 0x80, 0, 0},
-         {"parseHeader - start code not found!", "parse - header parsing error!"}},
-        {"TwoBytes", {0, 0}, {"parseHeader - start code not found!"}},
-        {"FixedHeaderCut", {0, 0, 1, 0xE0, 0}, {"PES packet too short (5 bytes)"}},
+    TraceCapture trace;
+    const std::vector<uint8_t> cases[] = {
+        {0, 0, 2, 0xE0, 0, 0, 0x80, 0, 0},  // no start code
+        {0, 0},
+        {0, 0, 1, 0xE0, 0},  // fixed header cut
     };
     PESPacketParser parser;
-    for (const FailureCase& c : cases) {
-        TraceCapture trace;
-        PESParsedData data;
-        EXPECT_EQ(parser.parse(c.bytes.data(), c.bytes.size(), &data), 0u) << c.name;
-        for (const char* m : c.messages)
-            EXPECT_TRUE(trace.contains(m)) << c.name << trace.all();
-    }
-    TraceCapture trace;
     PESParsedData data;
+    for (const auto& bytes : cases)
+        EXPECT_EQ(parser.parse(bytes.data(), bytes.size(), &data), 0u) << bytes.size();
     const uint8_t one = 0;
     EXPECT_EQ(parser.parse(nullptr, 10, &data), 0u);
     EXPECT_EQ(parser.parse(&one, 0, &data), 0u);
     EXPECT_EQ(parser.parse(&one, 1, nullptr), 0u);
-    EXPECT_EQ(trace.count("parse - invalid parameter!"), 3u) << trace.all();
 }
 
 TEST(PESPacketParserFailureTest, HeaderLengthPastThePacketWrapsTheSize) {
@@ -214,7 +174,6 @@ TEST(PESPacketParserFailureTest, HeaderLengthPastThePacketWrapsTheSize) {
     ASSERT_EQ(parser.parse(pes.data(), pes.size(), &data), 1u);
     EXPECT_EQ(data.mElementaryStreamSize, static_cast<uint32_t>(pes.size() - 209));
     EXPECT_GT(data.mElementaryStreamSize, pes.size()) << "wrapped, as designed";
-    EXPECT_TRUE(trace.contains("header data length 200 runs past the packet")) << trace.all();
 }
 
 // A packet cut at every byte of a full header is never read past its end (the
@@ -235,17 +194,6 @@ TEST(PESPacketParserFailureTest, TruncatedAtEveryByte) {
         PESParsedData data;
         EXPECT_EQ(parser.parse(bytes.data(), cut, &data), cut >= 6 ? 1u : 0u) << cut;
     }
-}
-
-TEST(PESPacketParserFailureTest, PrintWithNullLogsAtDebug) {
-    TraceCapture trace;
-    setTraceLevel(TRACE_DEBUG);
-    PESPacketParser parser;
-    parser.printPESData(nullptr);
-    PESParsedData data;
-    parser.printPESData(&data);
-    setTraceLevel(TRACE_INFO);
-    EXPECT_EQ(trace.count(TRACE_DEBUG, "printPESData - null parameter!"), 1u) << trace.all();
 }
 
 }  // namespace

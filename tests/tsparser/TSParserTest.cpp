@@ -4,12 +4,12 @@
 #include <gtest/gtest.h>
 
 #include <future>
-#include <ostream>
 #include <random>
 #include <string>
 #include <vector>
 
 #include "platform/dtv/RecPlayerBinder.h"
+#include "support/NamedRow.h"
 #include "support/PesBuilder.h"
 #include "support/TraceCapture.h"
 #include "support/TsPacketBuilder.h"
@@ -17,6 +17,8 @@
 
 namespace TavoPlayer {
 namespace {
+
+using test::PrintTo;
 
 using namespace std::chrono_literals;
 using namespace test;
@@ -148,11 +150,7 @@ struct DropCase {
     int kind;
     uint32_t outputSize;
     std::function<std::vector<TsPacket>(uint8_t* counter)> broken;
-    std::vector<std::pair<const char*, size_t>> messages;  // count 0: at least once
 };
-void PrintTo(const DropCase& c, std::ostream* os) {
-    *os << c.name;
-}
 
 class TSParserDropTest : public TSParserModuleTest,
                          public ::testing::WithParamInterface<DropCase> {};
@@ -168,59 +166,40 @@ TEST_P(TSParserDropTest, BrokenPesIsDroppedAndTheNextKept) {
     const auto records = drainRecords(*output);
     ASSERT_EQ(records.size(), 1u) << trace.all();
     EXPECT_EQ(records[0].pes, kept) << "no bytes of the broken PES may precede it";
-    for (const auto& [text, count] : c.messages) {
-        if (count == 0) {
-            EXPECT_TRUE(trace.contains(text)) << text << "\n" << trace.all();
-        } else {
-            EXPECT_EQ(trace.count(text), count) << text << "\n" << trace.all();
-        }
-    }
 }
-
-constexpr const char* kDiscarded = "threadLoop - TS parser error; discarding entire PES packet.";
 
 INSTANTIATE_TEST_SUITE_P(
     Faults, TSParserDropTest,
-    ::testing::Values(
-        DropCase{"LostPacket",
-                 TSParser::KIND_VIDEO,
-                 1 << 16,
-                 [](uint8_t* cc) {
-                     auto p = packetizePes(
-                         kPid, PesBuilder(0xE0).pts(1000).payload(ramp(900)).build(), cc);
-                     p.erase(p.begin() + 2);
-                     return p;
-                 },
-                 {{"continuity error! Discarding entire PES packet", 1}, {kDiscarded, 1}}},
-        DropCase{"OverlongAdaptationField",
-                 TSParser::KIND_VIDEO,
-                 1 << 16,
-                 [](uint8_t* cc) {
-                     auto p = packetizePes(
-                         kPid, PesBuilder(0xE0).pts(1000).payload(ramp(900)).build(), cc);
-                     p[2] = TsPacketBuilder()
-                                .pid(kPid)
-                                .continuity(2)
-                                .adaptationControl(3)
-                                .rawAfterHeader({200})
-                                .build();
-                     return p;
-                 },
-                 {{"parseHeader: Invalid adaptation field length: 200", 0}, {kDiscarded, 1}}},
-        DropCase{"NoStartCode",
-                 TSParser::KIND_AUDIO,
-                 1 << 16,
-                 [](uint8_t* cc) { return packetizePes(kPid, ramp(400, 1), cc); },
-                 {{"finishPES - PES parser error; discarding entire packet.", 1}}},
-        // Larger than the whole output ring: dropped, not waited for.
-        DropCase{"LargerThanTheOutput",
-                 TSParser::KIND_VIDEO,
-                 4096,
-                 [](uint8_t* cc) {
-                     return packetizePes(kPid, PesBuilder(0xE0).pts(1).payload(ramp(5000)).build(),
-                                         cc);
-                 },
-                 {{"TS parser error; discarding entire PES packet.", 0}}}),
+    ::testing::Values(DropCase{"LostPacket", TSParser::KIND_VIDEO, 1 << 16,
+                               [](uint8_t* cc) {
+                                   auto p = packetizePes(
+                                       kPid, PesBuilder(0xE0).pts(1000).payload(ramp(900)).build(),
+                                       cc);
+                                   p.erase(p.begin() + 2);
+                                   return p;
+                               }},
+                      DropCase{"OverlongAdaptationField", TSParser::KIND_VIDEO, 1 << 16,
+                               [](uint8_t* cc) {
+                                   auto p = packetizePes(
+                                       kPid, PesBuilder(0xE0).pts(1000).payload(ramp(900)).build(),
+                                       cc);
+                                   p[2] = TsPacketBuilder()
+                                              .pid(kPid)
+                                              .continuity(2)
+                                              .adaptationControl(3)
+                                              .rawAfterHeader({200})
+                                              .build();
+                                   return p;
+                               }},
+                      DropCase{"NoStartCode", TSParser::KIND_AUDIO, 1 << 16,
+                               [](uint8_t* cc) { return packetizePes(kPid, ramp(400, 1), cc); }},
+                      // Larger than the whole output ring: dropped, not waited for.
+                      DropCase{"LargerThanTheOutput", TSParser::KIND_VIDEO, 4096,
+                               [](uint8_t* cc) {
+                                   return packetizePes(
+                                       kPid, PesBuilder(0xE0).pts(1).payload(ramp(5000)).build(),
+                                       cc);
+                               }}),
     [](const auto& info) { return std::string(info.param.name); });
 
 // Random bytes, lost sync and broken headers in the input never stop the thread;
@@ -343,9 +322,6 @@ struct ScrambleCase {
     std::string packets;  // S scrambled, E transport error, C clear
     bool expectError;
 };
-void PrintTo(const ScrambleCase& c, std::ostream* os) {
-    *os << c.name;
-}
 
 class TSParserScramblingTest : public TSParserModuleTest,
                                public ::testing::WithParamInterface<ScrambleCase> {};
@@ -371,8 +347,6 @@ TEST_P(TSParserScramblingTest, TwelfthScrambledVideoPacketEndsTheThread) {
     ASSERT_TRUE(writeAll(*input, concatPackets(packets)));
     if (c.expectError) {
         ASSERT_EQ(reported.get_future().wait_for(kDeadline), std::future_status::ready);
-        EXPECT_TRUE(trace.contains("threadLoop send error by scrambled ts pid = 0x111"))
-            << trace.all();
         // The thread has ended and released the output it held.
         EXPECT_TRUE(writerLockFree(*output));
     } else {
@@ -416,10 +390,6 @@ protected:
 };
 
 TEST_F(TSParserFullOutputTest, WaitsForTheReaderThenGoesOn) {
-    EXPECT_TRUE(
-        trace.contains("threadLoop - output RB is full; waiting for free space. payload size = "))
-        << trace.all();
-    EXPECT_TRUE(trace.contains("lack of buffer...remained ringbuffer")) << trace.all();
     EXPECT_EQ(output->usedSpace(), 2u * 1540u);
     auto first = readRecord(*output);
     ASSERT_TRUE(first.has_value());
@@ -447,13 +417,11 @@ TEST_F(TSParserModuleTest, StartIsRefusedWithoutInputOrRoomForARecord) {
     parser = new TSParser(TSParser::KIND_VIDEO);
     parser->addOutput(output, nullptr);
     EXPECT_EQ(parser->start(), ERROR_TSPARSER_NO_INPUT);
-    EXPECT_TRUE(trace.contains("start - no input Ring Buffer set!")) << trace.all();
 
     output = makeRing("VideoPES", 4096);
     ASSERT_TRUE(writeAll(*output, std::vector<uint8_t>(4096 - 36, 0)));
     create(TSParser::KIND_VIDEO);
     EXPECT_EQ(parser->start(), ERROR_TSPARSER_START_STOP);
-    EXPECT_TRUE(trace.contains("start - mpPESWriter is NULL !!!!")) << trace.all();
 }
 
 TEST_F(TSParserModuleTest, DumpThenRestartAfterStopStartsClean) {

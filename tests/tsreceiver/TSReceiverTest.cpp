@@ -54,14 +54,10 @@ protected:
 
 TEST_F(TSReceiverTest, ConfigureAndStartRefuseMismatchedPidsAndOutputs) {
     EXPECT_EQ(receiver->start(), 0x11002u);
-    EXPECT_TRUE(trace.contains("start - cannot start TSReceiver: no PID set!"));
     addOutputs(3, 1 << 16, false);
     EXPECT_EQ(receiver->configure(
                   {{PCR_PID, 0x100}, {VIDEO_PID, 0x111}, {AUDIO_PID, 0x112}, {CC_PID, 0x130}}),
               0x11003u);
-    EXPECT_TRUE(
-        trace.contains("configure - number of PIDs (4) and number of outputs (3) are diferent!"))
-        << trace.all();
     EXPECT_FALSE(receiver->isPIDSet(0x100));  // the map was not replaced
     EXPECT_EQ(receiver->configure({{PCR_PID, 0x100}, {VIDEO_PID, 0x111}, {AUDIO_PID, 0x112}}), 0u);
     EXPECT_TRUE(receiver->isPIDSet(0x112));
@@ -69,8 +65,6 @@ TEST_F(TSReceiverTest, ConfigureAndStartRefuseMismatchedPidsAndOutputs) {
     // A map accepted with three outputs, then a fourth output: counts differ at start.
     addOutputs(1, 1 << 16, false);
     EXPECT_EQ(receiver->start(), 0x11003u);
-    EXPECT_TRUE(
-        trace.contains("start - number of PIDs (3) and number of outputs (4) are diferent!"));
 }
 
 TEST_F(TSReceiverTest, StartFailsWhenAFilterCannotStart) {
@@ -79,8 +73,6 @@ TEST_F(TSReceiverTest, StartFailsWhenAFilterCannotStart) {
     // 0x2000 is no PID (13 bits, ISO/IEC 13818-1, 2.4.3.2): the demux refuses it.
     ASSERT_EQ(receiver->configure({{PCR_PID, 0x100}, {VIDEO_PID, 0x2000}}), 0u);
     EXPECT_EQ(receiver->start(), 0x11004u);
-    EXPECT_TRUE(trace.contains("startFiltering Could not start filtering PID 8192!"));
-    EXPECT_TRUE(trace.contains("start - could not start filtering!"));
 }
 
 TEST(TSReceiverTables, FilterKindsAndRequestSizes) {
@@ -107,11 +99,7 @@ TEST_F(TSReceiverTest, ReadsWhatFitsAndLeavesTheRestInTheDemux) {
 
     // 1,000 free bytes: five packets (940 bytes) go in at once, and the other five
     // wait in the demux while 60 bytes are free.
-    ASSERT_TRUE(waitUntil([&] { return trace.contains("no room for TS data in RB"); }))
-        << trace.all();
-    EXPECT_EQ(ring.usedSpace(), 4096u - 1000 + 940);
-    EXPECT_TRUE(trace.contains("threadLoop: no room for TS data in RB; free space = 60; PID = 256"))
-        << trace.all();
+    ASSERT_TRUE(waitUntil([&] { return ring.usedSpace() == 4096u - 1000 + 940; }));
 
     // The reader frees the ring; the remaining five arrive, in order.
     ASSERT_TRUE(ring.waitForData(4096 - 1000 + 940));
@@ -221,7 +209,6 @@ protected:
 TEST_F(TSReceiverLive, ChangePidSwitchesTheOutputToTheNewPid) {
     addOutputs(2);
     EXPECT_EQ(receiver->changePID(AUDIO_PID, 0x112, 0x113), 0x11002u);
-    EXPECT_TRUE(trace.contains("changePID - no PID set!"));
     configureAndStart({{VIDEO_PID, 0x111}, {AUDIO_PID, 0x112}});
     // A PID that is not configured: refused, and nothing changes.
     EXPECT_EQ(receiver->changePID(AUDIO_PID, 0x120, 0x113), 0x11001u);
@@ -253,10 +240,8 @@ TEST_F(TSReceiverLive, FailedFiltersAndAPidAddedWhileRunning) {
     // 0x2000 cannot be filtered: the old filter stays stopped, its handle is now -1
     // and cannot be changed again.
     EXPECT_EQ(receiver->changePID(AUDIO_PID, 0x112, 0x2000), 0x11001u);
-    EXPECT_TRUE(trace.contains("changePID Could not start filtering PID 8192!"));
     EXPECT_EQ(receiver->changePID(AUDIO_PID, 0x112, 0x113), 0x11001u);
     EXPECT_EQ(receiver->startFilteringNewPID(CC_PID, 0x2000), 0x11001u);
-    EXPECT_TRUE(trace.contains("startFilteringNewPID Could not start filtering PID 8192!"));
     EXPECT_FALSE(receiver->isPIDSet(0x2000));
     ASSERT_EQ(receiver->startFilteringNewPID(CC_PID, 0x130), 0u);
     addOutputs(1);
@@ -316,7 +301,7 @@ TEST_F(TSReceiverTest, FileThatIsNoTransportStreamLeavesTheReceiverRunningIdle) 
     FileSource source(noise, "");
     addOutputs(1);
     configureAndStart({{VIDEO_PID, 0x111}});
-    ASSERT_TRUE(waitUntil([&] { return trace.contains("held no TS packets"); })) << trace.all();
+    ASSERT_TRUE(sourceEnded());
     EXPECT_EQ(drains[0]->count(), 0u);
 }
 

@@ -1,15 +1,18 @@
 #include <gtest/gtest.h>
 
 #include <functional>
-#include <ostream>
 #include <string>
 #include <vector>
 
 #include "platform/binder/BBinder.h"
 #include "platform/binder/Parcel.h"
 
+#include "support/NamedRow.h"
+
 namespace android {
 namespace {
+
+using TavoPlayer::test::PrintTo;
 
 std::vector<uint8_t> bytesOf(const Parcel& p) {
     return std::vector<uint8_t>(p.data(), p.data() + p.dataSize());
@@ -61,10 +64,6 @@ struct ShortReadCase {
     std::function<status_t(const Parcel&)> read;
     status_t expected;
 };
-
-void PrintTo(const ShortReadCase& c, std::ostream* os) {
-    *os << c.name;
-}
 
 class ParcelShortReadTest : public ::testing::TestWithParam<ShortReadCase> {};
 

@@ -14,6 +14,7 @@
 #include <set>
 #include <thread>
 
+#include "DemuxTestUtil.h"
 #include "platform/dtv/Demux.h"
 #include "platform/dtv/DemuxBinder.h"
 #include "support/TraceCapture.h"
@@ -25,26 +26,9 @@ namespace {
 using namespace std::chrono_literals;
 using namespace test;
 
-// Reads a filter until `packets` have arrived or the deadline passes.
 std::vector<TsPacket> readPackets(int handle, size_t packets,
                                   std::chrono::milliseconds deadline = kDeadline) {
-    std::vector<TsPacket> got;
-    std::vector<uint8_t> buffer(188 * 50);
-    const auto end = std::chrono::steady_clock::now() + deadline;
-    while (got.size() < packets && std::chrono::steady_clock::now() < end) {
-        DemuxHandleSet set;
-        DemuxBinder_HandleZERO(&set);
-        DemuxBinder_HandleSET(handle, &set);
-        if (DemuxBinder_Select(&set, 30) <= 0)
-            continue;
-        const int n = DemuxBinder_ReadData(handle, buffer.data(), static_cast<int>(buffer.size()));
-        EXPECT_EQ(n % 188, 0);
-        if (n <= 0)
-            continue;
-        const auto more = toPackets(std::vector<uint8_t>(buffer.begin(), buffer.begin() + n));
-        got.insert(got.end(), more.begin(), more.end());
-    }
-    return got;
+    return readFilter(handle, packets, deadline);
 }
 
 bool sourceEnded() {
@@ -176,7 +160,6 @@ TEST_F(DemuxTest, SlowFilterDropsItsOldestPacketsWithoutHoldingBackTheOthers) {
     const auto stream =
         buildStream({.pids = {0x100, 0x101}, .rounds = 100, .pcrPid = 0x101, .pcrIntervalMs = 10});
     FileSource source(stream, "?queue=16");
-    TraceCapture trace;
     const int slow = start(0x100);
     const int fast = start(0x101);
     auto expected = packetsByPid(stream);
@@ -191,10 +174,6 @@ TEST_F(DemuxTest, SlowFilterDropsItsOldestPacketsWithoutHoldingBackTheOthers) {
     // What is left is the newest sixteen, in order.
     EXPECT_EQ(summary(readPackets(slow, 16)),
               summary(std::vector<TsPacket>(expected[0x100].end() - 16, expected[0x100].end())));
-    EXPECT_TRUE(trace.contains("PID 256 is not read fast enough"));
-    stop(slow);
-    EXPECT_TRUE(trace.contains("PID 256 (handle"));
-    EXPECT_TRUE(trace.contains("lost 84 packets"));
 }
 
 TEST_F(DemuxTest, UnpacedFileWaitsForASlowReaderInsteadOfDropping) {
@@ -312,8 +291,6 @@ TEST_F(DemuxTest, GarbageBetweenPacketsIsSkippedAndTheRestDelivered) {
     EXPECT_EQ(summary(readPackets(start(0x100), 50, 3s)), summary(packetsByPid(clean)[0x100]));
     ASSERT_TRUE(sourceEnded());
     EXPECT_GT(Demux::instance().sourceStats().bytesSkipped, 0u);
-    EXPECT_TRUE(trace.contains("TS sync lost on file")) << trace.all();
-    EXPECT_TRUE(trace.contains("ends with 165 bytes that are no whole TS packet")) << trace.all();
 }
 
 // --- UDP ------------------------------------------------------------------------
@@ -373,8 +350,6 @@ TEST_F(DemuxTest, UdpDatagramsOfOneToSevenPacketsArriveIntact) {
     // The very last packet waits for a sync byte after it that never comes.
     expected[0x101].pop_back();
     EXPECT_EQ(summary(readPackets(other, 143)), summary(expected[0x101]));
-    EXPECT_TRUE(trace.contains("UDP datagram of 812 bytes is not a whole number of TS packets"))
-        << trace.all();
 }
 
 TEST_F(DemuxTest, UdpMulticastGroupIsJoinedOnTheGivenInterface) {

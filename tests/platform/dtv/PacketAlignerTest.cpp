@@ -2,13 +2,15 @@
 
 #include <gtest/gtest.h>
 
-#include <ostream>
 #include <random>
 
+#include "support/NamedRow.h"
 #include "support/TsTestUtil.h"
 
 namespace TavoPlayer {
 namespace {
+
+using test::PrintTo;
 
 using test::buildStream;
 using test::StreamPlan;
@@ -60,9 +62,6 @@ struct Fault {
     size_t expectedPackets;  // of the 60 in the clean stream
     int finishDropped = -1;  // bytes finish() reports, where checked
 };
-void PrintTo(const Fault& f, std::ostream* os) {
-    *os << f.name;
-}
 
 class PacketAlignerFaults : public ::testing::TestWithParam<Fault> {};
 

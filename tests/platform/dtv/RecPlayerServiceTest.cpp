@@ -1,6 +1,4 @@
-#include <fcntl.h>
 #include <signal.h>
-#include <spawn.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -26,10 +24,10 @@
 #include <sqlite3.h>
 #include <functional>
 #include <map>
+#include "DemuxTestUtil.h"
+#include "support/ScopedEnv.h"
 #include "support/TraceCapture.h"
 #include "support/TsTestUtil.h"
-
-extern char** environ;
 
 namespace TavoPlayer {
 namespace {
@@ -42,51 +40,13 @@ constexpr uint16_t kVideo = 0x111;
 constexpr uint16_t kAudio = 0x112;
 constexpr uint16_t kCaptions = 0x130;
 
-// A tsgen stream of `seconds`, made once per test program.
+// A tsgen stream of `seconds` with two captions, made once per test program.
 const std::string& tsgenStream(int seconds) {
-    static std::map<int, std::string> made;
-    auto it = made.find(seconds);
-    if (it != made.end())
-        return it->second;
-    const std::string path = (fs::temp_directory_path() / ("tavo_rec_" + std::to_string(getpid()) +
-                                                           "_" + std::to_string(seconds) + ".ts"))
-                                 .string();
-    bool ok = false;
-    runCommand(std::string(TAVO_TSGEN_PATH) + " -o " + path + " -d " + std::to_string(seconds) +
-                   " --size 320x240 --caption 2:Hello --caption 12:World 2>&1",
-               &ok);
-    EXPECT_TRUE(ok) << "tsgen failed";
-    static struct Cleanup {
-        ~Cleanup() {
-            for (auto& [s, p] : made)
-                unlink(p.c_str());
-        }
-    } cleanup;
-    return made[seconds] = path;
+    return test::tsgenStream(seconds, "--caption 2:Hello --caption 12:World");
 }
 
-class ScopedEnv {
-public:
-    ScopedEnv(std::string name, const std::string& value) : mName(std::move(name)) {
-        const char* old = getenv(mName.c_str());
-        mHad = old != nullptr;
-        if (mHad)
-            mOld = old;
-        setenv(mName.c_str(), value.c_str(), 1);
-    }
-    ~ScopedEnv() {
-        if (mHad)
-            setenv(mName.c_str(), mOld.c_str(), 1);
-        else
-            unsetenv(mName.c_str());
-    }
-
-private:
-    std::string mName, mOld;
-    bool mHad = false;
-};
-
-// Events from the service, as the recorder and the clip player receive them.
+// Events from the service,// Events from the service, as the recorder and the clip player receive
+// them.
 struct EventLog {
     static void callback(int event, void* userData) {
         auto* self = static_cast<EventLog*>(userData);
@@ -140,18 +100,11 @@ void freeDetails(RecDetails* d) {
 // Every test has a recordings folder of its own and leaves the service idle.
 class RecordingServiceTest : public ::testing::Test {
 protected:
-    void SetUp() override {
-        char name[] = "/tmp/tavo_recordings_XXXXXX";
-        ASSERT_NE(mkdtemp(name), nullptr);
-        dir = name;
-        recordingsDir =
-            std::make_unique<ScopedEnv>("TAVOPLAYER_PROP_tavoplayer_recordings_dir", dir);
-    }
+    void SetUp() override { ASSERT_FALSE(dir.empty()); }
     void TearDown() override {
         RecPlayerBinder_DeleteTSRecorder();
         EXPECT_TRUE(RecPlayerService::instance().events().drain(kDeadline));
         EXPECT_FALSE(Demux::instance().sourceStats().open);
-        fs::remove_all(dir);
     }
     // Creates and starts a recording of the tsgen PIDs; returns its number.
     int record(EventLog& events, const std::string& station = "TV Tavo",
@@ -188,8 +141,8 @@ protected:
         EXPECT_TRUE(e.has_value()) << "no row " << number;
         return e.value_or(RecordingCatalog::Entry());
     }
-    std::string dir;
-    std::unique_ptr<ScopedEnv> recordingsDir;
+    ScopedRecordingsDir recordings;
+    const std::string dir = recordings.path();
 };
 
 TEST_F(RecordingServiceTest, RecordsTheLivePacketsOfItsPidsUnchangedInOrderInAPlayableFile) {
@@ -300,61 +253,37 @@ TEST_F(RecordingServiceTest, ASecondRecordingIsRefusedAndTheFirstGoesOn) {
     EXPECT_TRUE(first.all().empty() || first.all() == std::vector<int>{kRecEventDemuxLost});
 }
 
-// A recording in a child process of its own, started from a demux source.
+// A recording in a child process of its own, started from a demux source. The shell
+// prints its process id, which exec hands on to the recording program.
 class ChildRecording {
 public:
-    ChildRecording(const std::string& mode, const std::string& dir, const std::string& source) {
-        int fds[2];
-        EXPECT_EQ(pipe(fds), 0);
-        posix_spawn_file_actions_t actions;
-        posix_spawn_file_actions_init(&actions);
-        posix_spawn_file_actions_adddup2(&actions, fds[1], STDOUT_FILENO);
-        posix_spawn_file_actions_addclose(&actions, fds[0]);
-        std::vector<std::string> env;
-        for (char** e = environ; *e != nullptr; ++e) {
-            if (strncmp(*e, "TAVOPLAYER_PROP_tavoplayer_", 27) != 0)
-                env.emplace_back(*e);
-        }
-        env.push_back("TAVOPLAYER_PROP_tavoplayer_recordings_dir=" + dir);
-        env.push_back("TAVOPLAYER_PROP_tavoplayer_demux_source=" + source);
-        std::vector<char*> envp;
-        for (auto& e : env)
-            envp.push_back(e.data());
-        envp.push_back(nullptr);
-        std::string program = TAVO_RECORDING_CHILD_PATH;
-        std::string arg = mode;
-        char* argv[] = {program.data(), arg.data(), nullptr};
-        EXPECT_EQ(posix_spawn(&mPid, program.c_str(), &actions, nullptr, argv, envp.data()), 0);
-        posix_spawn_file_actions_destroy(&actions);
-        close(fds[1]);
-        mOut = fdopen(fds[0], "r");
-    }
-    ~ChildRecording() {
-        if (mPid > 0) {
-            kill(mPid, SIGKILL);
-            wait();
-        }
-        if (mOut != nullptr)
-            fclose(mOut);
-    }
+    ChildRecording(const std::string& mode, const std::string& dir, const std::string& source)
+        : mOut(popen(("echo $$; exec env TAVOPLAYER_PROP_tavoplayer_recordings_dir='" + dir +
+                      "' TAVOPLAYER_PROP_tavoplayer_demux_source='" + source + "' " +
+                      TAVO_RECORDING_CHILD_PATH + " " + mode)
+                         .c_str(),
+                     "r")),
+          mPid(std::atoi(line().c_str())) {}
+    ~ChildRecording() { killNow(); }
     std::string line() {
         char buffer[256] = {};
-        return fgets(buffer, sizeof buffer, mOut) != nullptr ? std::string(buffer) : std::string();
+        return mOut != nullptr && fgets(buffer, sizeof buffer, mOut) != nullptr ? buffer : "";
     }
+    // The exit status.
     int wait() {
-        int status = 0;
-        waitpid(mPid, &status, 0);
-        mPid = -1;
+        const int status = mOut != nullptr ? pclose(mOut) : -1;
+        mOut = nullptr;
         return status;
     }
     void killNow() {
-        kill(mPid, SIGKILL);
+        if (mOut != nullptr && mPid > 0)
+            kill(mPid, SIGKILL);
         wait();
     }
 
 private:
-    pid_t mPid = -1;
-    FILE* mOut = nullptr;
+    FILE* mOut;
+    pid_t mPid;
 };
 
 TEST_F(RecordingServiceTest, AKilledRecordingLeavesAPlayableFileMarkedIncomplete) {
@@ -399,22 +328,7 @@ TEST_F(RecordingServiceTest, AFullDiskStopsTheRecordingCleanlyWithItsEvent) {
 
 // Packets that reach a filter within `window`.
 std::vector<TsPacket> readFor(int handle, std::chrono::milliseconds window) {
-    std::vector<TsPacket> got;
-    std::vector<uint8_t> buffer(188 * 100);
-    const auto end = std::chrono::steady_clock::now() + window;
-    while (std::chrono::steady_clock::now() < end) {
-        DemuxHandleSet set;
-        DemuxBinder_HandleZERO(&set);
-        DemuxBinder_HandleSET(handle, &set);
-        if (DemuxBinder_Select(&set, 20) <= 0)
-            continue;
-        const int n = DemuxBinder_ReadData(handle, buffer.data(), static_cast<int>(buffer.size()));
-        if (n > 0) {
-            const auto more = toPackets(std::vector<uint8_t>(buffer.begin(), buffer.begin() + n));
-            got.insert(got.end(), more.begin(), more.end());
-        }
-    }
-    return got;
+    return readFilter(handle, std::numeric_limits<size_t>::max(), window);
 }
 
 // The time (ms since the clip's first PCR) of the first packet read that has a PCR.

@@ -1,9 +1,8 @@
 #include "SurfaceTestUtil.h"
 
-#include <cstdio>
 #include <cstdlib>
-#include <fstream>
-#include <sstream>
+
+#include "support/TsTestUtil.h"
 
 namespace android::test {
 
@@ -47,23 +46,13 @@ ScopedSinkProperties::~ScopedSinkProperties() {
 }
 
 std::string readFile(const std::string& path) {
-    std::ifstream in(path, std::ios::binary);
-    std::ostringstream text;
-    text << in.rdbuf();
-    return text.str();
+    const auto bytes = TavoPlayer::test::fileBytes(path);
+    return std::string(bytes.begin(), bytes.end());
 }
 
 std::string runCommand(const std::string& command) {
-    std::string output;
-    FILE* pipe = popen(command.c_str(), "r");
-    if (pipe == nullptr)
-        return output;
-    char chunk[4096];
-    size_t n;
-    while ((n = fread(chunk, 1, sizeof(chunk), pipe)) > 0)
-        output.append(chunk, n);
-    pclose(pipe);
-    return output;
+    bool ok = false;
+    return TavoPlayer::test::runCommand(command, &ok);
 }
 
 }  // namespace android::test

@@ -15,11 +15,14 @@
 
 #include "platform/media/MediaPlayerOutputs.h"
 #include "support/MediaTestFiles.h"
+#include "support/NamedRow.h"
 #include "support/TraceCapture.h"
 #include "support/TsTestUtil.h"
 
 namespace TavoPlayer::test {
 namespace {
+
+using test::PrintTo;
 
 using android::MediaPlayer;
 using android::sp;
@@ -215,7 +218,6 @@ TEST_P(MediaPlayerBadSourceTest, PrepareFailsWithTheStatusAndTellsTheListener) {
     ASSERT_GE(error, 0);
     EXPECT_EQ(mListener->notes()[error].ext1, android::MEDIA_ERROR_UNKNOWN);
     EXPECT_EQ(mListener->notes()[error].ext2, GetParam().status);
-    EXPECT_EQ(trace.count(TRACE_ERROR, "Error preparing"), 1u) << trace.all();
     EXPECT_EQ(mPlayer->start(), android::INVALID_OPERATION);
     EXPECT_EQ(position(mPlayer), 0);
 }
@@ -284,7 +286,6 @@ TEST_P(MediaPlayerInterruptTest, StopOrDisconnectEndsAPrepareThatWaitsOnTheNetwo
         EXPECT_EQ(mPlayer->stop(), android::OK);
     ASSERT_EQ(prepared.wait_for(kDeadline), std::future_status::ready);
     EXPECT_EQ(prepared.get(), android::INVALID_OPERATION);
-    EXPECT_TRUE(trace.contains("stopped before it was prepared")) << trace.all();
     EXPECT_EQ(mListener->count(android::MEDIA_ERROR), 0);
     EXPECT_EQ(mPlayer->start(), disconnect ? android::NO_INIT : android::INVALID_OPERATION);
 }

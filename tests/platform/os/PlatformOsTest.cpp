@@ -38,40 +38,32 @@ protected:
 TEST_F(PropertiesTest, ValuesComeFromTheFileTrimmedAndLastOneWins) {
     write(
         "# comment\n\n tavoplayer.video.sink = null \nnot a property\n"
-        "tavoplayer.video.sink=y4m:/tmp/out.y4m\noneseg.extSdCard.path=/mnt/sd\n");
+        "tavoplayer.video.sink=y4m:/tmp/out.y4m\noneseg.extSdCard.path=/mnt/sd\nk=" +
+        std::string(200, 'v') + "\n");
     char value[kPropertyValueMax];
     EXPECT_EQ(16, property_get("tavoplayer.video.sink", value, "sdl"));
     EXPECT_STREQ("y4m:/tmp/out.y4m", value);
     EXPECT_EQ(7, property_get("oneseg.extSdCard.path", value, ""));
     EXPECT_STREQ("/mnt/sd", value);
-}
-
-TEST_F(PropertiesTest, MissingKeyGivesTheDefault) {
-    write("a.b=c\n");
-    char value[kPropertyValueMax];
+    // A missing key gives the default, or nothing.
     EXPECT_EQ(3, property_get("x.y", value, "def"));
     EXPECT_STREQ("def", value);
     EXPECT_EQ(0, property_get("x.y", value, nullptr));
     EXPECT_STREQ("", value);
-}
-
-TEST_F(PropertiesTest, EnvironmentOverridesTheFile) {
-    write("tavoplayer.demux.source=file:/a.ts\n");
-    setenv("TAVOPLAYER_PROP_tavoplayer_demux_source", "udp://239.1.1.1:1234", 1);
-    EXPECT_EQ("udp://239.1.1.1:1234", propertyGetString("tavoplayer.demux.source", "stdin"));
-}
-
-TEST_F(PropertiesTest, MissingFileGivesTheDefault) {
-    setenv("TAVOPLAYER_PROPERTIES", "/nonexistent/dir/system.prop", 1);
-    EXPECT_EQ("stdin", propertyGetString("tavoplayer.demux.source", "stdin"));
-}
-
-TEST_F(PropertiesTest, LongValuesAreTruncatedToTheBuffer) {
-    write("k=" + std::string(200, 'v') + "\n");
-    char value[kPropertyValueMax];
+    // Long values are truncated to the buffer, not in the string form.
     EXPECT_EQ(kPropertyValueMax - 1, property_get("k", value, ""));
     EXPECT_EQ(std::string(kPropertyValueMax - 1, 'v'), value);
     EXPECT_EQ(std::string(200, 'v'), propertyGetString("k", ""));
+}
+
+TEST_F(PropertiesTest, EnvironmentOverridesTheFileAndAMissingFileGivesTheDefault) {
+    write("tavoplayer.demux.source=file:/a.ts\n");
+    EXPECT_EQ("file:/a.ts", propertyGetString("tavoplayer.demux.source", "stdin"));
+    setenv("TAVOPLAYER_PROP_tavoplayer_demux_source", "udp://239.1.1.1:1234", 1);
+    EXPECT_EQ("udp://239.1.1.1:1234", propertyGetString("tavoplayer.demux.source", "stdin"));
+    unsetenv("TAVOPLAYER_PROP_tavoplayer_demux_source");
+    setenv("TAVOPLAYER_PROPERTIES", "/nonexistent/dir/system.prop", 1);
+    EXPECT_EQ("stdin", propertyGetString("tavoplayer.demux.source", "stdin"));
 }
 
 // ---------------------------------------------------------------------------------

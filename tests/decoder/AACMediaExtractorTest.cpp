@@ -65,7 +65,7 @@ AACMediaExtractor::transportLayer_t layerOf(Framing f) {
 
 class AACExtractorTest : public ::testing::Test {
 protected:
-    void SetUp() override { mRing = test::makeRing(20); }
+    void SetUp() override { mRing = test::makeRing("AudioPES", 1u << 20); }
 
     void writeChunks(const std::vector<PesChunk>& records) {
         for (const auto& record : records) {
@@ -294,7 +294,7 @@ TEST_F(AACExtractorTest, FrameDurationFollowsTheReportedConfiguration) {
 // use; with a small ring the writer keeps waiting for the space that consumption
 // frees. Every unit must come out once, in order.
 TEST_F(AACExtractorTest, WriterThreadAndExtractorShareASmallRing) {
-    android::sp<RingBuffer> ring = test::makeRing(14);  // 16 KiB: a few dozen records
+    android::sp<RingBuffer> ring = test::makeRing("AudioPES", 1u << 14);  // a few dozen records
     const Stream s = makeStream(Framing::Loas, 300, 5, 3);
     std::thread writer([&] {
         for (size_t i = 0; i < s.frames.size(); ++i) {

@@ -148,7 +148,7 @@ protected:
     // Runs the extractor over `records` (PTS given per record).
     std::vector<Unit> extract(const std::vector<test::PesChunk>& records,
                               AACMediaExtractor::transportLayer_t layer) {
-        android::sp<RingBuffer> ring = test::makeRing(22);
+        android::sp<RingBuffer> ring = test::makeRing("AudioPES", 1u << 22);
         for (const auto& r : records) {
             EXPECT_TRUE(test::writePesRecord(*ring, r.es, r.pts, 0xC0));
         }
@@ -196,7 +196,7 @@ protected:
     }
 
     bool ffmpeg(const std::string& args) {
-        return test::runCommand("ffmpeg -hide_banner -loglevel error -y " + args);
+        return test::succeeds("ffmpeg -hide_banner -loglevel error -y " + args);
     }
 
     std::filesystem::path mDir;
@@ -261,7 +261,7 @@ TEST_F(AACReferenceTest, ExoPlayerAdtsSamples) {
     ASSERT_TRUE(taggedRef.ok);
     const auto& taggedReference = taggedRef.raw;
     EXPECT_EQ(asc, taggedRef.asc);
-    const std::vector<uint8_t> file = test::readFile(withId3);
+    const std::vector<uint8_t> file = test::fileBytes(withId3);
     ASSERT_FALSE(file.empty());
     const auto tagged =
         extract(test::fixedCuts(file, 500, 0, 500), AACMediaExtractor::TRANSPORT_LAYER_ADTS);
@@ -279,7 +279,7 @@ TEST_F(AACReferenceTest, ExoPlayerLatmInTransportStream) {
     }
     const Demuxed ref = demux(path);
     ASSERT_TRUE(ref.ok);
-    const auto records = test::pesFromTs(test::readFile(path), 0x100);
+    const auto records = test::pesFromTs(test::fileBytes(path), 0x100);
     ASSERT_FALSE(records.empty());
     const auto units = extract(records, AACMediaExtractor::TRANSPORT_LAYER_LOAS);
 
@@ -332,14 +332,14 @@ TEST_P(AACTsgenTest, UnitsAndTimesMatchFfmpeg) {
 #else
     const TsgenCase& c = GetParam();
     const std::string path = (mDir / (c.name + ".ts")).string();
-    ASSERT_TRUE(test::runCommand(std::string(TAVO_TSGEN_PATH) + " -o " + path +
-                                 " -d 2 --size 160x120 --audio " + (c.adts ? "adts " : "latm ") +
-                                 c.args + " >/dev/null 2>&1"));
+    ASSERT_TRUE(test::succeeds(std::string(TAVO_TSGEN_PATH) + " -o " + path +
+                               " -d 2 --size 160x120 --audio " + (c.adts ? "adts " : "latm ") +
+                               c.args + " 2>&1"));
     const Demuxed ref = demux(path, nullptr, c.adts);
     ASSERT_TRUE(ref.ok);
     ASSERT_GT(ref.packets.size(), 50u);
     const auto units = extract(
-        test::pesFromTs(test::readFile(path), 0x112),
+        test::pesFromTs(test::fileBytes(path), 0x112),
         c.adts ? AACMediaExtractor::TRANSPORT_LAYER_ADTS : AACMediaExtractor::TRANSPORT_LAYER_LOAS);
     ASSERT_EQ(ref.packets.size() - 1, units.size());
     for (size_t i = 1; i < units.size(); ++i) {

@@ -215,8 +215,7 @@ Bytes picTimingSei(unsigned picStruct) {
 class H264Fixture : public ::testing::Test {
 protected:
     void SetUp() override {
-        mRing = test::makeRing(22);
-        ASSERT_NE(mRing, nullptr);
+        mRing = test::makeRing("VideoPES", 1u << 22);
         mExtractor = new H264MediaExtractor(mRing);
     }
     std::vector<ExtractedUnit> run(const std::vector<PesChunk>& chunks, size_t out = 1 << 20) {
@@ -665,14 +664,11 @@ std::vector<test::ParsedUnit> ffmpegAccessUnits(const Bytes& es) {
 Bytes encode(const std::string& x264Params, const std::string& extra, int frames) {
     const std::string path = std::string(TAVO_BINARY_DIR) + "/h264test_" +
                              std::to_string(std::hash<std::string>()(x264Params + extra)) + ".h264";
-    const std::string command =
+    const bool ok = test::succeeds(
         "ffmpeg -v error -y -f lavfi -i testsrc=size=352x288:rate=30000/1001 -frames:v " +
         std::to_string(frames) + " -c:v libx264 -preset ultrafast -x264-params " + x264Params +
-        " " + extra + " -f h264 '" + path + "'";
-    if (!test::runCommand(command)) {
-        return {};
-    }
-    Bytes es = test::readFile(path);
+        " " + extra + " -f h264 '" + path + "'");
+    const Bytes es = ok ? test::fileBytes(path) : Bytes();
     std::filesystem::remove(path);
     return es;
 }
@@ -862,7 +858,7 @@ TEST_P(H264GoldenTest, UnitsMatchTheDumpFfmpegAndTheTsParserPath) {
     if (path.empty()) {
         GTEST_SKIP() << "sample stream absent from " << TAVO_SHARED_STREAMS_DIR;
     }
-    const Bytes ts = test::readFile(path);
+    const Bytes ts = test::fileBytes(path);
     auto chunks = test::pesFromTs(ts, c.pid, c.packetSize);
     ASSERT_GT(chunks.size(), 1u);
     const auto units = run(chunks);

@@ -67,8 +67,7 @@ std::vector<uint8_t> frame(const HeaderFields& f, size_t length, uint8_t seed) {
 class MP3ExtractorFixture : public ::testing::Test {
 protected:
     void SetUp() override {
-        mRing = test::makeRing(20);
-        ASSERT_NE(mRing, nullptr);
+        mRing = test::makeRing("AudioPES", 1u << 20);
         mExtractor = new MP3MediaExtractor(mRing);
     }
     std::vector<ExtractedUnit> run(const std::vector<PesChunk>& chunks,
@@ -226,13 +225,7 @@ class MP3RingProtocolTest : public MP3ExtractorFixture {
 protected:
     // The reader lock as the ring's dump shows it: "Locked" or "Unlocked".
     std::string readLock() {
-        char* text = nullptr;
-        size_t size = 0;
-        FILE* stream = open_memstream(&text, &size);
-        mRing->dump(stream, 0);
-        fclose(stream);
-        const std::string dump(text, size);
-        free(text);
+        const std::string dump = test::printed([&](FILE* f) { mRing->dump(f, 0); });
         return dump.find("ReadLock: \e[01;31mLocked") != std::string::npos     ? "Locked"
                : dump.find("ReadLock: \e[01;32mUnlocked") != std::string::npos ? "Unlocked"
                                                                                : dump;
@@ -353,10 +346,10 @@ TEST_P(MP3ReferenceTest, SameFramesAsFfmpegParser) {
     const std::string command =
         std::string("ffmpeg -v error -y -f lavfi -i sine=frequency=440:duration=3 -ac 2 ") +
         c.ffmpegAudio + " '" + path + "'";
-    if (!test::runCommand(command)) {
+    if (!test::succeeds(command)) {
         GTEST_SKIP() << "encoder not available: " << command;
     }
-    const std::vector<uint8_t> es = test::readFile(path);
+    const std::vector<uint8_t> es = test::fileBytes(path);
     std::filesystem::remove(path);
     // One frame per PES, three frames per PES, and odd fixed cuts.
     const auto frames = ffmpegFrames(es, c.codec);
@@ -405,7 +398,7 @@ TEST_P(MP3GoldenTest, FramesMatchTheDumpFfmpegAndTheTsParserPath) {
     if (path.empty()) {
         GTEST_SKIP() << "sample stream absent from " << TAVO_SHARED_STREAMS_DIR;
     }
-    const std::vector<uint8_t> ts = test::readFile(path);
+    const std::vector<uint8_t> ts = test::fileBytes(path);
     auto chunks = test::pesFromTs(ts, c.pid);
     ASSERT_GT(chunks.size(), 1u);
     const auto units = run(chunks);

@@ -68,9 +68,8 @@ protected:
     void SetUp() override { mRing = test::makeRing("AudioPES", 1u << 20); }
 
     void writeChunks(const std::vector<PesChunk>& records) {
-        for (const auto& record : records) {
+        for (const auto& record : records)
             ASSERT_TRUE(test::writePesRecord(*mRing, record.es, record.pts, 0xC0));
-        }
     }
     void writeRecords(const std::vector<std::vector<uint8_t>>& records, uint64_t firstPts,
                       uint64_t step) {
@@ -120,9 +119,8 @@ TEST_P(AACFramingTest, ConfigurationFirstThenTheSameUnitsHoweverThePesAreCut) {
 
     const auto bytes = test::bytesOf(onePerPes);
     const auto es = test::joinEs(test::groupCuts(s.frames, 1, 0, 0));
-    for (size_t cut : {97, 13}) {
+    for (size_t cut : {97, 13})
         EXPECT_EQ(bytes, test::bytesOf(unitsOf(test::fixedCuts(es, cut, 0, 0)))) << cut;
-    }
     EXPECT_EQ(bytes, test::bytesOf(unitsOf(test::groupCuts(s.frames, 3, 0, 0))));
 }
 
@@ -141,9 +139,8 @@ TEST_P(AACFramingTest, ResetSendsTheConfigurationAgainBeforeAudio) {
     mExtractor = new AACMediaExtractor(mRing, layerOf(GetParam()));
     std::vector<uint8_t> out(4096);
     std::vector<ExtractedUnit> before;
-    while (before.size() < 4) {
-        ASSERT_NE(1u, test::pullUnit(*mExtractor, out, &before));
-    }
+    while (before.size() < 4)
+        ASSERT_EQ(0u, test::pullUnit(*mExtractor, out, &before)) << mTrace.all();
     mExtractor->reset();
     EXPECT_FALSE(mExtractor->configSent());
     const auto after = test::drain(*mExtractor);
@@ -186,9 +183,8 @@ TEST_P(AACSwitchTest, SwitchesAfterTheCountedErrorsAndThenDeliversConfigAndAudio
         std::vector<uint8_t> record;
         const bool lookAlike =
             i >= c.recordsBeforeSwitch || (c.lookAlikeEvery != 0 && (i % c.lookAlikeEvery) == 0);
-        if (!lookAlike) {
+        if (!lookAlike)
             record.push_back(0x00);
-        }
         record.insert(record.end(), s.frames[i].begin(), s.frames[i].end());
         records.push_back(record);
     }
@@ -203,9 +199,8 @@ TEST_P(AACSwitchTest, SwitchesAfterTheCountedErrorsAndThenDeliversConfigAndAudio
     const auto audio = test::bytesOf({units.begin() + 1, units.end()});
     const size_t firstAudio = c.recordsBeforeSwitch + 1;
     ASSERT_EQ(total - firstAudio - 1, audio.size()) << mTrace.all();
-    for (size_t i = 0; i < audio.size(); ++i) {
+    for (size_t i = 0; i < audio.size(); ++i)
         EXPECT_EQ(s.units[firstAudio + i], audio[i]);
-    }
     const size_t lookAlikes =
         c.lookAlikeEvery == 0 ? 0
                               : (c.recordsBeforeSwitch + c.lookAlikeEvery - 1) / c.lookAlikeEvery;
@@ -307,9 +302,8 @@ TEST_F(AACExtractorTest, WriterThreadAndExtractorShareASmallRing) {
     writer.join();
     std::vector<ExtractedUnit> expected = {
         {kLcStereo48kAsc, 0, AACMediaExtractor::FLAG_CODEC_CONFIG}};
-    for (size_t i = 1; i + 1 < s.units.size(); ++i) {
+    for (size_t i = 1; i + 1 < s.units.size(); ++i)
         expected.push_back({s.units[i], static_cast<long long>(i * kTicksPerFrame48k), 0});
-    }
     EXPECT_EQ(test::firstDifference(units, expected), "");
 }
 
@@ -347,15 +341,13 @@ TEST_F(AACExtractorTest, CorruptFramesAreDroppedAndTheStreamGoesOn) {
     // Every intact frame after the configuration comes out, in order.
     std::vector<std::vector<uint8_t>> intact;
     for (size_t i = 1; i + 1 < s.units.size(); ++i) {
-        if (i != 4 && i != 7 && i != 8 && i != 9) {
+        if (i != 4 && i != 7 && i != 8 && i != 9)
             intact.push_back(s.units[i]);
-        }
     }
     // Frame 8 follows the truncated frame 7 in the buffer and is lost with it or
     // found by resynchronisation; frame 9 may or may not parse: accept both.
-    for (const auto& unit : intact) {
+    for (const auto& unit : intact)
         EXPECT_NE(audio.end(), std::find(audio.begin(), audio.end(), unit));
-    }
     EXPECT_EQ(s.units[s.units.size() - 2], audio.back());
     EXPECT_EQ(0u, mRing->usedSpace());
 }

@@ -47,9 +47,8 @@ Demuxed demux(const std::string& path, const char* format = nullptr, bool adtsTo
     Demuxed out;
     AVFormatContext* ctx = nullptr;
     const AVInputFormat* input = format ? av_find_input_format(format) : nullptr;
-    if (avformat_open_input(&ctx, path.c_str(), input, nullptr) < 0) {
+    if (avformat_open_input(&ctx, path.c_str(), input, nullptr) < 0)
         return out;
-    }
     AVBSFContext* bsf = nullptr;
     const int index = avformat_find_stream_info(ctx, nullptr) >= 0
                           ? av_find_best_stream(ctx, AVMEDIA_TYPE_AUDIO, -1, -1, nullptr, 0)
@@ -74,9 +73,8 @@ Demuxed demux(const std::string& path, const char* format = nullptr, bool adtsTo
                     size_t sideSize = 0;
                     const uint8_t* side =
                         av_packet_get_side_data(pkt, AV_PKT_DATA_NEW_EXTRADATA, &sideSize);
-                    if (side != nullptr && out.asc.empty()) {
+                    if (side != nullptr && out.asc.empty())
                         out.asc.assign(side, side + sideSize);
-                    }
                     out.raw.emplace_back(pkt->data, pkt->data + pkt->size);
                     av_packet_unref(pkt);
                 }
@@ -117,14 +115,12 @@ Decoded decodeRaw(const std::vector<uint8_t>& asc, const std::vector<Unit>& unit
     AVPacket* pkt = av_packet_alloc();
     AVFrame* frame = av_frame_alloc();
     for (const auto& unit : units) {
-        if (unit.flags & AACMediaExtractor::FLAG_CODEC_CONFIG) {
+        if (unit.flags & AACMediaExtractor::FLAG_CODEC_CONFIG)
             continue;
-        }
         av_new_packet(pkt, static_cast<int>(unit.bytes.size()));
         std::copy(unit.bytes.begin(), unit.bytes.end(), pkt->data);
-        if (avcodec_send_packet(ctx, pkt) < 0) {
+        if (avcodec_send_packet(ctx, pkt) < 0)
             ++out.errors;
-        }
         av_packet_unref(pkt);
         while (avcodec_receive_frame(ctx, frame) >= 0) {
             ++out.frames;
@@ -149,9 +145,8 @@ protected:
     std::vector<Unit> extract(const std::vector<test::PesChunk>& records,
                               AACMediaExtractor::transportLayer_t layer) {
         android::sp<RingBuffer> ring = test::makeRing("AudioPES", 1u << 22);
-        for (const auto& r : records) {
+        for (const auto& r : records)
             EXPECT_TRUE(test::writePesRecord(*ring, r.es, r.pts, 0xC0));
-        }
         android::sp<AACMediaExtractor> extractor = new AACMediaExtractor(ring, layer);
         return test::drain(*extractor);
     }
@@ -162,9 +157,8 @@ protected:
                                   AACMediaExtractor::transportLayer_t layer,
                                   std::vector<Unit>* onePerPes) {
         std::vector<std::vector<uint8_t>> units;
-        for (const Packet& packet : packets) {
+        for (const Packet& packet : packets)
             units.push_back(packet.bytes);
-        }
         const auto perPacket = test::groupCuts(units, 1, 0, 1920);
         *onePerPes = extract(perPacket, layer);
         const auto odd = test::fixedCuts(test::joinEs(perPacket), 181, 0, 181);
@@ -185,9 +179,8 @@ protected:
         // these streams, as the ten written bytes leave them.
         std::vector<Unit> expected = {{referenceAsc, 0, AACMediaExtractor::FLAG_CODEC_CONFIG}};
         expected[0].bytes.resize(10, 0);
-        for (size_t i = 1; i + 1 < reference.size(); ++i) {
+        for (size_t i = 1; i + 1 < reference.size(); ++i)
             expected.push_back({reference[i], 0, 0});
-        }
         std::vector<Unit> got = units;
         for (Unit& unit : got) {
             unit.pts = 0;  // compared elsewhere
@@ -267,9 +260,8 @@ TEST_F(AACReferenceTest, ExoPlayerAdtsSamples) {
         extract(test::fixedCuts(file, 500, 0, 500), AACMediaExtractor::TRANSPORT_LAYER_ADTS);
     ASSERT_EQ(taggedReference.size() - 2, tagged.size());
     EXPECT_EQ(units[0].bytes, tagged[0].bytes);
-    for (size_t i = 1; i < tagged.size(); ++i) {
+    for (size_t i = 1; i < tagged.size(); ++i)
         ASSERT_EQ(taggedReference[i + 1], tagged[i].bytes) << i;
-    }
 }
 
 TEST_F(AACReferenceTest, ExoPlayerLatmInTransportStream) {
@@ -342,12 +334,10 @@ TEST_P(AACTsgenTest, UnitsAndTimesMatchFfmpeg) {
         test::pesFromTs(test::fileBytes(path), 0x112),
         c.adts ? AACMediaExtractor::TRANSPORT_LAYER_ADTS : AACMediaExtractor::TRANSPORT_LAYER_LOAS);
     ASSERT_EQ(ref.packets.size() - 1, units.size());
-    for (size_t i = 1; i < units.size(); ++i) {
+    for (size_t i = 1; i < units.size(); ++i)
         EXPECT_EQ(ref.packets[i].pts, units[i].pts) << "unit " << i;
-    }
-    if (c.adts) {
+    if (c.adts)
         expectUnits(units, ref.raw, ref.asc);
-    }
     const Decoded decoded = decodeRaw(units[0].bytes, units);
     EXPECT_EQ(0, decoded.errors);
     EXPECT_EQ(static_cast<int>(units.size()) - 1, decoded.frames);

@@ -324,7 +324,7 @@ TEST_F(AACExtractorTest, RecordsClaimingMoreEsThanTheyHoldAreReadOnlyToTheirEnd)
     // the last frame waits for a next header.
     std::vector<Bytes> expected = {kLcStereo48kAsc};
     expected.insert(expected.end(), s.units.begin(), s.units.end() - 1);
-    EXPECT_EQ(expected, test::bytesOf(units));
+    ASSERT_EQ(expected, test::bytesOf(units));
     EXPECT_EQ(AACMediaExtractor::FLAG_CODEC_CONFIG, units[0].flags);
     EXPECT_EQ(0u, mRing->usedSpace());
 }
@@ -337,6 +337,7 @@ TEST_F(AACExtractorTest, CorruptFramesAreDroppedAndTheStreamGoesOn) {
     records[9][3] = 0xFF;                      // mux element garbage
     writeRecords(records, 0, kTicksPerFrame48k);
     const auto units = extract(AACMediaExtractor::TRANSPORT_LAYER_LOAS);
+    ASSERT_GE(units.size(), 2u);
     const auto audio = test::bytesOf({units.begin() + 1, units.end()});
     // Every intact frame after the configuration comes out, in order.
     std::vector<std::vector<uint8_t>> intact;

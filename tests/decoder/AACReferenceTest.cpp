@@ -220,6 +220,7 @@ TEST_F(AACReferenceTest, FfmpegAdtsAndLatmGiveFfmpegsUnits) {
     ASSERT_EQ(reference.size(), latmPackets.packets.size());
     expectSameUnitsThreeWays(latmPackets.packets, AACMediaExtractor::TRANSPORT_LAYER_LOAS, &units);
     expectUnits(units, reference, asc);
+    ASSERT_FALSE(units.empty());
 
     const Decoded decoded = decodeRaw(units[0].bytes, units);
     EXPECT_EQ(0, decoded.errors);
@@ -241,6 +242,7 @@ TEST_F(AACReferenceTest, ExoPlayerAdtsSamples) {
     std::vector<Unit> units;
     expectSameUnitsThreeWays(packets.packets, AACMediaExtractor::TRANSPORT_LAYER_ADTS, &units);
     expectUnits(units, reference, asc);
+    ASSERT_FALSE(units.empty());
     EXPECT_EQ((std::vector<uint8_t>{0x12, 0x08}),
               std::vector<uint8_t>(units[0].bytes.begin(), units[0].bytes.begin() + 2));
     EXPECT_EQ(test::compareGolden("aac_exoplayer_sample_adts.txt", test::goldenDump(units)), "");

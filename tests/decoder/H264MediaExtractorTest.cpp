@@ -184,20 +184,20 @@ Bytes slice(uint8_t header, unsigned firstMb, bool longStartCode = false, int fi
     return nal(header, r.bytes(), longStartCode);
 }
 // A picture-timing SEI for an SPS without HRD: pic_struct and no clock timestamps.
+// An SEI NAL unit with one message of `payloadType` (its body padded with zero bits to
+// a whole byte) and rbsp_trailing_bits (ITU-T H.264, 7.3.2.3).
+Bytes seiNal(uint8_t payloadType, const Bytes& body) {
+    return nal(0x06,
+               concat({Bytes{payloadType, static_cast<uint8_t>(body.size())}, body, Bytes{0x80}}),
+               false);
+}
 Bytes picTimingSei(unsigned picStruct) {
     Rbsp payload;
     payload.u(4, picStruct);
     static const unsigned clocks[9] = {1, 1, 1, 2, 2, 3, 3, 2, 3};
     for (unsigned i = 0; i < clocks[picStruct]; ++i)
         payload.u(1, 0);
-    Bytes body = payload.bytes(false);
-    // pad to whole bytes with the bit-equal alignment
-    Rbsp sei;
-    sei.u(8, 1).u(8, body.size());
-    Bytes out = sei.bytes(false);
-    out.insert(out.end(), body.begin(), body.end());
-    out.push_back(0x80);
-    return nal(0x06, out, false);
+    return seiNal(1, payload.bytes(false));
 }
 
 class H264Fixture : public ::testing::Test {
@@ -390,11 +390,7 @@ TEST_F(H264SeiTest, PicTimingWithHrdDelaysAndClockTimestamp) {
     payload.u(1, 1).u(2, 1).u(1, 0).u(5, 4).u(1, 1).u(1, 0).u(1, 0).u(8, 12);
     payload.u(6, 30).u(6, 59).u(5, 23);  // full timestamp
     payload.u(1, 0);
-    Bytes body = payload.bytes(false);
-    Bytes sei = {1, static_cast<uint8_t>(body.size())};
-    sei.insert(sei.end(), body.begin(), body.end());
-    sei.push_back(0x80);
-    EXPECT_EQ(decodeSei(nal(0x06, sei, false)), 0u);
+    EXPECT_EQ(decodeSei(seiNal(1, payload.bytes(false))), 0u);
     EXPECT_TRUE(mExtractor->isPicTimingSeen());
     EXPECT_EQ(mExtractor->getPicStruct(), 3);
 }
@@ -402,8 +398,7 @@ TEST_F(H264SeiTest, PicTimingWithHrdDelaysAndClockTimestamp) {
 TEST_F(H264SeiTest, InvalidPicStructIsRefused) {
     decodeSps({.picStructPresent = true});
     test::TraceCapture trace;
-    Bytes sei = {1, 1, 0x9F, 0x80};  // pic_struct 9
-    EXPECT_NE(decodeSei(nal(0x06, sei, false)), 0u);
+    EXPECT_NE(decodeSei(seiNal(1, {0x9F})), 0u);  // pic_struct 9
     EXPECT_FALSE(mExtractor->isPicTimingSeen());
     EXPECT_EQ(trace.count("decodePicTimingSEI: Invalid picStruct value: 9"), 1u) << trace.all();
     EXPECT_EQ(trace.count("decodeSEI: Error decoding SEI"), 1u);
@@ -833,16 +828,11 @@ TEST_P(H264GoldenTest, UnitsMatchTheDumpFfmpegAndTheTsParserPath) {
 
     // Independent check: every unit is one that libavcodec's parser cuts from the same
     // elementary stream (these muxers start each PES with an access unit).
-    const Bytes es = test::joinEs(chunks);
-    // Keyed by size and hash of the bytes.
-    auto key = [](const Bytes& b) {
-        return std::make_pair(b.size(), test::fnv1a64(b.data(), b.size()));
-    };
-    std::map<std::pair<size_t, uint64_t>, int> reference;
-    for (const auto& unit : ffmpegAccessUnits(es))
-        ++reference[key(unit.bytes)];
+    std::map<Bytes, int> reference;
+    for (const auto& unit : ffmpegAccessUnits(test::joinEs(chunks)))
+        ++reference[unit.bytes];
     for (size_t i = 0; i < units.size(); ++i) {
-        EXPECT_GT(reference[key(units[i].bytes)]--, 0)
+        EXPECT_GT(reference[units[i].bytes]--, 0)
             << "unit " << i << " of " << units.size() << ", " << units[i].bytes.size() << " bytes";
     }
 

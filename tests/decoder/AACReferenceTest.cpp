@@ -47,9 +47,8 @@ Demuxed demux(const std::string& path, const char* format = nullptr, bool adtsTo
     Demuxed out;
     AVFormatContext* ctx = nullptr;
     const AVInputFormat* input = format ? av_find_input_format(format) : nullptr;
-    if (avformat_open_input(&ctx, path.c_str(), input, nullptr) < 0) {
+    if (avformat_open_input(&ctx, path.c_str(), input, nullptr) < 0)
         return out;
-    }
     AVBSFContext* bsf = nullptr;
     const int index = avformat_find_stream_info(ctx, nullptr) >= 0
                           ? av_find_best_stream(ctx, AVMEDIA_TYPE_AUDIO, -1, -1, nullptr, 0)
@@ -74,9 +73,8 @@ Demuxed demux(const std::string& path, const char* format = nullptr, bool adtsTo
                     size_t sideSize = 0;
                     const uint8_t* side =
                         av_packet_get_side_data(pkt, AV_PKT_DATA_NEW_EXTRADATA, &sideSize);
-                    if (side != nullptr && out.asc.empty()) {
+                    if (side != nullptr && out.asc.empty())
                         out.asc.assign(side, side + sideSize);
-                    }
                     out.raw.emplace_back(pkt->data, pkt->data + pkt->size);
                     av_packet_unref(pkt);
                 }
@@ -117,14 +115,12 @@ Decoded decodeRaw(const std::vector<uint8_t>& asc, const std::vector<Unit>& unit
     AVPacket* pkt = av_packet_alloc();
     AVFrame* frame = av_frame_alloc();
     for (const auto& unit : units) {
-        if (unit.flags & AACMediaExtractor::FLAG_CODEC_CONFIG) {
+        if (unit.flags & AACMediaExtractor::FLAG_CODEC_CONFIG)
             continue;
-        }
         av_new_packet(pkt, static_cast<int>(unit.bytes.size()));
         std::copy(unit.bytes.begin(), unit.bytes.end(), pkt->data);
-        if (avcodec_send_packet(ctx, pkt) < 0) {
+        if (avcodec_send_packet(ctx, pkt) < 0)
             ++out.errors;
-        }
         av_packet_unref(pkt);
         while (avcodec_receive_frame(ctx, frame) >= 0) {
             ++out.frames;
@@ -148,10 +144,9 @@ protected:
     // Runs the extractor over `records` (PTS given per record).
     std::vector<Unit> extract(const std::vector<test::PesChunk>& records,
                               AACMediaExtractor::transportLayer_t layer) {
-        android::sp<RingBuffer> ring = test::makeRing(22);
-        for (const auto& r : records) {
+        android::sp<RingBuffer> ring = test::makeRing("AudioPES", 1u << 22);
+        for (const auto& r : records)
             EXPECT_TRUE(test::writePesRecord(*ring, r.es, r.pts, 0xC0));
-        }
         android::sp<AACMediaExtractor> extractor = new AACMediaExtractor(ring, layer);
         return test::drain(*extractor);
     }
@@ -162,9 +157,8 @@ protected:
                                   AACMediaExtractor::transportLayer_t layer,
                                   std::vector<Unit>* onePerPes) {
         std::vector<std::vector<uint8_t>> units;
-        for (const Packet& packet : packets) {
+        for (const Packet& packet : packets)
             units.push_back(packet.bytes);
-        }
         const auto perPacket = test::groupCuts(units, 1, 0, 1920);
         *onePerPes = extract(perPacket, layer);
         const auto odd = test::fixedCuts(test::joinEs(perPacket), 181, 0, 181);
@@ -185,9 +179,8 @@ protected:
         // these streams, as the ten written bytes leave them.
         std::vector<Unit> expected = {{referenceAsc, 0, AACMediaExtractor::FLAG_CODEC_CONFIG}};
         expected[0].bytes.resize(10, 0);
-        for (size_t i = 1; i + 1 < reference.size(); ++i) {
+        for (size_t i = 1; i + 1 < reference.size(); ++i)
             expected.push_back({reference[i], 0, 0});
-        }
         std::vector<Unit> got = units;
         for (Unit& unit : got) {
             unit.pts = 0;  // compared elsewhere
@@ -196,7 +189,7 @@ protected:
     }
 
     bool ffmpeg(const std::string& args) {
-        return test::runCommand("ffmpeg -hide_banner -loglevel error -y " + args);
+        return test::succeeds("ffmpeg -hide_banner -loglevel error -y " + args);
     }
 
     std::filesystem::path mDir;
@@ -227,6 +220,7 @@ TEST_F(AACReferenceTest, FfmpegAdtsAndLatmGiveFfmpegsUnits) {
     ASSERT_EQ(reference.size(), latmPackets.packets.size());
     expectSameUnitsThreeWays(latmPackets.packets, AACMediaExtractor::TRANSPORT_LAYER_LOAS, &units);
     expectUnits(units, reference, asc);
+    ASSERT_FALSE(units.empty());
 
     const Decoded decoded = decodeRaw(units[0].bytes, units);
     EXPECT_EQ(0, decoded.errors);
@@ -248,6 +242,7 @@ TEST_F(AACReferenceTest, ExoPlayerAdtsSamples) {
     std::vector<Unit> units;
     expectSameUnitsThreeWays(packets.packets, AACMediaExtractor::TRANSPORT_LAYER_ADTS, &units);
     expectUnits(units, reference, asc);
+    ASSERT_FALSE(units.empty());
     EXPECT_EQ((std::vector<uint8_t>{0x12, 0x08}),
               std::vector<uint8_t>(units[0].bytes.begin(), units[0].bytes.begin() + 2));
     EXPECT_EQ(test::compareGolden("aac_exoplayer_sample_adts.txt", test::goldenDump(units)), "");
@@ -261,15 +256,14 @@ TEST_F(AACReferenceTest, ExoPlayerAdtsSamples) {
     ASSERT_TRUE(taggedRef.ok);
     const auto& taggedReference = taggedRef.raw;
     EXPECT_EQ(asc, taggedRef.asc);
-    const std::vector<uint8_t> file = test::readFile(withId3);
+    const std::vector<uint8_t> file = test::fileBytes(withId3);
     ASSERT_FALSE(file.empty());
     const auto tagged =
         extract(test::fixedCuts(file, 500, 0, 500), AACMediaExtractor::TRANSPORT_LAYER_ADTS);
     ASSERT_EQ(taggedReference.size() - 2, tagged.size());
     EXPECT_EQ(units[0].bytes, tagged[0].bytes);
-    for (size_t i = 1; i < tagged.size(); ++i) {
+    for (size_t i = 1; i < tagged.size(); ++i)
         ASSERT_EQ(taggedReference[i + 1], tagged[i].bytes) << i;
-    }
 }
 
 TEST_F(AACReferenceTest, ExoPlayerLatmInTransportStream) {
@@ -279,7 +273,7 @@ TEST_F(AACReferenceTest, ExoPlayerLatmInTransportStream) {
     }
     const Demuxed ref = demux(path);
     ASSERT_TRUE(ref.ok);
-    const auto records = test::pesFromTs(test::readFile(path), 0x100);
+    const auto records = test::pesFromTs(test::fileBytes(path), 0x100);
     ASSERT_FALSE(records.empty());
     const auto units = extract(records, AACMediaExtractor::TRANSPORT_LAYER_LOAS);
 
@@ -332,22 +326,20 @@ TEST_P(AACTsgenTest, UnitsAndTimesMatchFfmpeg) {
 #else
     const TsgenCase& c = GetParam();
     const std::string path = (mDir / (c.name + ".ts")).string();
-    ASSERT_TRUE(test::runCommand(std::string(TAVO_TSGEN_PATH) + " -o " + path +
-                                 " -d 2 --size 160x120 --audio " + (c.adts ? "adts " : "latm ") +
-                                 c.args + " >/dev/null 2>&1"));
+    ASSERT_TRUE(test::succeeds(std::string(TAVO_TSGEN_PATH) + " -o " + path +
+                               " -d 2 --size 160x120 --audio " + (c.adts ? "adts " : "latm ") +
+                               c.args + " 2>&1"));
     const Demuxed ref = demux(path, nullptr, c.adts);
     ASSERT_TRUE(ref.ok);
     ASSERT_GT(ref.packets.size(), 50u);
     const auto units = extract(
-        test::pesFromTs(test::readFile(path), 0x112),
+        test::pesFromTs(test::fileBytes(path), 0x112),
         c.adts ? AACMediaExtractor::TRANSPORT_LAYER_ADTS : AACMediaExtractor::TRANSPORT_LAYER_LOAS);
     ASSERT_EQ(ref.packets.size() - 1, units.size());
-    for (size_t i = 1; i < units.size(); ++i) {
+    for (size_t i = 1; i < units.size(); ++i)
         EXPECT_EQ(ref.packets[i].pts, units[i].pts) << "unit " << i;
-    }
-    if (c.adts) {
+    if (c.adts)
         expectUnits(units, ref.raw, ref.asc);
-    }
     const Decoded decoded = decodeRaw(units[0].bytes, units);
     EXPECT_EQ(0, decoded.errors);
     EXPECT_EQ(static_cast<int>(units.size()) - 1, decoded.frames);

@@ -34,9 +34,8 @@ namespace {
 void latmValue(BitSink& sink, uint32_t value) {
     uint32_t bytes = value > 0xFFFFFF ? 3 : value > 0xFFFF ? 2 : value > 0xFF ? 1 : 0;
     sink.put(bytes, 2);
-    for (uint32_t i = bytes + 1; i-- > 0;) {
+    for (uint32_t i = bytes + 1; i-- > 0;)
         sink.put((value >> (8 * i)) & 0xFF, 8);
-    }
 }
 
 }  // namespace
@@ -71,9 +70,8 @@ std::vector<uint8_t> loasFrame(const LoasOptions& o,
             } else {
                 // Escape-coded in bytes, most significant first.
                 std::vector<uint32_t> parts;
-                for (uint32_t v = o.otherDataBits; v > 0; v >>= 8) {
+                for (uint32_t v = o.otherDataBits; v > 0; v >>= 8)
                     parts.insert(parts.begin(), v & 0xFF);
-                }
                 for (size_t i = 0; i < parts.size(); ++i) {
                     mux.put(i + 1 < parts.size() ? 1 : 0, 1);
                     mux.put(parts[i], 8);
@@ -81,9 +79,8 @@ std::vector<uint8_t> loasFrame(const LoasOptions& o,
             }
         }
         mux.put(o.crc ? 1 : 0, 1);
-        if (o.crc) {
+        if (o.crc)
             mux.put(0xA5, 8);
-        }
     }
     for (const auto& payload : payloads) {
         size_t left = payload.size();
@@ -118,9 +115,8 @@ std::vector<uint8_t> adtsFrame(const AdtsOptions& o, const std::vector<uint8_t>&
     s.put(header + static_cast<uint32_t>(payload.size()), 13);
     s.put(0x7FF, 11);
     s.put(o.rawDataBlocks, 2);
-    if (o.crc) {
+    if (o.crc)
         s.put(0xBEEF, 16);
-    }
     s.putBytes(payload);
     return s.bytes();
 }

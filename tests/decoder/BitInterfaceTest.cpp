@@ -2,6 +2,7 @@
 
 #include <array>
 #include <cstdint>
+#include <memory>
 #include <string>
 #include <vector>
 
@@ -15,18 +16,14 @@ namespace {
 // A reference bit reader, one bit at a time, for comparing against the word loads.
 uint32_t referenceBits(const std::vector<uint8_t>& bytes, size_t bitOffset, unsigned count) {
     uint32_t value = 0;
-    for (unsigned i = 0; i < count; ++i) {
-        const size_t bit = bitOffset + i;
+    for (size_t bit = bitOffset; bit < bitOffset + count; ++bit)
         value = (value << 1) | ((bytes[bit / 8] >> (7 - bit % 8)) & 1u);
-    }
     return value;
 }
 
-const std::vector<uint8_t> kPattern = {0xA5, 0x3C, 0x96, 0x0F, 0xF0, 0x81, 0x7E, 0xC3, 0x5A, 0x24};
-
 class ReadBitInterfaceTest : public ::testing::Test {
 protected:
-    std::vector<uint8_t> mBytes = kPattern;
+    std::vector<uint8_t> mBytes = {0xA5, 0x3C, 0x96, 0x0F, 0xF0, 0x81, 0x7E, 0xC3, 0x5A, 0x24};
 };
 
 // Zero-bit reads return 0 and do not move; the counter is the position in the current
@@ -39,9 +36,7 @@ TEST_F(ReadBitInterfaceTest, ZeroCountsAndBitCounter) {
     EXPECT_EQ(reader.getBitCounter(), 5);
     EXPECT_FALSE(reader.isByteAligned());
     EXPECT_EQ(reader.currentByte(), mBytes.data() + 1);
-    EXPECT_EQ(reader.remainingBytes(), mBytes.size() - 1);
     reader.resetBitCounter();
-    EXPECT_EQ(reader.getBitCounter(), 0);
     EXPECT_TRUE(reader.isByteAligned());
     EXPECT_EQ(reader.currentByte(), mBytes.data() + 1);
 }
@@ -69,13 +64,11 @@ TEST_F(ReadBitInterfaceTest, EveryStartAndWidthMatchesBitByBitReference) {
 TEST_F(ReadBitInterfaceTest, FieldEndingOnLastByteLoadsNoByteBeyond) {
     // A 3-byte heap buffer: ASan reports any load of a fourth byte.
     auto bytes = std::make_unique<uint8_t[]>(3);
-    bytes[0] = 0x12;
-    bytes[1] = 0x34;
-    bytes[2] = 0x56;
+    std::copy(mBytes.begin(), mBytes.begin() + 3, bytes.get());
     ReadBitInterface reader(bytes.get(), 3);
     reader.readBits(4);
-    EXPECT_EQ(reader.peekBits(20), 0x23456u);
-    EXPECT_EQ(reader.readBits(20), 0x23456u);
+    EXPECT_EQ(reader.peekBits(20), 0x53C96u);
+    EXPECT_EQ(reader.readBits(20), 0x53C96u);
     EXPECT_EQ(reader.remainingBytes(), 0u);
 }
 
@@ -107,7 +100,8 @@ TEST_F(ReadBitInterfaceTest, ExternalBufferFormLeavesOwnPointerAlone) {
     EXPECT_EQ(reader.remainingBytes(), mBytes.size());
 }
 
-TEST_F(ReadBitInterfaceTest, ByteAlignReportsWhetherItMoved) {
+// byteAlign and skipBits report the whole bytes they passed (a null report is allowed).
+TEST_F(ReadBitInterfaceTest, AlignAndSkipReportWholeBytesPassed) {
     ReadBitInterface reader(mBytes.data(), mBytes.size());
     int moved = -1;
     reader.byteAlign(&moved);
@@ -116,43 +110,22 @@ TEST_F(ReadBitInterfaceTest, ByteAlignReportsWhetherItMoved) {
     reader.readBits(3);
     reader.byteAlign(&moved);
     EXPECT_EQ(moved, 1);
-    EXPECT_EQ(reader.currentByte(), mBytes.data() + 1);
     EXPECT_EQ(reader.remainingBytes(), mBytes.size() - 1);
     EXPECT_TRUE(reader.isByteAligned());
     reader.readBits(1);
-    reader.byteAlign(nullptr);  // a null argument is allowed
+    reader.byteAlign(nullptr);
     EXPECT_EQ(reader.currentByte(), mBytes.data() + 2);
-}
-
-TEST_F(ReadBitInterfaceTest, SkipBitsReportsWholeBytesPassed) {
-    ReadBitInterface reader(mBytes.data(), mBytes.size());
-    int advanced = -1;
-    reader.skipBits(5, &advanced);
-    EXPECT_EQ(advanced, 0);
-    reader.skipBits(20, &advanced);  // 25 bits from the start: 3 bytes, position 1
-    EXPECT_EQ(advanced, 3);
+    reader.skipBits(5, &moved);
+    EXPECT_EQ(moved, 0);
+    reader.skipBits(20, &moved);  // 25 bits from byte 2: 3 bytes, position 1
+    EXPECT_EQ(moved, 3);
     EXPECT_EQ(reader.getBitCounter(), 1);
-    EXPECT_EQ(reader.readBits(7), referenceBits(mBytes, 25, 7));
+    EXPECT_EQ(reader.readBits(7), referenceBits(mBytes, 2 * 8 + 25, 7));
 }
 
-class WriteBitInterfaceTest : public ::testing::Test {};
-
-TEST_F(WriteBitInterfaceTest, FirstByteIsClearedBeforeUseInDirtyBuffer) {
-    for (uint8_t fill : {uint8_t{0x00}, uint8_t{0xFF}}) {
-        std::array<uint8_t, 4> out;
-        out.fill(fill);
-        WriteBitInterface writer(out.data(), out.size());
-        writer.writeBits(0b11111, 5);
-        writer.writeBits(0b000001, 6);
-        // MSB first: 11111 000 | 001 then the unwritten rest of that byte (already zeroed).
-        EXPECT_EQ(out[0], 0xF8) << "fill " << int(fill);
-        EXPECT_EQ(out[1], 0x20) << "fill " << int(fill);
-        EXPECT_EQ(out[2], fill) << "a byte never written into is untouched";
-        EXPECT_EQ(writer.getBitCounter(), 3);
-    }
-}
-
-TEST_F(WriteBitInterfaceTest, RoundTripsThroughReaderForEveryWidthAndOffset) {
+// Into a buffer of 0xCC: a byte is cleared before its first bit is written (so nothing
+// of the old contents shows in what is read back), and a byte never reached is untouched.
+TEST(WriteBitInterfaceTest, RoundTripsThroughReaderForEveryWidthAndOffset) {
     for (unsigned start = 0; start < 8; ++start) {
         for (unsigned count = 1; count <= 16; ++count) {
             std::array<uint8_t, 8> out;
@@ -167,13 +140,18 @@ TEST_F(WriteBitInterfaceTest, RoundTripsThroughReaderForEveryWidthAndOffset) {
             EXPECT_EQ(reader.readBits(static_cast<unsigned char>(count)), value)
                 << "start " << start << " count " << count;
             EXPECT_EQ(reader.readBits(3), 0b101u);
+            if (reader.getBitCounter() != 0) {
+                EXPECT_EQ(reader.readBits(static_cast<unsigned char>(8 - reader.getBitCounter())),
+                          0u);
+            }
+            EXPECT_EQ(out[(start + count + 3 + 7) / 8], 0xCC);
             EXPECT_EQ(writer.getBitCounter(), (start + count + 3) % 8);
             EXPECT_EQ(writer.currentByte() - out.data(), (start + count + 3) / 8);
         }
     }
 }
 
-TEST_F(WriteBitInterfaceTest, CountAboveSixteenWritesNothing) {
+TEST(WriteBitInterfaceTest, CountAboveSixteenWritesNothing) {
     std::array<uint8_t, 4> out = {0x11, 0x22, 0x33, 0x44};
     WriteBitInterface writer(out.data(), out.size());
     EXPECT_EQ(writer.writeBits(0xFFFFFF, 24), 0);
@@ -183,7 +161,7 @@ TEST_F(WriteBitInterfaceTest, CountAboveSixteenWritesNothing) {
     EXPECT_EQ(writer.getBitCounter(), 0);
 }
 
-TEST_F(WriteBitInterfaceTest, AlignAndSkipWriteZeroBits) {
+TEST(WriteBitInterfaceTest, AlignAndSkipWriteZeroBits) {
     std::array<uint8_t, 4> out;
     out.fill(0xFF);
     WriteBitInterface writer(out.data(), out.size());

@@ -1,6 +1,7 @@
 #include "DecoderTestUtil.h"
 
 #include <atomic>
+#include <chrono>
 #include <cstdio>
 #include <cstring>
 #include <sstream>
@@ -10,6 +11,7 @@ extern "C" {
 #include <libavutil/md5.h>
 }
 
+#include "PesRecordTestUtil.h"
 #include "common/RingBuffer.h"
 #include "common/Synchronization.h"
 #include "common/data/AudioFragmentData.h"
@@ -19,6 +21,8 @@ extern "C" {
 
 namespace TavoPlayer::test {
 
+namespace {
+
 std::string md5Hex(const uint8_t* data, size_t size) {
     uint8_t digest[16];
     av_md5_sum(digest, data, static_cast<int>(size));
@@ -27,6 +31,29 @@ std::string md5Hex(const uint8_t* data, size_t size) {
         snprintf(text + 2 * i, 3, "%02x", digest[i]);
     return text;
 }
+
+std::string capture(const std::string& command) {
+    bool ok = false;
+    return runCommand(command, &ok);
+}
+
+class ResolutionListener : public Decoder::DecoderInfoListener {
+public:
+    void onVideoResolution(int width, int height) override {
+        std::lock_guard<std::mutex> lock(mMutex);
+        mSizes.emplace_back(width, height);
+    }
+    std::vector<std::pair<int, int>> sizes() {
+        std::lock_guard<std::mutex> lock(mMutex);
+        return mSizes;
+    }
+
+private:
+    std::mutex mMutex;
+    std::vector<std::pair<int, int>> mSizes;
+};
+
+}  // namespace
 
 int RecordingSurface::showPicture(const android::SurfacePicture& picture) {
     std::lock_guard<std::mutex> lock(mMutex);
@@ -111,41 +138,15 @@ void RecordingSurface::setLastPicture(std::vector<uint8_t> nv12, int width, int 
     mLastHeight = height;
 }
 
-namespace {
-
-class ResolutionListener : public Decoder::DecoderInfoListener {
-public:
-    void onVideoResolution(int width, int height) override {
-        std::lock_guard<std::mutex> lock(mMutex);
-        mSizes.emplace_back(width, height);
-    }
-    std::vector<std::pair<int, int>> sizes() {
-        std::lock_guard<std::mutex> lock(mMutex);
-        return mSizes;
-    }
-
-private:
-    std::mutex mMutex;
-    std::vector<std::pair<int, int>> mSizes;
-};
-
-android::sp<RingBuffer> ring(const char* name, uint32_t bytes) {
-    android::sp<RingBuffer> r = new RingBuffer();
-    r->configureWithSize(name, bytes);
-    return r;
-}
-
-}  // namespace
-
 DecodedRun runDecoder(const std::vector<uint8_t>& ts, uint16_t pid, Decoder::codingType_t type,
-                      const android::sp<android::Surface>& surface, const RunOptions& options) {
+                      const android::sp<android::Surface>& surface) {
     using Clock = std::chrono::steady_clock;
     const auto deadline = Clock::now() + std::chrono::seconds(120);
     DecodedRun run;
     const bool video = type == Decoder::CODING_H264;
-    android::sp<RingBuffer> input = ring("TestTS", 1u << 20);
-    android::sp<RingBuffer> pes = ring(video ? "VideoPES" : "AudioPES", 1u << 22);
-    android::sp<RingBuffer> output = ring(video ? "VideoRaw" : "AudioRaw", options.outputRingBytes);
+    android::sp<RingBuffer> input = makeRing("TestTS", 1u << 20);
+    android::sp<RingBuffer> pes = makeRing(video ? "VideoPES" : "AudioPES", 1u << 22);
+    android::sp<RingBuffer> output = makeRing(video ? "VideoRaw" : "AudioRaw", 1u << 22);
     android::sp<Synchronization> clock = new Synchronization();
     android::sp<TSParser> parser =
         new TSParser(video ? TSParser::KIND_VIDEO : TSParser::KIND_AUDIO);
@@ -169,21 +170,7 @@ DecodedRun runDecoder(const std::vector<uint8_t>& ts, uint16_t pid, Decoder::cod
 
     std::atomic<bool> fed{false};
     std::thread feeder([&] {
-        for (size_t at = 0; at + 188 <= ts.size() && Clock::now() < deadline;) {
-            std::vector<uint8_t> batch;
-            for (; at + 188 <= ts.size() && batch.size() < 64 * 188; at += 188) {
-                if ((((ts[at + 1] & 0x1F) << 8) | ts[at + 2]) == pid)
-                    batch.insert(batch.end(), ts.begin() + static_cast<long>(at),
-                                 ts.begin() + static_cast<long>(at + 188));
-            }
-            while (!batch.empty() && Clock::now() < deadline) {
-                if (input->waitForSpace(static_cast<uint32_t>(batch.size()))) {
-                    memcpy(input->writePointer(), batch.data(), batch.size());
-                    input->commitWrite(static_cast<uint32_t>(batch.size()));
-                    batch.clear();
-                }
-            }
-        }
+        feedPid(*input, ts, pid, deadline);
         fed = true;
     });
 
@@ -214,8 +201,6 @@ DecodedRun runDecoder(const std::vector<uint8_t>& ts, uint16_t pid, Decoder::cod
             run.pcm.insert(run.pcm.end(), pcm, pcm + bytes);
         }
         output->consume(record->mSize);
-        if (options.readerPause.count() > 0)
-            std::this_thread::sleep_for(options.readerPause);
     }
     feeder.join();
     run.resolutions = listener.sizes();
@@ -228,23 +213,6 @@ DecodedRun runDecoder(const std::vector<uint8_t>& ts, uint16_t pid, Decoder::cod
     parser->stop();
     return run;
 }
-
-namespace {
-
-std::string capture(const std::string& command) {
-    std::string out;
-    FILE* pipe = popen(command.c_str(), "r");
-    if (pipe == nullptr)
-        return out;
-    char buffer[65536];
-    size_t n = 0;
-    while ((n = fread(buffer, 1, sizeof(buffer), pipe)) > 0)
-        out.append(buffer, n);
-    pclose(pipe);
-    return out;
-}
-
-}  // namespace
 
 std::vector<FramemdLine> ffmpegFramemd5(const std::string& path) {
     const std::string text =

@@ -3,7 +3,6 @@
 // MediaCodecDecoder and collects what comes out of the decoder's output ring.
 #pragma once
 
-#include <chrono>
 #include <cstdint>
 #include <mutex>
 #include <string>
@@ -95,16 +94,10 @@ struct DecodedRun {
     unsigned int stopResult = 0;
 };
 
-struct RunOptions {
-    uint32_t outputRingBytes = 1u << 22;
-    // Pause of the output ring's reader after each record, to let the ring fill.
-    std::chrono::milliseconds readerPause{0};
-};
-
 // Runs the packets of `pid` (video when `type` is H.264, else audio) through TS parser,
 // decoder and output ring. Video records are rendered to `surface` as they are read.
 DecodedRun runDecoder(const std::vector<uint8_t>& ts, uint16_t pid, Decoder::codingType_t type,
-                      const android::sp<android::Surface>& surface, const RunOptions& options = {});
+                      const android::sp<android::Surface>& surface);
 
 // FFmpeg's reference for the same file, from its command-line tool.
 struct FramemdLine {
@@ -114,7 +107,5 @@ struct FramemdLine {
 std::vector<FramemdLine> ffmpegFramemd5(const std::string& path);
 // `format` names the input format when the file is a bare elementary stream.
 std::vector<uint8_t> ffmpegPcm(const std::string& path, const std::string& format = "");
-
-std::string md5Hex(const uint8_t* data, size_t size);
 
 }  // namespace TavoPlayer::test

@@ -2,7 +2,6 @@
 
 #include <filesystem>
 #include <map>
-#include <random>
 #include <string>
 #include <vector>
 
@@ -33,9 +32,8 @@ public:
     Rbsp& ue(uint64_t value) {
         const uint64_t code = value + 1;
         unsigned width = 0;
-        while ((code >> width) > 1) {
+        while ((code >> width) > 1)
             ++width;
-        }
         u(width, 0);
         return u(width + 1, code);
     }
@@ -98,9 +96,8 @@ Bytes spsRbsp(const SpsParams& p) {
     r.u(8, p.profile).u(8, 0).u(8, 40).ue(p.spsId);
     if (p.profile == 100) {
         r.ue(p.chromaFormat);
-        if (p.chromaFormat == 3) {
+        if (p.chromaFormat == 3)
             r.u(1, 0);
-        }
         r.ue(p.bitDepthLumaMinus8).ue(p.bitDepthChromaMinus8).u(1, 0);
         r.u(1, p.scalingLists);
         if (p.scalingLists) {
@@ -120,37 +117,32 @@ Bytes spsRbsp(const SpsParams& p) {
         r.ue(p.log2MaxPocLsbMinus4);
     } else if (p.pocType == 1) {
         r.u(1, 0).se(-3).se(2).ue(p.pocCycle);
-        for (unsigned i = 0; i < p.pocCycle && i < 300; ++i) {
+        for (unsigned i = 0; i < p.pocCycle && i < 300; ++i)
             r.se(static_cast<int>(i % 5) - 2);
-        }
     }
     r.ue(p.refFrames).u(1, 0).ue(p.widthMbs - 1).ue(p.heightMapUnits - 1);
     r.u(1, p.frameMbsOnly);
-    if (!p.frameMbsOnly) {
+    if (!p.frameMbsOnly)
         r.u(1, 1);
-    }
     r.u(1, 1);
     r.u(1, p.cropBottom != 0);
-    if (p.cropBottom != 0) {
+    if (p.cropBottom != 0)
         r.ue(0).ue(0).ue(0).ue(p.cropBottom);
-    }
     r.u(1, p.vui);
     if (p.vui) {
         r.u(1, p.aspectIdc >= 0);
         if (p.aspectIdc >= 0) {
             r.u(8, static_cast<unsigned>(p.aspectIdc));
-            if (p.aspectIdc == 255) {
+            if (p.aspectIdc == 255)
                 r.u(16, 4).u(16, 3);
-            }
         }
         r.u(1, 0);                          // overscan
         r.u(1, 1).u(3, 5).u(1, 0).u(1, 1);  // video signal, colour description
         r.u(8, 1).u(8, 1).u(8, 1);
         r.u(1, 1).ue(0).ue(0);  // chroma location
         r.u(1, p.timing);
-        if (p.timing) {
+        if (p.timing)
             r.u(32, p.numUnitsInTick).u(32, p.timeScale).u(1, p.fixedFrameRate);
-        }
         r.u(1, p.nalHrd);
         if (p.nalHrd) {
             r.ue(0).u(4, 2).u(4, 3).ue(1000).ue(2000).u(1, 1);
@@ -164,9 +156,8 @@ Bytes spsRbsp(const SpsParams& p) {
         }
         r.u(1, p.picStructPresent);
         r.u(1, p.bitstreamRestriction);
-        if (p.bitstreamRestriction) {
+        if (p.bitstreamRestriction)
             r.u(1, 1).ue(2).ue(1).ue(16).ue(16).ue(1).ue(4);
-        }
     }
     return r.bytes();
 }
@@ -186,37 +177,33 @@ Bytes slice(uint8_t header, unsigned firstMb, bool longStartCode = false, int fi
             size_t filler = 24) {
     Rbsp r;
     r.ue(firstMb).ue(header == 0x65 ? 7 : 5).ue(0).u(4, 0);
-    if (field >= 0) {
+    if (field >= 0)
         r.u(1, static_cast<unsigned>(field));
-    }
-    for (size_t i = 0; i < filler; ++i) {
+    for (size_t i = 0; i < filler; ++i)
         r.u(8, 0xA0 + i % 31);
-    }
     return nal(header, r.bytes(), longStartCode);
 }
 // A picture-timing SEI for an SPS without HRD: pic_struct and no clock timestamps.
+// An SEI NAL unit with one message of `payloadType` (its body padded with zero bits to
+// a whole byte) and rbsp_trailing_bits (ITU-T H.264, 7.3.2.3).
+Bytes seiNal(uint8_t payloadType, const Bytes& body) {
+    return nal(0x06,
+               concat({Bytes{payloadType, static_cast<uint8_t>(body.size())}, body, Bytes{0x80}}),
+               false);
+}
 Bytes picTimingSei(unsigned picStruct) {
     Rbsp payload;
     payload.u(4, picStruct);
     static const unsigned clocks[9] = {1, 1, 1, 2, 2, 3, 3, 2, 3};
-    for (unsigned i = 0; i < clocks[picStruct]; ++i) {
+    for (unsigned i = 0; i < clocks[picStruct]; ++i)
         payload.u(1, 0);
-    }
-    Bytes body = payload.bytes(false);
-    // pad to whole bytes with the bit-equal alignment
-    Rbsp sei;
-    sei.u(8, 1).u(8, body.size());
-    Bytes out = sei.bytes(false);
-    out.insert(out.end(), body.begin(), body.end());
-    out.push_back(0x80);
-    return nal(0x06, out, false);
+    return seiNal(1, payload.bytes(false));
 }
 
 class H264Fixture : public ::testing::Test {
 protected:
     void SetUp() override {
-        mRing = test::makeRing(22);
-        ASSERT_NE(mRing, nullptr);
+        mRing = test::makeRing("VideoPES", 1u << 22);
         mExtractor = new H264MediaExtractor(mRing);
     }
     std::vector<ExtractedUnit> run(const std::vector<PesChunk>& chunks, size_t out = 1 << 20) {
@@ -231,31 +218,26 @@ protected:
 
 class H264GolombTest : public H264Fixture {};
 
+// The codes read back as written; a code running off the buffer (24 zeros, no 1) stops
+// at the buffer's end.
 TEST_F(H264GolombTest, UnsignedAndSignedCodesRoundTrip) {
     const uint64_t unsignedValues[] = {0, 1, 2, 3, 6, 7, 254, 255, 65535, 0x7FFFFFFE, 0xFFFFFFFE};
     const int64_t signedValues[] = {0, 1, -1, 2, -2, 100, -100, 32767, -32768};
     Rbsp r;
-    for (uint64_t v : unsignedValues) {
+    for (uint64_t v : unsignedValues)
         r.ue(v);
-    }
-    for (int64_t v : signedValues) {
+    for (int64_t v : signedValues)
         r.se(v);
-    }
     Bytes bytes = r.bytes();
     ReadBitInterface reader(bytes.data(), bytes.size());
-    for (uint64_t v : unsignedValues) {
+    for (uint64_t v : unsignedValues)
         EXPECT_EQ(mExtractor->parseUEGolomb(&reader), v);
-    }
-    for (int64_t v : signedValues) {
+    for (int64_t v : signedValues)
         EXPECT_EQ(mExtractor->parseSEGolomb(&reader), v);
-    }
-}
-
-TEST_F(H264GolombTest, CodeRunningOffTheBufferStopsAtItsEnd) {
-    Bytes zeros(3, 0x00);  // 24 leading zeros and no terminating 1
-    ReadBitInterface reader(zeros.data(), zeros.size());
-    mExtractor->parseUEGolomb(&reader);
-    EXPECT_EQ(reader.remainingBytes(), 0u);  // it never moved past the buffer
+    Bytes zeros(3, 0x00);
+    ReadBitInterface short3(zeros.data(), zeros.size());
+    mExtractor->parseUEGolomb(&short3);
+    EXPECT_EQ(short3.remainingBytes(), 0u);
 }
 
 class H264EmulationPreventionTest : public H264Fixture {};
@@ -349,9 +331,9 @@ INSTANTIATE_TEST_SUITE_P(Fields, H264SpsTest, ::testing::Values(
 class H264SpsRobustnessTest : public H264Fixture {};
 
 // Every input goes in as a heap copy of exactly its size, so that ASan sees any read
-// beyond it: every truncation of an SPS fails, bit flips may fail but never leave the
-// copy, and truncated SEI messages give no picture timing.
-TEST_F(H264SpsRobustnessTest, TruncatedAndFlippedUnitsNeverReadOutsideTheirBytes) {
+// beyond it: every truncation of an SPS fails, and truncated SEI messages give no
+// picture timing. (Bit flips are the fuzz target's business.)
+TEST_F(H264SpsRobustnessTest, TruncatedUnitsNeverReadOutsideTheirBytes) {
     const auto exact = [](const Bytes& bytes, size_t size) {
         std::unique_ptr<uint8_t[]> copy(new uint8_t[std::max<size_t>(size, 1)]);
         std::copy(bytes.begin(), bytes.begin() + static_cast<long>(size), copy.get());
@@ -360,24 +342,13 @@ TEST_F(H264SpsRobustnessTest, TruncatedAndFlippedUnitsNeverReadOutsideTheirBytes
     const Bytes full = spsRbsp({.scalingLists = true, .nalHrd = true, .picStructPresent = true});
     ASSERT_EQ(mExtractor->decodeSPS(exact(full, full.size()).get(), full.size(), false), 0u);
     // Cut before the last byte that holds a field (the last byte is only trailing bits).
-    for (size_t size = 0; size + 1 < full.size(); ++size) {
+    for (size_t size = 0; size + 1 < full.size(); ++size)
         EXPECT_EQ(mExtractor->decodeSPS(exact(full, size).get(), size, true), 1u) << size;
-    }
-    std::mt19937 random(1234);
-    unsigned failures = 0;
-    for (size_t bit = 0; bit < full.size() * 8; ++bit) {
-        auto copy = exact(full, full.size());
-        copy[bit / 8] ^= static_cast<uint8_t>(0x80 >> (bit % 8));
-        copy[random() % full.size()] ^= static_cast<uint8_t>(random());
-        failures += mExtractor->decodeSPS(copy.get(), full.size(), true);
-    }
-    EXPECT_GT(failures, 0u);  // most flips break some field
     SetUp();
     ASSERT_EQ(mExtractor->decodeSPS(exact(full, full.size()).get(), full.size(), false), 0u);
     const Bytes sei = {0xFF, 0xFF, 0x02, 0xFF, 0x30, 0x01, 0x02, 0x03, 0x04, 0x05};
-    for (size_t size = 4; size <= sei.size(); ++size) {
+    for (size_t size = 4; size <= sei.size(); ++size)
         mExtractor->decodeSEI(exact(sei, size).get(), size, true);
-    }
     EXPECT_FALSE(mExtractor->isPicTimingSeen());
 }
 
@@ -419,11 +390,7 @@ TEST_F(H264SeiTest, PicTimingWithHrdDelaysAndClockTimestamp) {
     payload.u(1, 1).u(2, 1).u(1, 0).u(5, 4).u(1, 1).u(1, 0).u(1, 0).u(8, 12);
     payload.u(6, 30).u(6, 59).u(5, 23);  // full timestamp
     payload.u(1, 0);
-    Bytes body = payload.bytes(false);
-    Bytes sei = {1, static_cast<uint8_t>(body.size())};
-    sei.insert(sei.end(), body.begin(), body.end());
-    sei.push_back(0x80);
-    EXPECT_EQ(decodeSei(nal(0x06, sei, false)), 0u);
+    EXPECT_EQ(decodeSei(seiNal(1, payload.bytes(false))), 0u);
     EXPECT_TRUE(mExtractor->isPicTimingSeen());
     EXPECT_EQ(mExtractor->getPicStruct(), 3);
 }
@@ -431,8 +398,7 @@ TEST_F(H264SeiTest, PicTimingWithHrdDelaysAndClockTimestamp) {
 TEST_F(H264SeiTest, InvalidPicStructIsRefused) {
     decodeSps({.picStructPresent = true});
     test::TraceCapture trace;
-    Bytes sei = {1, 1, 0x9F, 0x80};  // pic_struct 9
-    EXPECT_NE(decodeSei(nal(0x06, sei, false)), 0u);
+    EXPECT_NE(decodeSei(seiNal(1, {0x9F})), 0u);  // pic_struct 9
     EXPECT_FALSE(mExtractor->isPicTimingSeen());
     EXPECT_EQ(trace.count("decodePicTimingSEI: Invalid picStruct value: 9"), 1u) << trace.all();
     EXPECT_EQ(trace.count("decodeSEI: Error decoding SEI"), 1u);
@@ -595,14 +561,12 @@ TEST_F(H264AccessUnitTest, WorkaroundAfterThirtyOneRecordsWithoutStart) {
     test::TraceCapture trace;
     std::vector<PesChunk> chunks = {{concat({spsNal(), pps(), slice(0x65, 0)}), 0}};
     const Bytes picture = slice(0x41, 0, true);
-    for (uint64_t i = 1; i <= 40; ++i) {
+    for (uint64_t i = 1; i <= 40; ++i)
         chunks.push_back({picture, i * 3000});
-    }
     chunks.push_back({concat({picture, picture, slice(0x41, 60)}), 700000});
     Units expected = {{chunks[0].es, 0, kIdrSps}};
-    for (uint64_t i = 32; i <= 40; ++i) {
+    for (uint64_t i = 32; i <= 40; ++i)
         expected.push_back({picture, static_cast<long long>(i * 3000), 0});
-    }
     expected.push_back({picture, 700000, 0});
     expected.push_back({concat({picture, slice(0x41, 60)}), 700000 + 1501, 0});
     EXPECT_EQ(run(chunks), expected);
@@ -665,14 +629,11 @@ std::vector<test::ParsedUnit> ffmpegAccessUnits(const Bytes& es) {
 Bytes encode(const std::string& x264Params, const std::string& extra, int frames) {
     const std::string path = std::string(TAVO_BINARY_DIR) + "/h264test_" +
                              std::to_string(std::hash<std::string>()(x264Params + extra)) + ".h264";
-    const std::string command =
+    const bool ok = test::succeeds(
         "ffmpeg -v error -y -f lavfi -i testsrc=size=352x288:rate=30000/1001 -frames:v " +
         std::to_string(frames) + " -c:v libx264 -preset ultrafast -x264-params " + x264Params +
-        " " + extra + " -f h264 '" + path + "'";
-    if (!test::runCommand(command)) {
-        return {};
-    }
-    Bytes es = test::readFile(path);
+        " " + extra + " -f h264 '" + path + "'");
+    const Bytes es = ok ? test::fileBytes(path) : Bytes();
     std::filesystem::remove(path);
     return es;
 }
@@ -694,11 +655,9 @@ TEST_P(H264RealStreamTest, SameAccessUnitsAsFfmpegParser) {
     }
     const auto reference = ffmpegAccessUnits(es);
     ASSERT_EQ(reference.size(), 45u);
-
     std::vector<Bytes> referenceBytes;
-    for (const auto& unit : reference) {
+    for (const auto& unit : reference)
         referenceBytes.push_back(unit.bytes);
-    }
     // One access unit per PES, then several: the same units, each PES's first with its
     // PTS, the others the frame duration after the one before.
     for (size_t group : {1, 3, 7}) {
@@ -744,9 +703,8 @@ protected:
     // The video PES of a generated stream, and libavcodec's units of the same bytes.
     bool generate(const std::string& arguments) {
         const Bytes ts = test::runTsgen(arguments);
-        if (ts.empty()) {
+        if (ts.empty())
             return false;
-        }
         mChunks = test::pesFromTs(ts, 0x111);
         mReference = ffmpegAccessUnits(test::joinEs(mChunks));
         return true;
@@ -862,7 +820,7 @@ TEST_P(H264GoldenTest, UnitsMatchTheDumpFfmpegAndTheTsParserPath) {
     if (path.empty()) {
         GTEST_SKIP() << "sample stream absent from " << TAVO_SHARED_STREAMS_DIR;
     }
-    const Bytes ts = test::readFile(path);
+    const Bytes ts = test::fileBytes(path);
     auto chunks = test::pesFromTs(ts, c.pid, c.packetSize);
     ASSERT_GT(chunks.size(), 1u);
     const auto units = run(chunks);
@@ -870,17 +828,11 @@ TEST_P(H264GoldenTest, UnitsMatchTheDumpFfmpegAndTheTsParserPath) {
 
     // Independent check: every unit is one that libavcodec's parser cuts from the same
     // elementary stream (these muxers start each PES with an access unit).
-    const Bytes es = test::joinEs(chunks);
-    // Keyed by size and hash of the bytes.
-    auto key = [](const Bytes& b) {
-        return std::make_pair(b.size(), test::fnv1a64(b.data(), b.size()));
-    };
-    std::map<std::pair<size_t, uint64_t>, int> reference;
-    for (const auto& unit : ffmpegAccessUnits(es)) {
-        ++reference[key(unit.bytes)];
-    }
+    std::map<Bytes, int> reference;
+    for (const auto& unit : ffmpegAccessUnits(test::joinEs(chunks)))
+        ++reference[unit.bytes];
     for (size_t i = 0; i < units.size(); ++i) {
-        EXPECT_GT(reference[key(units[i].bytes)]--, 0)
+        EXPECT_GT(reference[units[i].bytes]--, 0)
             << "unit " << i << " of " << units.size() << ", " << units[i].bytes.size() << " bytes";
     }
 

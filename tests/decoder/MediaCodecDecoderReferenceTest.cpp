@@ -40,9 +40,9 @@ TEST_P(MediaCodecDecoderReferenceTest, OutputIsFfmpegsDecode) {
 #else
     const ReferenceCase& c = GetParam();
     const std::string path = (mDir / (c.name + ".ts")).string();
-    ASSERT_TRUE(test::runCommand(std::string(TAVO_TSGEN_PATH) + " -o " + path + " " + c.args +
-                                 " >/dev/null 2>&1"));
-    const test::Bytes ts = test::readFile(path);
+    ASSERT_TRUE(
+        test::succeeds(std::string(TAVO_TSGEN_PATH) + " -o " + path + " " + c.args + " 2>&1"));
+    const test::Bytes ts = test::fileBytes(path);
     const bool video = c.type == Decoder::CODING_H264;
     android::sp<test::RecordingSurface> surface = new test::RecordingSurface();
     const test::DecodedRun run =

@@ -18,12 +18,6 @@
 namespace TavoPlayer {
 namespace {
 
-android::sp<RingBuffer> ringOf(const char* name, uint32_t bytes) {
-    android::sp<RingBuffer> ring = new RingBuffer();
-    ring->configureWithSize(name, bytes);
-    return ring;
-}
-
 class MediaCodecDecoderTest : public ::testing::Test {
 protected:
     void SetUp() override {
@@ -41,8 +35,8 @@ protected:
     }
 
     test::TraceCapture mTrace;
-    android::sp<RingBuffer> mInput = ringOf("VideoPES", 1u << 22);
-    android::sp<RingBuffer> mOutput = ringOf("VideoRaw", 1u << 16);
+    android::sp<RingBuffer> mInput = test::makeRing("VideoPES", 1u << 22);
+    android::sp<RingBuffer> mOutput = test::makeRing("VideoRaw", 1u << 16);
     android::sp<MediaCodecDecoder> mDecoder = new MediaCodecDecoder();
 };
 

@@ -2,16 +2,13 @@
 
 #include <algorithm>
 #include <atomic>
-#include <chrono>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <filesystem>
 #include <fstream>
 #include <functional>
-#include <iterator>
 #include <new>
-#include <sstream>
 #include <thread>
 
 #include "common/Synchronization.h"
@@ -25,63 +22,41 @@ extern "C" {
 namespace TavoPlayer::test {
 
 void BitSink::put(uint32_t value, unsigned int bits) {
-    for (unsigned int i = bits; i-- > 0;) {
-        if (mBits % 8 == 0) {
+    for (unsigned int i = bits; i-- > 0; ++mBits) {
+        if (mBits % 8 == 0)
             mBytes.push_back(0);
-        }
-        if (i < 32 && ((value >> i) & 1u)) {  // fields wider than 32 bits are zero-extended
+        if (i < 32 && ((value >> i) & 1u))  // fields wider than 32 bits are zero-extended
             mBytes.back() |= static_cast<uint8_t>(0x80u >> (mBits % 8));
-        }
-        ++mBits;
     }
-}
-
-void BitSink::putBytes(const std::vector<uint8_t>& bytes) {
-    for (uint8_t b : bytes) {
-        put(b, 8);
-    }
-}
-
-android::sp<RingBuffer> makeRing(unsigned int log2Size, const std::string& name) {
-    android::sp<RingBuffer> ring = new RingBuffer();
-    if (ring->configure(name, log2Size) != 0) {
-        return nullptr;
-    }
-    return ring;
 }
 
 bool writeRawRecord(RingBuffer& ring, uint32_t size, uint32_t offsetES, uint32_t sizeES,
-                    uint64_t pts, const std::vector<uint8_t>& bytes) {
+                    uint64_t pts, const Bytes& bytes) {
     const uint32_t footprint =
         RingBuffer::roundUp4(PESData::kHeaderSize + static_cast<uint32_t>(bytes.size()));
-    if (!ring.waitForSpace(footprint)) {
+    if (!ring.waitForSpace(footprint))
         return false;
-    }
     uint8_t* at = ring.writePointer();
     auto* record = new (at) PESData();
     record->mSize = size;
     record->mOffsetES = offsetES;
     record->mSizeES = sizeES;
-    record->mPTS = pts;
-    record->mDTS = pts;
-    if (!bytes.empty()) {
-        std::memcpy(at + PESData::kHeaderSize, bytes.data(), bytes.size());
-    }
+    record->mPTS = record->mDTS = pts;
+    std::copy(bytes.begin(), bytes.end(), at + PESData::kHeaderSize);
     // The ring advances by what was really written, whatever mSize says.
     ring.commitWrite(footprint);
     return true;
 }
 
-bool writePesRecord(RingBuffer& ring, const uint8_t* es, size_t esSize, uint64_t pts,
-                    uint8_t streamId) {
+bool writePesRecord(RingBuffer& ring, const Bytes& es, uint64_t pts, uint8_t streamId) {
     // PES header: prefix, stream_id, PES_packet_length, flags '10' 00 0 0 0 0,
     // PTS_DTS_flags '10', header length 5, then the 5-byte PTS.
     constexpr uint32_t kPesHeader = 14;
-    const auto pesSize = static_cast<uint32_t>(kPesHeader + esSize);
+    const auto pesSize = static_cast<uint32_t>(kPesHeader + es.size());
     const uint32_t packetLength = pesSize > 6 + 0xFFFF ? 0 : pesSize - 6;
     const uint64_t p = pts & 0x1FFFFFFFFull;
     // clang-format off
-    Bytes pes = {
+    const Bytes header = {
         0x00, 0x00, 0x01, streamId,
         static_cast<uint8_t>(packetLength >> 8), static_cast<uint8_t>(packetLength),
         0x80, 0x80, 0x05,
@@ -89,32 +64,38 @@ bool writePesRecord(RingBuffer& ring, const uint8_t* es, size_t esSize, uint64_t
         static_cast<uint8_t>(((p >> 14) & 0xFE) | 1), static_cast<uint8_t>(p >> 7),
         static_cast<uint8_t>(((p << 1) & 0xFE) | 1)};
     // clang-format on
-    pes.insert(pes.end(), es, es + esSize);
     return writeRawRecord(ring, PESData::kHeaderSize + pesSize, PESData::kHeaderSize + kPesHeader,
-                          static_cast<uint32_t>(esSize), p, pes);
+                          static_cast<uint32_t>(es.size()), p, concat({header, es}));
 }
 
-std::vector<PesChunk> cutAt(const std::vector<uint8_t>& es, const std::vector<size_t>& offsets,
+std::vector<PesChunk> cutAt(const Bytes& es, const std::vector<size_t>& offsets,
                             const std::vector<uint64_t>& ptsOf) {
     std::vector<PesChunk> chunks;
     for (size_t i = 0; i < offsets.size(); ++i) {
-        const size_t begin = offsets[i];
-        const size_t end = (i + 1 < offsets.size()) ? offsets[i + 1] : es.size();
-        PesChunk chunk;
-        chunk.es.assign(es.begin() + static_cast<long>(begin), es.begin() + static_cast<long>(end));
-        chunk.pts = i < ptsOf.size() ? ptsOf[i] : 0;
-        chunks.push_back(std::move(chunk));
+        const size_t end = i + 1 < offsets.size() ? offsets[i + 1] : es.size();
+        chunks.push_back(
+            {Bytes(es.begin() + static_cast<long>(offsets[i]), es.begin() + static_cast<long>(end)),
+             ptsOf[i]});
     }
     return chunks;
+}
+
+std::vector<PesChunk> fixedCuts(const Bytes& es, size_t size, uint64_t firstPts, uint64_t ptsStep) {
+    std::vector<size_t> offsets;
+    std::vector<uint64_t> pts;
+    for (size_t at = 0; at < es.size(); at += size) {
+        offsets.push_back(at);
+        pts.push_back(firstPts + pts.size() * ptsStep);
+    }
+    return cutAt(es, offsets, pts);
 }
 
 std::vector<PesChunk> groupCuts(const std::vector<Bytes>& units, size_t perPes, uint64_t firstPts,
                                 uint64_t ptsStep) {
     std::vector<PesChunk> chunks;
     for (size_t i = 0; i < units.size(); ++i) {
-        if (i % perPes == 0) {
+        if (i % perPes == 0)
             chunks.push_back({{}, firstPts + i * ptsStep});
-        }
         chunks.back().es.insert(chunks.back().es.end(), units[i].begin(), units[i].end());
     }
     return chunks;
@@ -122,17 +103,15 @@ std::vector<PesChunk> groupCuts(const std::vector<Bytes>& units, size_t perPes, 
 
 Bytes joinEs(const std::vector<PesChunk>& chunks) {
     Bytes es;
-    for (const PesChunk& chunk : chunks) {
+    for (const PesChunk& chunk : chunks)
         es.insert(es.end(), chunk.es.begin(), chunk.es.end());
-    }
     return es;
 }
 
 Bytes concat(std::initializer_list<Bytes> parts) {
     Bytes out;
-    for (const Bytes& part : parts) {
+    for (const Bytes& part : parts)
         out.insert(out.end(), part.begin(), part.end());
-    }
     return out;
 }
 
@@ -142,18 +121,16 @@ void PrintTo(const ExtractedUnit& unit, std::ostream* os) {
 
 std::vector<Bytes> bytesOf(const std::vector<ExtractedUnit>& units) {
     std::vector<Bytes> out;
-    for (const ExtractedUnit& unit : units) {
+    for (const ExtractedUnit& unit : units)
         out.push_back(unit.bytes);
-    }
     return out;
 }
 
 std::string firstDifference(const std::vector<ExtractedUnit>& got,
                             const std::vector<ExtractedUnit>& want) {
     const auto [g, w] = std::mismatch(got.begin(), got.end(), want.begin(), want.end());
-    if (g == got.end() && w == want.end()) {
+    if (g == got.end() && w == want.end())
         return {};
-    }
     const auto describe = [](auto it, const auto& units) {
         return it == units.end() ? std::string("<none>") : goldenDump({*it});
     };
@@ -168,35 +145,23 @@ unsigned int pullUnit(MediaExtractor& extractor, Bytes& out, std::vector<Extract
     unsigned char flags = 0;
     const unsigned int result =
         extractor.getDecodableUnit(out.data(), out.size(), &length, &pts, &flags);
-    if (result == MediaExtractor::RESULT_OK && length > 0) {
+    if (result == MediaExtractor::RESULT_OK && length > 0)
         units->push_back({Bytes(out.begin(), out.begin() + static_cast<long>(length)), pts, flags});
-    }
     return result;
 }
 
 std::vector<ExtractedUnit> runExtractor(MediaExtractor& extractor, RingBuffer& ring,
-                                        const std::vector<PesChunk>& chunks, size_t outputSize,
-                                        unsigned* ringFaults) {
+                                        const std::vector<PesChunk>& chunks, size_t outputSize) {
     std::vector<ExtractedUnit> units;
     Bytes out(outputSize);
-    auto pull = [&]() {
-        const unsigned int result = pullUnit(extractor, out, &units);
-        if (result == MediaExtractor::RESULT_RING_FAULT && ringFaults != nullptr) {
-            ++*ringFaults;
-        }
-        return result;
-    };
     for (const PesChunk& chunk : chunks) {
-        const uint32_t need = RingBuffer::roundUp4(PESData::kHeaderSize + 14 +
-                                                   static_cast<uint32_t>(chunk.es.size()));
-        while (ring.freeSpace() < need) {
-            if (pull() != MediaExtractor::RESULT_OK) {
-                break;
-            }
+        const auto need = RingBuffer::roundUp4(PESData::kHeaderSize + 14 +
+                                               static_cast<uint32_t>(chunk.es.size()));
+        while (ring.freeSpace() < need && pullUnit(extractor, out, &units) == 0) {
         }
         writePesRecord(ring, chunk.es, chunk.pts);
     }
-    while (pull() == MediaExtractor::RESULT_OK) {
+    while (pullUnit(extractor, out, &units) == MediaExtractor::RESULT_OK) {
     }
     return units;
 }
@@ -207,123 +172,94 @@ std::vector<ExtractedUnit> drain(MediaExtractor& extractor, size_t outputSize, i
     for (int idle = 0; idle < idleCalls;) {
         const size_t before = units.size();
         const unsigned int result = pullUnit(extractor, out, &units);
-        if (result == MediaExtractor::RESULT_RING_FAULT) {
+        if (result == MediaExtractor::RESULT_RING_FAULT)
             break;
-        }
         idle = (result == MediaExtractor::RESULT_NO_INPUT && units.size() == before) ? idle + 1 : 0;
     }
     return units;
 }
 
+void feedPid(RingBuffer& input, const Bytes& ts, uint16_t pid,
+             std::chrono::steady_clock::time_point deadline) {
+    for (size_t at = 0; at + 188 <= ts.size() && std::chrono::steady_clock::now() < deadline;) {
+        Bytes batch;
+        for (; at + 188 <= ts.size() && batch.size() < 64 * 188; at += 188) {
+            if ((((ts[at + 1] & 0x1F) << 8) | ts[at + 2]) == pid)
+                batch.insert(batch.end(), ts.begin() + static_cast<long>(at),
+                             ts.begin() + static_cast<long>(at + 188));
+        }
+        while (!batch.empty() && std::chrono::steady_clock::now() < deadline) {
+            if (input.waitForSpace(static_cast<uint32_t>(batch.size()))) {
+                std::memcpy(input.writePointer(), batch.data(), batch.size());
+                input.commitWrite(static_cast<uint32_t>(batch.size()));
+                batch.clear();
+            }
+        }
+    }
+}
+
 std::vector<ExtractedUnit> runThroughTsParser(MediaExtractor& extractor,
                                               const android::sp<RingBuffer>& output,
-                                              const std::vector<uint8_t>& ts, uint16_t pid,
-                                              int kind, size_t outputSize) {
+                                              const Bytes& ts, uint16_t pid, int kind) {
     const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(60);
-    android::sp<RingBuffer> input = makeRing(20, "TestTS");
+    android::sp<RingBuffer> input = makeRing("TestTS", 1u << 20);
     android::sp<Synchronization> clock = new Synchronization();
     android::sp<TSParser> parser = new TSParser(kind);
     parser->setInput(input);
     parser->addOutput(output, nullptr);
     parser->configure(clock);
     std::vector<ExtractedUnit> units;
-    if (parser->start() != 0) {
+    if (parser->start() != 0)
         return units;
-    }
     std::atomic<bool> fed{false};
     std::thread feeder([&] {
-        std::vector<uint8_t> batch;
-        auto flush = [&] {
-            while (!batch.empty() && std::chrono::steady_clock::now() < deadline) {
-                const auto size = static_cast<uint32_t>(batch.size());
-                if (input->waitForSpace(size)) {
-                    std::memcpy(input->writePointer(), batch.data(), size);
-                    input->commitWrite(size);
-                    batch.clear();
-                }
-            }
-        };
-        for (size_t at = 0; at + 188 <= ts.size(); at += 188) {
-            if ((((ts[at + 1] & 0x1F) << 8) | ts[at + 2]) == pid) {
-                batch.insert(batch.end(), ts.begin() + static_cast<long>(at),
-                             ts.begin() + static_cast<long>(at + 188));
-                if (batch.size() >= 64 * 188) {
-                    flush();
-                }
-            }
-        }
-        flush();
+        feedPid(*input, ts, pid, deadline);
         fed = true;
     });
-    Bytes out(outputSize);
-    int idle = 0;
-    while (idle < 3 && std::chrono::steady_clock::now() < deadline) {
-        const unsigned int result = pullUnit(extractor, out, &units);
-        // Done once everything is fed and parsed and three waits in a row found nothing.
-        idle = (result == MediaExtractor::RESULT_NO_INPUT && fed && input->usedSpace() == 0)
-                   ? idle + 1
-                   : 0;
+    Bytes out(4u << 20);
+    // Done once everything is fed and parsed and three waits in a row found nothing.
+    for (int idle = 0; idle < 3 && std::chrono::steady_clock::now() < deadline;) {
+        const bool empty = pullUnit(extractor, out, &units) == MediaExtractor::RESULT_NO_INPUT;
+        idle = empty && fed && input->usedSpace() == 0 ? idle + 1 : 0;
     }
     feeder.join();
     parser->stop();
     return units;
 }
 
-std::vector<PesChunk> fixedCuts(const std::vector<uint8_t>& es, size_t size, uint64_t firstPts,
-                                uint64_t ptsStep) {
+std::vector<PesChunk> pesFromTs(const Bytes& ts, uint16_t pid, size_t packetSize) {
     std::vector<PesChunk> chunks;
-    for (size_t at = 0, index = 0; at < es.size(); at += size, ++index) {
-        const size_t end = std::min(es.size(), at + size);
-        chunks.push_back({std::vector<uint8_t>(es.begin() + static_cast<long>(at),
-                                               es.begin() + static_cast<long>(end)),
-                          firstPts + index * ptsStep});
-    }
-    return chunks;
-}
-
-std::vector<PesChunk> pesFromTs(const std::vector<uint8_t>& ts, uint16_t pid, size_t packetSize) {
-    std::vector<PesChunk> chunks;
-    std::vector<uint8_t> pes;
+    Bytes pes;
     uint64_t lastPts = 0;
     auto flush = [&]() {
         // 2.4.3.6: prefix, stream_id, length, flags; PTS when PTS_DTS_flags has bit 1.
-        if (pes.size() < 9 || pes[0] != 0 || pes[1] != 0 || pes[2] != 1) {
-            pes.clear();
-            return;
-        }
-        const size_t headerEnd = 9u + pes[8];
-        if ((pes[7] & 0x80) != 0 && pes.size() >= 14) {
-            lastPts = (static_cast<uint64_t>(pes[9] & 0x0E) << 29) |
-                      (static_cast<uint64_t>(pes[10]) << 22) |
-                      (static_cast<uint64_t>(pes[11] & 0xFE) << 14) |
-                      (static_cast<uint64_t>(pes[12]) << 7) | (pes[13] >> 1);
-        }
-        const size_t packetLength = (static_cast<size_t>(pes[4]) << 8) | pes[5];
-        const size_t end = packetLength != 0 ? std::min(pes.size(), 6 + packetLength) : pes.size();
-        if (headerEnd <= end) {
-            chunks.push_back({Bytes(pes.begin() + static_cast<long>(headerEnd),
-                                    pes.begin() + static_cast<long>(end)),
-                              lastPts});
+        if (pes.size() >= 9 && pes[0] == 0 && pes[1] == 0 && pes[2] == 1) {
+            const size_t headerEnd = 9u + pes[8];
+            if ((pes[7] & 0x80) != 0 && pes.size() >= 14) {
+                lastPts = (static_cast<uint64_t>(pes[9] & 0x0E) << 29) |
+                          (static_cast<uint64_t>(pes[10]) << 22) |
+                          (static_cast<uint64_t>(pes[11] & 0xFE) << 14) |
+                          (static_cast<uint64_t>(pes[12]) << 7) | (pes[13] >> 1);
+            }
+            const size_t length = (static_cast<size_t>(pes[4]) << 8) | pes[5];
+            const size_t end = length != 0 ? std::min(pes.size(), 6 + length) : pes.size();
+            if (headerEnd <= end)
+                chunks.push_back({Bytes(pes.begin() + static_cast<long>(headerEnd),
+                                        pes.begin() + static_cast<long>(end)),
+                                  lastPts});
         }
         pes.clear();
     };
     for (size_t at = 0; at + packetSize <= ts.size(); at += packetSize) {
         const uint8_t* packet = &ts[at];
-        if (packet[0] != 0x47 || (((packet[1] & 0x1F) << 8) | packet[2]) != pid) {
+        if (packet[0] != 0x47 || (((packet[1] & 0x1F) << 8) | packet[2]) != pid)
             continue;
-        }
-        const bool unitStart = (packet[1] & 0x40) != 0;
         const uint8_t control = (packet[3] >> 4) & 3;
-        size_t offset = 4;
-        if (control & 2) {
-            offset += 1u + packet[4];
-        }
-        if (!(control & 1) || offset >= 188) {
+        const size_t offset = (control & 2) ? 5u + packet[4] : 4u;
+        if (!(control & 1) || offset >= 188)
             continue;
-        }
-        if (unitStart) {
+        if ((packet[1] & 0x40) != 0)  // payload_unit_start_indicator
             flush();
-        }
         pes.insert(pes.end(), packet + offset, packet + 188);
     }
     flush();
@@ -335,18 +271,15 @@ std::vector<ParsedUnit> ffmpegParse(const Bytes& es, int codecId) {
     AVCodecParserContext* parser = av_parser_init(codecId);
     AVCodecContext* context = avcodec_alloc_context3(nullptr);
     const uint8_t* data = es.data();
-    int left = static_cast<int>(es.size());
-    while (true) {
+    for (int left = static_cast<int>(es.size());;) {
         uint8_t* out = nullptr;
         int outSize = 0;
         const int used = av_parser_parse2(parser, context, &out, &outSize, data, left,
                                           AV_NOPTS_VALUE, AV_NOPTS_VALUE, 0);
-        if (outSize > 0) {
+        if (outSize > 0)
             units.push_back({Bytes(out, out + outSize), parser->key_frame == 1});
-        }
-        if (left == 0 && outSize == 0) {
+        if (left == 0 && outSize == 0)
             break;
-        }
         data += used;
         left -= used;
     }
@@ -372,32 +305,17 @@ std::string compareGolden(const std::string& name, const std::string& dump) {
     const std::string path = std::string(TAVO_SOURCE_DIR) + "/tests/decoder/golden/" + name;
     const char* update = std::getenv("TAVO_UPDATE_GOLDEN");
     if (update != nullptr && std::string(update) == "1") {
-        std::ofstream out(path, std::ios::binary | std::ios::trunc);
-        out << dump;
-        return out ? std::string() : "cannot write " + path;
-    }
-    const std::vector<uint8_t> expectedBytes = readFile(path);
-    if (expectedBytes.empty() && !dump.empty()) {
-        return "no golden dump at " + path + " (run with TAVO_UPDATE_GOLDEN=1 to create it)";
-    }
-    const std::string expected(expectedBytes.begin(), expectedBytes.end());
-    if (expected == dump) {
+        std::ofstream(path, std::ios::binary | std::ios::trunc) << dump;
         return {};
     }
-    // They differ somewhere: name the first line that does (or the end of either).
-    std::istringstream want(expected);
-    std::istringstream got(dump);
-    std::string wantLine;
-    std::string gotLine;
-    for (size_t line = 1;; ++line) {
-        const bool haveWant = static_cast<bool>(std::getline(want, wantLine));
-        const bool haveGot = static_cast<bool>(std::getline(got, gotLine));
-        if (!haveWant || !haveGot || wantLine != gotLine) {
-            return path + " line " + std::to_string(line) + ": expected \"" +
-                   (haveWant ? wantLine : "<end>") + "\", got \"" + (haveGot ? gotLine : "<end>") +
-                   "\"";
-        }
-    }
+    const Bytes bytes = fileBytes(path);
+    const std::string expected(bytes.begin(), bytes.end());
+    if (expected == dump)
+        return {};
+    const auto at = std::mismatch(expected.begin(), expected.end(), dump.begin(), dump.end()).first;
+    return path + " differs from line " +
+           std::to_string(1 + std::count(expected.begin(), at, '\n')) +
+           " (TAVO_UPDATE_GOLDEN=1 rewrites it after an intended change)";
 }
 
 std::string sampleStream(const std::string& name) {
@@ -405,14 +323,18 @@ std::string sampleStream(const std::string& name) {
     return std::filesystem::exists(path) ? path : std::string();
 }
 
-std::vector<uint8_t> runTsgen(const std::string& arguments) {
+bool succeeds(const std::string& command) {
+    bool ok = false;
+    runCommand(command + " >/dev/null", &ok);
+    return ok;
+}
+
+Bytes runTsgen(const std::string& arguments) {
 #ifdef TAVO_TSGEN_PATH
     const std::string path = std::string(TAVO_BINARY_DIR) + "/extractor_tsgen_" +
                              std::to_string(std::hash<std::string>()(arguments)) + ".ts";
-    if (!runCommand(std::string(TAVO_TSGEN_PATH) + " -o '" + path + "' " + arguments)) {
-        return {};
-    }
-    std::vector<uint8_t> ts = readFile(path);
+    const bool ok = succeeds(std::string(TAVO_TSGEN_PATH) + " -o '" + path + "' " + arguments);
+    const Bytes ts = ok ? fileBytes(path) : Bytes();
     std::remove(path.c_str());
     return ts;
 #else
@@ -421,24 +343,10 @@ std::vector<uint8_t> runTsgen(const std::string& arguments) {
 #endif
 }
 
-std::vector<uint8_t> readFile(const std::string& path) {
-    std::ifstream in(path, std::ios::binary);
-    if (!in) {
-        return {};
-    }
-    return std::vector<uint8_t>(std::istreambuf_iterator<char>(in), {});
-}
-
-bool runCommand(const std::string& command) {
-    return std::system(command.c_str()) == 0;
-}
-
 uint64_t fnv1a64(const uint8_t* data, size_t size) {
     uint64_t hash = 0xcbf29ce484222325ull;
-    for (size_t i = 0; i < size; ++i) {
-        hash ^= data[i];
-        hash *= 0x100000001b3ull;
-    }
+    for (size_t i = 0; i < size; ++i)
+        hash = (hash ^ data[i]) * 0x100000001b3ull;
     return hash;
 }
 

@@ -14,6 +14,7 @@
 
 #include "common/RingBuffer.h"
 #include "decoder/MediaExtractor.h"
+#include "support/TsTestUtil.h"
 
 namespace TavoPlayer::test {
 
@@ -33,17 +34,16 @@ void PrintTo(const T& param, std::ostream* os) {
 class BitSink {
 public:
     void put(uint32_t value, unsigned int bits);
-    void putBytes(const std::vector<uint8_t>& bytes);
-    void align() {
-        while (mBits % 8 != 0) {
-            put(0, 1);
-        }
+    void putBytes(const Bytes& bytes) {
+        for (uint8_t b : bytes)
+            put(b, 8);
     }
+    void align() { put(0, (8 - mBits % 8) % 8); }
     size_t bitCount() const { return mBits; }
-    const std::vector<uint8_t>& bytes() const { return mBytes; }
+    const Bytes& bytes() const { return mBytes; }
 
 private:
-    std::vector<uint8_t> mBytes;
+    Bytes mBytes;
     size_t mBits = 0;
 };
 
@@ -52,17 +52,9 @@ struct PesChunk {
     uint64_t pts = 0;
 };
 
-// A configured ring of 2^log2Size bytes (the name only shows up in logs).
-android::sp<RingBuffer> makeRing(unsigned int log2Size = 20, const std::string& name = "TestPES");
-
 // Appends one PESData record carrying `es` with `pts`. Returns false when the ring has
 // no room (after its one wait). `streamId` goes into the PES header.
-bool writePesRecord(RingBuffer& ring, const uint8_t* es, size_t esSize, uint64_t pts,
-                    uint8_t streamId = 0xE0);
-inline bool writePesRecord(RingBuffer& ring, const Bytes& es, uint64_t pts,
-                           uint8_t streamId = 0xE0) {
-    return writePesRecord(ring, es.data(), es.size(), pts, streamId);
-}
+bool writePesRecord(RingBuffer& ring, const Bytes& es, uint64_t pts, uint8_t streamId = 0xE0);
 
 // Appends a record whose header fields are written as given (mSize, mOffsetES,
 // mSizeES), with `bytes` after the 40-byte header: for inconsistent records.
@@ -73,17 +65,12 @@ bool writeRawRecord(RingBuffer& ring, uint32_t size, uint32_t offsetES, uint32_t
 // chunk that starts at offsets[i] the PTS ptsOf[i].
 std::vector<PesChunk> cutAt(const Bytes& es, const std::vector<size_t>& offsets,
                             const std::vector<uint64_t>& ptsOf);
-
-// Re-cuts an elementary stream into PES chunks of `size` bytes; every chunk carries
-// the PTS `firstPts` + index x `ptsStep`.
+// Chunks of `size` bytes; chunk i carries the PTS `firstPts` + i x `ptsStep`.
 std::vector<PesChunk> fixedCuts(const Bytes& es, size_t size, uint64_t firstPts, uint64_t ptsStep);
-
-// Puts `perPes` units into each chunk; a chunk's PTS is `firstPts` + (index of its first
-// unit) x `ptsStep`.
+// `perPes` units in each chunk; a chunk's PTS is `firstPts` + (index of its first unit)
+// x `ptsStep`.
 std::vector<PesChunk> groupCuts(const std::vector<Bytes>& units, size_t perPes, uint64_t firstPts,
                                 uint64_t ptsStep);
-
-// The chunks' ES bytes one after the other, and parts joined.
 Bytes joinEs(const std::vector<PesChunk>& chunks);
 Bytes concat(std::initializer_list<Bytes> parts);
 
@@ -107,26 +94,28 @@ unsigned int pullUnit(MediaExtractor& extractor, Bytes& out, std::vector<Extract
 
 // Feeds `chunks` as PESData records into `ring` (writing only while the ring has room,
 // so one thread can do both sides) and collects every unit `extractor` delivers until
-// it reports that no input is left. Results of 1 are counted in *ringFaults.
+// it reports that no input is left.
 std::vector<ExtractedUnit> runExtractor(MediaExtractor& extractor, RingBuffer& ring,
                                         const std::vector<PesChunk>& chunks,
-                                        size_t outputSize = 4u << 20,
-                                        unsigned* ringFaults = nullptr);
+                                        size_t outputSize = 4u << 20);
 
 // Calls getDecodableUnit until `idleCalls` calls in a row found no input (the ring is
 // drained) or the ring faults, collecting what came out.
 std::vector<ExtractedUnit> drain(MediaExtractor& extractor, size_t outputSize = 8192,
                                  int idleCalls = 3);
 
-// Feeds the TS packets of `pid` from `ts` (188-byte packets) through the system's TS
-// parser module of `kind` into `output`, on a feeder thread, while `extractor` reads
-// from `output` on this thread; returns the units once the parser has taken every
-// packet and no more records come. The parser emits a PES only when the next one
-// starts, so the last PES of the stream is never seen.
+// Writes the 188-byte packets of `pid` from `ts` into `input` in batches, as the
+// receiver does, until all are written or `deadline` passes.
+void feedPid(RingBuffer& input, const Bytes& ts, uint16_t pid,
+             std::chrono::steady_clock::time_point deadline);
+
+// Feeds the TS packets of `pid` through the system's TS parser module of `kind` into
+// `output`, on a feeder thread, while `extractor` reads from `output` on this thread;
+// returns the units once the parser has taken every packet and no more records come.
+// The parser emits a PES only when the next one starts, so the last PES is never seen.
 std::vector<ExtractedUnit> runThroughTsParser(MediaExtractor& extractor,
                                               const android::sp<RingBuffer>& output,
-                                              const Bytes& ts, uint16_t pid, int kind,
-                                              size_t outputSize = 4u << 20);
+                                              const Bytes& ts, uint16_t pid, int kind);
 
 // The PES packets of `pid` in a transport stream (ISO/IEC 13818-1, 2.4.3.2 and
 // 2.4.3.6), each as its ES payload (bounded by PES_packet_length when given) with its
@@ -145,21 +134,18 @@ std::string goldenDump(const std::vector<ExtractedUnit>& units);
 
 // Compares `dump` with tests/decoder/golden/<name>; with TAVO_UPDATE_GOLDEN=1 in the
 // environment, (re)writes that file instead. Returns an empty string when they agree,
-// else a description of the first difference.
+// else the first line where they differ.
 std::string compareGolden(const std::string& name, const std::string& dump);
 
 // Path of a sample stream in the shared folder, empty when it is absent.
 std::string sampleStream(const std::string& name);
 
+// True when the shell command exits with status 0 (its standard output discarded).
+bool succeeds(const std::string& command);
+
 // Runs the project's stream generator with `arguments` and returns the stream it wrote;
 // empty when the generator is not built or fails.
 Bytes runTsgen(const std::string& arguments);
-
-// Reads a whole file; empty when it cannot be read.
-Bytes readFile(const std::string& path);
-
-// Runs a shell command; true when it exits with status 0.
-bool runCommand(const std::string& command);
 
 // FNV-1a 64 of the bytes, for golden dumps.
 uint64_t fnv1a64(const uint8_t* data, size_t size);

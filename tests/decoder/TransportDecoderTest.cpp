@@ -70,9 +70,8 @@ private:
             EXPECT_EQ(static_cast<int32_t>(bits), transportDec_GetAuBitsRemaining(mHandle, 0));
             o.unit.resize(bits / 8);
             TransportBitReader* r = transportDec_GetBitstream(mHandle, 0);
-            for (auto& b : o.unit) {
+            for (auto& b : o.unit)
                 b = static_cast<uint8_t>(r->readBits(8));
-            }
             EXPECT_FALSE(r->overrun());
             EXPECT_EQ(0, transportDec_GetAuBitsRemaining(mHandle, 0));
             transportDec_EndAccessUnit(mHandle);
@@ -191,9 +190,8 @@ class TransportDecoderHeaderTest : public ::testing::TestWithParam<HeaderCase> {
 std::vector<std::vector<uint8_t>> unitsOf(const std::vector<Outcome>& outcomes) {
     std::vector<std::vector<uint8_t>> units;
     for (const auto& o : outcomes) {
-        if (o.error == TRANSPORTDEC_OK) {
+        if (o.error == TRANSPORTDEC_OK)
             units.push_back(o.unit);
-        }
     }
     return units;
 }
@@ -357,21 +355,6 @@ TEST_F(TransportBitReaderTest, ReadingPastTheEndLatchesOverrunWithoutMoving) {
     EXPECT_EQ(0x11, out[0]) << "nothing copied past the end";
     r.readBytes(nullptr, 0);  // an empty copy is no overrun and touches nothing
     EXPECT_EQ(40u, r.bitPosition());
-}
-
-TEST_F(TransportBitReaderTest, ReadsBytesAtAnyBitOffset) {
-    for (unsigned int offset = 0; offset < 8; ++offset) {
-        TransportBitReader r(kBytes.data(), static_cast<uint32_t>(kBytes.size()));
-        r.skipBits(offset);
-        uint8_t out[4] = {};
-        r.readBytes(out, 4);
-        TransportBitReader check(kBytes.data(), static_cast<uint32_t>(kBytes.size()));
-        check.skipBits(offset);
-        for (uint8_t b : out) {
-            EXPECT_EQ(check.readBits(8), b) << "offset " << offset;
-        }
-        EXPECT_EQ(offset + 32, r.bitPosition());
-    }
 }
 
 // Long copies take the wide path; every length and offset up to the very last byte of

@@ -14,6 +14,11 @@
 #include <string>
 
 #include <thread>
+
+#include "platform/binder/IServiceManager.h"
+#include "platform/binder/Parcel.h"
+#include "service/BnCTavoPlayerClient.h"
+#include "service/ICTavoPlayer.h"
 #include "support/RunCommand.h"
 
 namespace {
@@ -81,6 +86,13 @@ protected:
             "timeout 90 env " + environment() + " " + kBin + "tavoctl/tavoctl " + commands, output);
     }
 
+    static std::string daemonLog() {
+        std::ifstream log(sDir / "daemon.log");
+        std::stringstream text;
+        text << log.rdbuf();
+        return text.str();
+    }
+
     static fs::path sDir;
     pid_t mDaemon = -1;
 };
@@ -132,10 +144,95 @@ TEST_F(ServiceSession, AClientThatDiesMidPlaybackLeavesTheServiceReadyForTheNext
         << next;
     // The first line is the state the dead client left: Closed.
     EXPECT_NE(next.find("state 1 Closed"), std::string::npos) << next;
-    std::ifstream log(sDir / "daemon.log");
-    std::stringstream text;
-    text << log.rdbuf();
-    EXPECT_NE(text.str().find("binderDied"), std::string::npos) << text.str();
+    EXPECT_NE(daemonLog().find("binderDied"), std::string::npos) << daemonLog();
+}
+
+// A client that takes every callback and does nothing with it.
+class SilentClient : public TavoPlayer::BnCTavoPlayerClient {
+    void openUriComplete(int32_t) override {}
+    void startComplete(int32_t) override {}
+    void onCaptureFrame(uint8_t*, int32_t, int32_t, int32_t) override {}
+    void onSignalStatusChanged(int32_t, int32_t) override {}
+    void closedCaptionText(const uint8_t*, int32_t) override {}
+    void onStopComplete(int32_t) override {}
+    void onError(int32_t) override {}
+    void onBufferingBegin() override {}
+    void onBufferingEnd() override {}
+    void onBuffering(int32_t) override {}
+    void onAudioSessionId(int32_t) override {}
+    void onStartVideoTask(int32_t, int32_t) override {}
+    void onTimeUpdate(int32_t) override {}
+    void onEndOfContent() override {}
+    void onRecorderStarted(int32_t) override {}
+    void onRecorderStopped(int32_t) override {}
+    void onPaused(int32_t) override {}
+    void onResumed(int32_t) override {}
+    void onSeeked(int32_t) override {}
+};
+
+TEST_F(ServiceSession, AClientThatDiesDuringOpenLeavesTheServiceClosedAndReady) {
+    // The client sends its open and is gone before the service can answer: the
+    // open is sent without waiting for its reply, and the client exits as soon as
+    // a later call shows the service has read it.
+    const pid_t client = fork();
+    ASSERT_GE(client, 0);
+    if (client == 0) {
+        setenv("TAVOPLAYER_SERVICE_DIR", (sDir / "svc").c_str(), 1);
+        android::sp<android::IBinder> binder =
+            android::defaultServiceManager()->getService(android::String16("TavoPlayer"));
+        android::sp<TavoPlayer::ICTavoPlayer> service =
+            android::interface_cast<TavoPlayer::ICTavoPlayer>(binder);
+        if (service == nullptr)
+            _exit(3);
+        android::sp<SilentClient> me = new SilentClient();
+        service->registerClient(me);
+        android::Parcel open;
+        open.writeInterfaceToken(TavoPlayer::ICTavoPlayer::descriptor);
+        open.writeInt32(5);
+        open.writeString16(android::String16(kLive + 7));  // the URI after "open 5 "
+        binder->transact(TavoPlayer::ICTavoPlayer::OPEN_URI, open, nullptr,
+                         android::IBinder::FLAG_ONEWAY);
+        service->getState();
+        _exit(0);
+    }
+    int status = -1;
+    waitpid(client, &status, 0);
+    ASSERT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << status;
+    for (int i = 0; i < 200 && daemonLog().find("binderDied") == std::string::npos; ++i)
+        std::this_thread::sleep_for(std::chrono::milliseconds(50));
+    ASSERT_NE(daemonLog().find("binderDied"), std::string::npos) << daemonLog();
+    std::string next;
+    EXPECT_EQ(
+        tavoctl(std::string("state '") + kLive + "' start 'waitfor onStartVideoTask 20' stop close",
+                &next),
+        0)
+        << next;
+    // The open of the dead client was closed with it.
+    EXPECT_NE(next.find("state 1 Closed"), std::string::npos) << next;
+}
+
+TEST(TavoplayerdDirectory, ADirectoryThatCannotBeMadeIsOneLineAndStatus1) {
+    const fs::path dir = fs::temp_directory_path() / ("tavo-svcdir-" + std::to_string(getpid()));
+    fs::create_directories(dir);
+    std::ofstream(dir / "file") << "x";
+    const struct {
+        std::string serviceDir;
+        const char* reason;
+    } cases[] = {
+        {(dir / "file").string(), "Not a directory"},
+        {(dir / "file" / "svc").string(), "Not a directory"},
+    };
+    for (const auto& c : cases) {
+        std::string out;
+        EXPECT_EQ(runCommand("timeout 20 " + kBin + "tavoplayerd/tavoplayerd --service-dir " +
+                                 c.serviceDir,
+                             &out),
+                  1)
+            << out;
+        EXPECT_EQ(out, "tavoplayerd: cannot create the service directory " + c.serviceDir + ": " +
+                           c.reason + "\n");
+    }
+    fs::remove_all(dir);
 }
 
 TEST_F(ServiceSession, CommandsThatFailGiveANonZeroExit) {

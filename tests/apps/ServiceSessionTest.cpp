@@ -1,19 +1,24 @@
 // The service as a client meets it: tavoplayerd serving a tsgen broadcast from a
 // file, driven by tavoctl over the socket transport, each a process of its own.
 #include <gtest/gtest.h>
+#include <poll.h>
 #include <signal.h>
+#include <sys/socket.h>
+#include <sys/un.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <chrono>
 #include <cstdio>
 #include <cstdlib>
+#include <cstring>
 #include <filesystem>
 #include <fstream>
 #include <sstream>
 #include <string>
 
 #include <thread>
+#include <vector>
 
 #include "platform/binder/IServiceManager.h"
 #include "platform/binder/Parcel.h"
@@ -209,6 +214,69 @@ TEST_F(ServiceSession, AClientThatDiesDuringOpenLeavesTheServiceClosedAndReady) 
         << next;
     // The open of the dead client was closed with it.
     EXPECT_NE(next.find("state 1 Closed"), std::string::npos) << next;
+}
+
+// Datagrams that break the frame rules of docs/protocol.md, each on a connection of
+// its own: the service hangs that connection up with a log line and goes on serving.
+// The first row, a well-formed getState, shows that the others differ by their fault.
+TEST_F(ServiceSession, MalformedFramesHangUpTheirConnectionOnly) {
+    android::Parcel body;
+    body.writeInterfaceToken(TavoPlayer::ICTavoPlayer::descriptor);
+    std::vector<uint32_t> words = {
+        0x31425654, 1, 0, 25, 1, 0, 1, 0, static_cast<uint32_t>(body.dataSize()), 0};
+    std::vector<uint8_t> good(words.size() * 4);
+    memcpy(good.data(), words.data(), good.size());
+    good.insert(good.end(), body.data(), body.data() + body.dataSize());
+    auto with = [&good](size_t word, uint32_t value) {
+        std::vector<uint8_t> f = good;
+        memcpy(f.data() + 4 * word, &value, 4);
+        return f;
+    };
+    std::vector<uint8_t> pastData = with(9, 1);  // one object, its offset beyond the data
+    const uint32_t offset = 4096;
+    pastData.insert(pastData.end(), reinterpret_cast<const uint8_t*>(&offset),
+                    reinterpret_cast<const uint8_t*>(&offset) + 4);
+    const struct {
+        const char* what;
+        std::vector<uint8_t> frame;
+        bool answered;
+    } cases[] = {
+        {"a well-formed getState", good, true},
+        {"shorter than the header", std::vector<uint8_t>(good.begin(), good.begin() + 20), false},
+        {"a wrong magic", with(0, 0x31425655), false},
+        {"a data size past the datagram", with(8, static_cast<uint32_t>(body.dataSize() + 4)),
+         false},
+        {"an unknown command", with(1, 7), false},
+        {"an object offset past the data", pastData, false},
+    };
+    for (const auto& c : cases) {
+        SCOPED_TRACE(c.what);
+        const int fd = socket(AF_UNIX, SOCK_SEQPACKET | SOCK_CLOEXEC, 0);
+        sockaddr_un addr{};
+        addr.sun_family = AF_UNIX;
+        snprintf(addr.sun_path, sizeof addr.sun_path, "%s", (sDir / "svc" / "TavoPlayer").c_str());
+        ASSERT_EQ(connect(fd, reinterpret_cast<sockaddr*>(&addr), sizeof addr), 0);
+        ASSERT_EQ(send(fd, c.frame.data(), c.frame.size(), 0),
+                  static_cast<ssize_t>(c.frame.size()));
+        pollfd p{fd, POLLIN, 0};
+        ASSERT_EQ(poll(&p, 1, 10000), 1) << "neither an answer nor a hang-up";
+        uint8_t reply[512];
+        const ssize_t n = recv(fd, reply, sizeof reply, 0);
+        if (c.answered) {
+            EXPECT_GE(n, 40) << "no reply frame";
+        } else {
+            EXPECT_EQ(n, 0) << "the connection was not hung up";
+        }
+        ::close(fd);
+    }
+    std::string out;
+    EXPECT_EQ(tavoctl("state", &out), 0) << out;
+    size_t logged = 0;
+    const std::string log = daemonLog();
+    for (size_t at = log.find("malformed frame"); at != std::string::npos;
+         at = log.find("malformed frame", at + 1))
+        ++logged;
+    EXPECT_EQ(logged, 5u) << log;
 }
 
 TEST(TavoplayerdDirectory, ADirectoryThatCannotBeMadeIsOneLineAndStatus1) {

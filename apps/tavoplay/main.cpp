@@ -60,11 +60,11 @@ void usage(FILE* out) {
                  "Plays the first programme (or --program N) of SOURCE: a TS file,\n"
                  "udp://GROUP:PORT, dvb:ADAPTER[.DEMUX] (a DVB tuner) or - (standard input).\n\n"
                  "  -p, --program N   programme number to play\n"
+                 "      --channel NAME  with dvb:, tune the frontend to this channel of the\n"
+                 "                    --channels file first; its SERVICE_ID is the\n"
+                 "                    programme unless --program says otherwise. Without\n"
+                 "                    it the frontend must be tuned already (dvbv5-zap)\n"
                  "      --channels FILE  dvbv5 channel file, as dvbv5-scan writes it\n"
-                 "      --channel NAME   with dvb:, tune the frontend to this channel of\n"
-                 "                    --channels first (its SERVICE_ID is the programme\n"
-                 "                    unless --program says otherwise); without it the\n"
-                 "                    frontend must be tuned already (dvbv5-zap)\n"
                  "      --headless    null video and audio outputs (chosen by itself when\n"
                  "                    there is no display or no sound card)\n"
                  "      --loop        play a file again and again\n"
@@ -72,7 +72,8 @@ void usage(FILE* out) {
                  "  -h, --help        this text\n\n"
                  "Keys: space pause/resume, c capture to PNG, r record on/off,\n"
                  "      a next audio PID, s captions on/off, q quit.\n"
-                 "Exit status: 0 end or quit, 1 the service failed, 2 cannot play SOURCE.\n");
+                 "Exit status: 0 end or quit, 1 the service failed or died, 2 cannot play\n"
+                 "SOURCE (or tune it: unknown channel, bad channel file, no adapter, no lock).\n");
 }
 
 // What the service reported, shown on one status line.

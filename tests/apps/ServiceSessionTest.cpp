@@ -77,16 +77,18 @@ protected:
         }
     }
 
-    static std::string environment() {
+    // The demux source the daemon serves.
+    virtual std::string source() const { return (sDir / "live.ts").string(); }
+    std::string environment() const {
         return "TAVOPLAYER_SERVICE_DIR=" + (sDir / "svc").string() +
-               " TAVOPLAYER_PROP_tavoplayer_demux_source=file:" + (sDir / "live.ts").string() +
+               " TAVOPLAYER_PROP_tavoplayer_demux_source=file:" + source() +
                " TAVOPLAYER_PROP_tavoplayer_video_sink=null"
                " TAVOPLAYER_PROP_tavoplayer_audio_sink=null"
                " TAVOPLAYER_PROP_tavoplayer_recordings_dir=" +
                (sDir / "rec").string();
     }
     // tavoctl with the given commands, each one argument.
-    static int tavoctl(const std::string& commands, std::string* output) {
+    int tavoctl(const std::string& commands, std::string* output) const {
         return runCommand(
             "timeout 90 env " + environment() + " " + kBin + "tavoctl/tavoctl " + commands, output);
     }
@@ -277,6 +279,27 @@ TEST_F(ServiceSession, MalformedFramesHangUpTheirConnectionOnly) {
          at = log.find("malformed frame", at + 1))
         ++logged;
     EXPECT_EQ(logged, 5u) << log;
+}
+
+// A source that is not a transport stream: the service plays it as a broadcast
+// that never arrives (signal late, then lost), says why in its log, and stops.
+class ServiceOnANonTsSource : public ServiceSession {
+protected:
+    std::string source() const override { return TAVO_SOURCE_DIR "/README.md"; }
+};
+
+TEST_F(ServiceOnANonTsSource, ReportsTheSignalLostAndLogsTheLostSync) {
+    std::string out;
+    EXPECT_EQ(tavoctl(std::string("'") + kLive +
+                          "' start 'waitfor onSignalStatusChanged 20' 'waitfor "
+                          "onSignalStatusChanged 20' stop close",
+                      &out),
+              0)
+        << out;
+    EXPECT_NE(out.find("<- startComplete(0)"), std::string::npos) << out;
+    EXPECT_NE(out.find("<- onSignalStatusChanged(1, 2)"), std::string::npos) << out;
+    EXPECT_EQ(out.find("onStartVideoTask"), std::string::npos) << out;
+    EXPECT_NE(daemonLog().find("TS sync lost on file"), std::string::npos) << daemonLog();
 }
 
 TEST(TavoplayerdDirectory, ADirectoryThatCannotBeMadeIsOneLineAndStatus1) {

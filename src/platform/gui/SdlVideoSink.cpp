@@ -102,8 +102,22 @@ private:
                 TAVO_LOGE("%s: no SDL window: %s\n", __func__, SDL_GetError());
                 return false;
             }
-            TAVO_LOGI("%s: window %dx%d for %dx%d pictures in a usable %dx%d\n", __func__, size.x,
-                      size.y, width, height, usable.w, usable.h);
+            // A window manager's title bar and frame come on top of the size asked
+            // for; once it has framed the window they are known and taken off.
+            int top = 0, left = 0, bottom = 0, right = 0;
+            if (known && SDL_GetWindowBordersSize(mWindow, &top, &left, &bottom, &right) == 0 &&
+                top + left + bottom + right > 0) {
+                const SDL_Point inner =
+                    fitWithin(width, height, usable.w - left - right, usable.h - top - bottom);
+                SDL_SetWindowSize(mWindow, inner.x, inner.y);
+                SDL_SetWindowPosition(mWindow,
+                                      usable.x + left + (usable.w - left - right - inner.x) / 2,
+                                      usable.y + top + (usable.h - top - bottom - inner.y) / 2);
+            }
+            int shownWidth = 0, shownHeight = 0;
+            SDL_GetWindowSize(mWindow, &shownWidth, &shownHeight);
+            TAVO_LOGI("%s: window %dx%d for %dx%d pictures in a usable %dx%d\n", __func__,
+                      shownWidth, shownHeight, width, height, usable.w, usable.h);
         } else if (width != mWidth || height != mHeight) {
             const int display = std::max(0, SDL_GetWindowDisplayIndex(mWindow));
             const SDL_Rect usable = usableBounds(display);

@@ -11,7 +11,7 @@ packages=(
   android-libutils-dev android-libcutils-dev
   libavcodec-dev libavformat-dev libavutil-dev libswscale-dev libswresample-dev
   ffmpeg libdvbpsi-dev libsqlite3-dev libdvbv5-dev
-  libsdl2-dev libasound2-dev libmpv-dev mpv xvfb xauth
+  libsdl2-dev libasound2-dev libmpv-dev mpv xvfb xauth x11-utils
 )
 
 missing=()

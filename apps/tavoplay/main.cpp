@@ -11,6 +11,7 @@
 #include <netinet/in.h>
 #include <poll.h>
 #include <signal.h>
+#include <sys/prctl.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
@@ -27,6 +28,7 @@
 #include <string>
 #include <thread>
 
+#include "DvbTuner.h"
 #include "StreamProbe.h"
 #include "platform/binder/IServiceManager.h"
 #include "platform/binder/ProcessState.h"
@@ -43,6 +45,9 @@ namespace fs = std::filesystem;
 namespace {
 
 constexpr size_t kProbeLimit = 16 << 20;  // a PAT/PMT period is well under this
+// A frontend locks within a second or two when the signal is there at all.
+constexpr auto kLockWait = std::chrono::seconds(5);
+constexpr auto kQuietWait = std::chrono::seconds(5);
 
 [[noreturn]] void fail(int status, const std::string& reason) {
     std::fprintf(stderr, "tavoplay: %s\n", reason.c_str());
@@ -53,8 +58,13 @@ void usage(FILE* out) {
     std::fprintf(out,
                  "Usage: tavoplay [OPTIONS] SOURCE\n"
                  "Plays the first programme (or --program N) of SOURCE: a TS file,\n"
-                 "udp://GROUP:PORT or - (standard input).\n\n"
+                 "udp://GROUP:PORT, dvb:ADAPTER[.DEMUX] (a DVB tuner) or - (standard input).\n\n"
                  "  -p, --program N   programme number to play\n"
+                 "      --channel NAME  with dvb:, tune the frontend to this channel of the\n"
+                 "                    --channels file first; its SERVICE_ID is the\n"
+                 "                    programme unless --program says otherwise. Without\n"
+                 "                    it the frontend must be tuned already (dvbv5-zap)\n"
+                 "      --channels FILE  dvbv5 channel file, as dvbv5-scan writes it\n"
                  "      --headless    null video and audio outputs (chosen by itself when\n"
                  "                    there is no display or no sound card)\n"
                  "      --loop        play a file again and again\n"
@@ -62,7 +72,8 @@ void usage(FILE* out) {
                  "  -h, --help        this text\n\n"
                  "Keys: space pause/resume, c capture to PNG, r record on/off,\n"
                  "      a next audio PID, s captions on/off, q quit.\n"
-                 "Exit status: 0 end or quit, 1 the service failed, 2 cannot play SOURCE.\n");
+                 "Exit status: 0 end or quit, 1 the service failed or died, 2 cannot play\n"
+                 "SOURCE (or tune it: unknown channel, bad channel file, no adapter, no lock).\n");
 }
 
 // What the service reported, shown on one status line.
@@ -259,13 +270,16 @@ std::atomic<bool> gQuit{false};
 
 int main(int argc, char** argv) {
     static const option kOptions[] = {
-        {"program", required_argument, nullptr, 'p'}, {"headless", no_argument, nullptr, 'H'},
-        {"loop", no_argument, nullptr, 'L'},          {"probe", no_argument, nullptr, 'P'},
-        {"help", no_argument, nullptr, 'h'},          {nullptr, 0, nullptr, 0}};
+        {"program", required_argument, nullptr, 'p'},  {"headless", no_argument, nullptr, 'H'},
+        {"loop", no_argument, nullptr, 'L'},           {"probe", no_argument, nullptr, 'P'},
+        {"channels", required_argument, nullptr, 'C'}, {"channel", required_argument, nullptr, 'N'},
+        {"help", no_argument, nullptr, 'h'},           {nullptr, 0, nullptr, 0}};
     int program = 0;
     bool headless = false;
     bool loop = false;
     bool probeOnly = false;
+    std::string channelsFile;
+    std::string channel;
     int opt;
     while ((opt = getopt_long(argc, argv, "p:h", kOptions, nullptr)) != -1) {
         switch (opt) {
@@ -283,6 +297,12 @@ int main(int argc, char** argv) {
             case 'P':
                 probeOnly = true;
                 break;
+            case 'C':
+                channelsFile = optarg;
+                break;
+            case 'N':
+                channel = optarg;
+                break;
             case 'h':
                 usage(stdout);
                 return 0;
@@ -296,18 +316,42 @@ int main(int argc, char** argv) {
         return 2;
     }
     const std::string source = argv[optind];
+    // Lines as they happen, in order with the status line on standard error, also
+    // when the output goes to a pipe or a file.
+    std::setvbuf(stdout, nullptr, _IOLBF, 0);
     // This process's own messages (and the service's, in its log) stay out of the
     // picture unless asked for.
     setenv("TAVOPLAYER_LOG_LEVEL", "warning", 0);
-    if (source.rfind("dvb:", 0) == 0)
-        fail(2,
-             "dvb: sources are not supported by tavoplay yet; use tavoplayerd with "
-             "tavoplayer.demux.source=dvb:N and tavoctl");
+    const bool isDvb = source.rfind("dvb:", 0) == 0;
+    tavoplay::DvbAddress dvb;
+    if (isDvb && !tavoplay::parseDvbSource(source, &dvb))
+        fail(2, source + ": a DVB source is dvb:ADAPTER or dvb:ADAPTER.DEMUX");
+    if (!channel.empty() && channelsFile.empty())
+        fail(2, "--channel needs --channels FILE");
+    if (!channel.empty() && !isDvb)
+        fail(2, "--channel tunes a dvb: source only");
+
+    // 0. The tuner, when asked to tune: it stays tuned while this process runs.
+    tavoplay::DvbTuner tuner;
+    if (!channel.empty()) {
+        std::string why = tuner.findChannel(channelsFile, channel);
+        if (why.empty())
+            why = tuner.tune(dvb, kLockWait);
+        if (!why.empty())
+            fail(2, source + ": " + why);
+        if (program == 0)
+            program = tuner.serviceId();
+        std::printf("tuned adapter %d to '%s'\n", dvb.adapter, channel.c_str());
+    }
 
     // 1. The programme.
     tavoplay::StreamProbe probe(static_cast<uint16_t>(program));
     std::string consumed;
-    std::string reason = probeSource(source, probe, &consumed);
+    std::string reason =
+        isDvb ? tavoplay::readDvbStream(
+                    dvb, kQuietWait, kProbeLimit,
+                    [&probe](const uint8_t* data, size_t size) { return probe.feed(data, size); })
+              : probeSource(source, probe, &consumed);
     ProbedProgram found;
     if (reason.empty())
         reason = probe.finish(&found);
@@ -351,7 +395,7 @@ int main(int argc, char** argv) {
     std::string demux;
     if (source == "-")
         demux = "stdin";
-    else if (source.rfind("udp://", 0) == 0)
+    else if (source.rfind("udp://", 0) == 0 || isDvb)
         demux = source;
     else
         demux = "file:" + fs::absolute(source).string() + (loop ? "?loop=1" : "");
@@ -360,6 +404,8 @@ int main(int argc, char** argv) {
         fail(1, "cannot make a pipe");
     const pid_t daemon = fork();
     if (daemon == 0) {
+        // The private service goes with this program, however it ends.
+        prctl(PR_SET_PDEATHSIG, SIGTERM);
         setenv("TAVOPLAYER_SERVICE_DIR", (dir + "/svc").c_str(), 1);
         setenv("TAVOPLAYER_PROP_tavoplayer_demux_source", demux.c_str(), 1);
         setenv("TAVOPLAYER_PROP_tavoplayer_video_sink", videoSink.c_str(), 1);
@@ -461,12 +507,19 @@ int main(int argc, char** argv) {
     while (!gQuit) {
         int status = 0;
         if (waitpid(daemon, &status, WNOHANG) == daemon) {
-            std::fprintf(stderr, "\ntavoplay: the service died\n");
+            const std::string how = WIFSIGNALED(status)
+                                        ? "killed by signal " + std::to_string(WTERMSIG(status))
+                                        : "exit status " + std::to_string(WEXITSTATUS(status));
+            // Its log stays for the reader.
+            std::fprintf(stderr,
+                         "\ntavoplay: the service died (%s; its log is %s/tavoplayerd.log)\n",
+                         how.c_str(), dir.c_str());
             std::exit(1);
         }
         // A file does not come back once its packets stop: its end is the first
         // "signal late" (3 s without pictures or sound).
-        if (viewer->signal >= 1 && !loop && source != "-" && source.rfind("udp://", 0) != 0) {
+        if (viewer->signal >= 1 && !loop && source != "-" && source.rfind("udp://", 0) != 0 &&
+            !isDvb) {
             viewer->line("end of stream");
             break;
         }

@@ -12,7 +12,9 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <filesystem>
 #include <string>
+#include <system_error>
 #include <thread>
 
 #include "platform/binder/ProcessState.h"
@@ -33,7 +35,25 @@ void usage(FILE* out) {
                  "  -h, --help              this text\n\n"
                  "Sources and sinks are system properties (TAVOPLAYER_PROPERTIES or\n"
                  "TAVOPLAYER_PROP_<key> variables), e.g. tavoplayer.demux.source,\n"
-                 "tavoplayer.video.sink and tavoplayer.audio.sink.\n");
+                 "tavoplayer.video.sink and tavoplayer.audio.sink.\n\n"
+                 "Exit status: 0 after SIGTERM or SIGINT, 1 when the service cannot be\n"
+                 "registered (its directory cannot be made or written, or another process\n"
+                 "serves it), 2 for a bad option.\n");
+}
+
+// The service directory, made when missing; empty when usable, else the reason.
+// Checked here so that a wrong directory is one line on the terminal rather than
+// a registration failure in the log.
+std::string prepareServiceDirectory(const std::string& dir) {
+    std::error_code ec;
+    std::filesystem::create_directories(dir, ec);
+    if (ec)
+        return "cannot create the service directory " + dir + ": " + ec.message();
+    if (!std::filesystem::is_directory(dir, ec))
+        return "cannot create the service directory " + dir + ": it is not a directory";
+    if (access(dir.c_str(), W_OK | X_OK) != 0)
+        return "cannot use the service directory " + dir + ": " + std::strerror(errno);
+    return "";
 }
 
 bool validLevel(const char* level) {
@@ -86,6 +106,12 @@ int main(int argc, char** argv) {
     // A client that hangs up mid-write must not end the service.
     signal(SIGPIPE, SIG_IGN);
 
+    const std::string problem =
+        prepareServiceDirectory(android::SocketServiceManager::serviceDirectory());
+    if (!problem.empty()) {
+        std::fprintf(stderr, "tavoplayerd: %s\n", problem.c_str());
+        return 1;
+    }
     OneSegPGL_InitializeDebug();
     TavoPlayer::CTavoPlayer::instantiate();
     android::sp<TavoPlayer::CTavoPlayer> service = TavoPlayer::CTavoPlayer::self();

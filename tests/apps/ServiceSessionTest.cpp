@@ -1,19 +1,29 @@
 // The service as a client meets it: tavoplayerd serving a tsgen broadcast from a
 // file, driven by tavoctl over the socket transport, each a process of its own.
 #include <gtest/gtest.h>
+#include <poll.h>
 #include <signal.h>
+#include <sys/socket.h>
+#include <sys/un.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <chrono>
 #include <cstdio>
 #include <cstdlib>
+#include <cstring>
 #include <filesystem>
 #include <fstream>
 #include <sstream>
 #include <string>
 
 #include <thread>
+#include <vector>
+
+#include "platform/binder/IServiceManager.h"
+#include "platform/binder/Parcel.h"
+#include "service/BnCTavoPlayerClient.h"
+#include "service/ICTavoPlayer.h"
 #include "support/RunCommand.h"
 
 namespace {
@@ -67,18 +77,27 @@ protected:
         }
     }
 
-    static std::string environment() {
+    // The demux source the daemon serves.
+    virtual std::string source() const { return (sDir / "live.ts").string(); }
+    std::string environment() const {
         return "TAVOPLAYER_SERVICE_DIR=" + (sDir / "svc").string() +
-               " TAVOPLAYER_PROP_tavoplayer_demux_source=file:" + (sDir / "live.ts").string() +
+               " TAVOPLAYER_PROP_tavoplayer_demux_source=file:" + source() +
                " TAVOPLAYER_PROP_tavoplayer_video_sink=null"
                " TAVOPLAYER_PROP_tavoplayer_audio_sink=null"
                " TAVOPLAYER_PROP_tavoplayer_recordings_dir=" +
                (sDir / "rec").string();
     }
     // tavoctl with the given commands, each one argument.
-    static int tavoctl(const std::string& commands, std::string* output) {
+    int tavoctl(const std::string& commands, std::string* output) const {
         return runCommand(
             "timeout 90 env " + environment() + " " + kBin + "tavoctl/tavoctl " + commands, output);
+    }
+
+    static std::string daemonLog() {
+        std::ifstream log(sDir / "daemon.log");
+        std::stringstream text;
+        text << log.rdbuf();
+        return text.str();
     }
 
     static fs::path sDir;
@@ -132,10 +151,179 @@ TEST_F(ServiceSession, AClientThatDiesMidPlaybackLeavesTheServiceReadyForTheNext
         << next;
     // The first line is the state the dead client left: Closed.
     EXPECT_NE(next.find("state 1 Closed"), std::string::npos) << next;
-    std::ifstream log(sDir / "daemon.log");
-    std::stringstream text;
-    text << log.rdbuf();
-    EXPECT_NE(text.str().find("binderDied"), std::string::npos) << text.str();
+    EXPECT_NE(daemonLog().find("binderDied"), std::string::npos) << daemonLog();
+}
+
+// A client that takes every callback and does nothing with it.
+class SilentClient : public TavoPlayer::BnCTavoPlayerClient {
+    void openUriComplete(int32_t) override {}
+    void startComplete(int32_t) override {}
+    void onCaptureFrame(uint8_t*, int32_t, int32_t, int32_t) override {}
+    void onSignalStatusChanged(int32_t, int32_t) override {}
+    void closedCaptionText(const uint8_t*, int32_t) override {}
+    void onStopComplete(int32_t) override {}
+    void onError(int32_t) override {}
+    void onBufferingBegin() override {}
+    void onBufferingEnd() override {}
+    void onBuffering(int32_t) override {}
+    void onAudioSessionId(int32_t) override {}
+    void onStartVideoTask(int32_t, int32_t) override {}
+    void onTimeUpdate(int32_t) override {}
+    void onEndOfContent() override {}
+    void onRecorderStarted(int32_t) override {}
+    void onRecorderStopped(int32_t) override {}
+    void onPaused(int32_t) override {}
+    void onResumed(int32_t) override {}
+    void onSeeked(int32_t) override {}
+};
+
+TEST_F(ServiceSession, AClientThatDiesDuringOpenLeavesTheServiceClosedAndReady) {
+    // The client sends its open and is gone before the service can answer: the
+    // open is sent without waiting for its reply, and the client exits as soon as
+    // a later call shows the service has read it.
+    const pid_t client = fork();
+    ASSERT_GE(client, 0);
+    if (client == 0) {
+        setenv("TAVOPLAYER_SERVICE_DIR", (sDir / "svc").c_str(), 1);
+        android::sp<android::IBinder> binder =
+            android::defaultServiceManager()->getService(android::String16("TavoPlayer"));
+        android::sp<TavoPlayer::ICTavoPlayer> service =
+            android::interface_cast<TavoPlayer::ICTavoPlayer>(binder);
+        if (service == nullptr)
+            _exit(3);
+        android::sp<SilentClient> me = new SilentClient();
+        service->registerClient(me);
+        android::Parcel open;
+        open.writeInterfaceToken(TavoPlayer::ICTavoPlayer::descriptor);
+        open.writeInt32(5);
+        open.writeString16(android::String16(kLive + 7));  // the URI after "open 5 "
+        binder->transact(TavoPlayer::ICTavoPlayer::OPEN_URI, open, nullptr,
+                         android::IBinder::FLAG_ONEWAY);
+        service->getState();
+        _exit(0);
+    }
+    int status = -1;
+    waitpid(client, &status, 0);
+    ASSERT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << status;
+    for (int i = 0; i < 200 && daemonLog().find("binderDied") == std::string::npos; ++i)
+        std::this_thread::sleep_for(std::chrono::milliseconds(50));
+    ASSERT_NE(daemonLog().find("binderDied"), std::string::npos) << daemonLog();
+    std::string next;
+    EXPECT_EQ(
+        tavoctl(std::string("state '") + kLive + "' start 'waitfor onStartVideoTask 20' stop close",
+                &next),
+        0)
+        << next;
+    // The open of the dead client was closed with it.
+    EXPECT_NE(next.find("state 1 Closed"), std::string::npos) << next;
+}
+
+// Datagrams that break the frame rules of docs/protocol.md, each on a connection of
+// its own: the service hangs that connection up with a log line and goes on serving.
+// The first row, a well-formed getState, shows that the others differ by their fault.
+TEST_F(ServiceSession, MalformedFramesHangUpTheirConnectionOnly) {
+    android::Parcel body;
+    body.writeInterfaceToken(TavoPlayer::ICTavoPlayer::descriptor);
+    std::vector<uint32_t> words = {
+        0x31425654, 1, 0, 25, 1, 0, 1, 0, static_cast<uint32_t>(body.dataSize()), 0};
+    std::vector<uint8_t> good(words.size() * 4);
+    memcpy(good.data(), words.data(), good.size());
+    good.insert(good.end(), body.data(), body.data() + body.dataSize());
+    auto with = [&good](size_t word, uint32_t value) {
+        std::vector<uint8_t> f = good;
+        memcpy(f.data() + 4 * word, &value, 4);
+        return f;
+    };
+    std::vector<uint8_t> pastData = with(9, 1);  // one object, its offset beyond the data
+    const uint32_t offset = 4096;
+    pastData.insert(pastData.end(), reinterpret_cast<const uint8_t*>(&offset),
+                    reinterpret_cast<const uint8_t*>(&offset) + 4);
+    const struct {
+        const char* what;
+        std::vector<uint8_t> frame;
+        bool answered;
+    } cases[] = {
+        {"a well-formed getState", good, true},
+        {"shorter than the header", std::vector<uint8_t>(good.begin(), good.begin() + 20), false},
+        {"a wrong magic", with(0, 0x31425655), false},
+        {"a data size past the datagram", with(8, static_cast<uint32_t>(body.dataSize() + 4)),
+         false},
+        {"an unknown command", with(1, 7), false},
+        {"an object offset past the data", pastData, false},
+    };
+    for (const auto& c : cases) {
+        SCOPED_TRACE(c.what);
+        const int fd = socket(AF_UNIX, SOCK_SEQPACKET | SOCK_CLOEXEC, 0);
+        sockaddr_un addr{};
+        addr.sun_family = AF_UNIX;
+        snprintf(addr.sun_path, sizeof addr.sun_path, "%s", (sDir / "svc" / "TavoPlayer").c_str());
+        ASSERT_EQ(connect(fd, reinterpret_cast<sockaddr*>(&addr), sizeof addr), 0);
+        ASSERT_EQ(send(fd, c.frame.data(), c.frame.size(), 0),
+                  static_cast<ssize_t>(c.frame.size()));
+        pollfd p{fd, POLLIN, 0};
+        ASSERT_EQ(poll(&p, 1, 10000), 1) << "neither an answer nor a hang-up";
+        uint8_t reply[512];
+        const ssize_t n = recv(fd, reply, sizeof reply, 0);
+        if (c.answered) {
+            EXPECT_GE(n, 40) << "no reply frame";
+        } else {
+            EXPECT_EQ(n, 0) << "the connection was not hung up";
+        }
+        ::close(fd);
+    }
+    std::string out;
+    EXPECT_EQ(tavoctl("state", &out), 0) << out;
+    size_t logged = 0;
+    const std::string log = daemonLog();
+    for (size_t at = log.find("malformed frame"); at != std::string::npos;
+         at = log.find("malformed frame", at + 1))
+        ++logged;
+    EXPECT_EQ(logged, 5u) << log;
+}
+
+// A source that is not a transport stream: the service plays it as a broadcast
+// that never arrives (signal late, then lost), says why in its log, and stops.
+class ServiceOnANonTsSource : public ServiceSession {
+protected:
+    std::string source() const override { return TAVO_SOURCE_DIR "/README.md"; }
+};
+
+TEST_F(ServiceOnANonTsSource, ReportsTheSignalLostAndLogsTheLostSync) {
+    std::string out;
+    EXPECT_EQ(tavoctl(std::string("'") + kLive +
+                          "' start 'waitfor onSignalStatusChanged 20' 'waitfor "
+                          "onSignalStatusChanged 20' stop close",
+                      &out),
+              0)
+        << out;
+    EXPECT_NE(out.find("<- startComplete(0)"), std::string::npos) << out;
+    EXPECT_NE(out.find("<- onSignalStatusChanged(1, 2)"), std::string::npos) << out;
+    EXPECT_EQ(out.find("onStartVideoTask"), std::string::npos) << out;
+    EXPECT_NE(daemonLog().find("TS sync lost on file"), std::string::npos) << daemonLog();
+}
+
+TEST(TavoplayerdDirectory, ADirectoryThatCannotBeMadeIsOneLineAndStatus1) {
+    const fs::path dir = fs::temp_directory_path() / ("tavo-svcdir-" + std::to_string(getpid()));
+    fs::create_directories(dir);
+    std::ofstream(dir / "file") << "x";
+    const struct {
+        std::string serviceDir;
+        const char* reason;
+    } cases[] = {
+        {(dir / "file").string(), "Not a directory"},
+        {(dir / "file" / "svc").string(), "Not a directory"},
+    };
+    for (const auto& c : cases) {
+        std::string out;
+        EXPECT_EQ(runCommand("timeout 20 " + kBin + "tavoplayerd/tavoplayerd --service-dir " +
+                                 c.serviceDir,
+                             &out),
+                  1)
+            << out;
+        EXPECT_EQ(out, "tavoplayerd: cannot create the service directory " + c.serviceDir + ": " +
+                           c.reason + "\n");
+    }
+    fs::remove_all(dir);
 }
 
 TEST_F(ServiceSession, CommandsThatFailGiveANonZeroExit) {

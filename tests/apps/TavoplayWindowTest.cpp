@@ -1,5 +1,6 @@
-// tavoplay under a virtual X display: the picture reaches a real window, captions
-// reach the terminal and the end of the file ends the program with status 0.
+// tavoplay under a virtual X display: the picture reaches a real window that fits
+// the screen with the picture's aspect ratio, captions reach the terminal and the
+// end of the file ends the program with status 0.
 #include <gtest/gtest.h>
 #include <signal.h>
 #include <sys/wait.h>
@@ -17,9 +18,45 @@ namespace {
 
 namespace fs = std::filesystem;
 
-TEST(TavoplayWindow, ShowsTheTestPatternAndPrintsCaptions) {
-    if (system("command -v Xvfb >/dev/null && command -v ffmpeg >/dev/null") != 0)
-        GTEST_SKIP() << "Xvfb or ffmpeg is not installed";
+struct Screen {
+    int width, height;
+    // The window expected for a 1920x1080 picture: the largest of its aspect that
+    // fits, centred.
+    const char* window;
+};
+void PrintTo(const Screen& s, std::ostream* os) {
+    *os << s.width << "x" << s.height;
+}
+
+class TavoplayWindow : public testing::TestWithParam<Screen> {};
+
+// The size and place of the TavoPlayer window, "WxH+X+Y", as the X server has it.
+std::string windowGeometry(const std::string& display) {
+    FILE* tree = popen(("xwininfo -display " + display + " -root -tree 2>/dev/null").c_str(), "r");
+    if (tree == nullptr)
+        return "";
+    std::string geometry;
+    char line[512];
+    while (fgets(line, sizeof line, tree) != nullptr) {
+        const std::string text = line;
+        if (text.find("\"TavoPlayer\"") == std::string::npos)
+            continue;
+        // ...: ("tavoplayerd" "tavoplayerd")  1024x576+0+96  +0+96
+        const size_t close = text.rfind(')');
+        char g[64] = {};
+        if (close != std::string::npos && sscanf(text.c_str() + close + 1, "%63s", g) == 1)
+            geometry = g;
+    }
+    pclose(tree);
+    return geometry;
+}
+
+TEST_P(TavoplayWindow, ShowsTheTestPatternFittedAndPrintsCaptions) {
+    const Screen screen = GetParam();
+    const std::string size = std::to_string(screen.width) + "x" + std::to_string(screen.height);
+    if (system("command -v Xvfb >/dev/null && command -v ffmpeg >/dev/null && "
+               "command -v xwininfo >/dev/null") != 0)
+        GTEST_SKIP() << "Xvfb, ffmpeg or xwininfo is not installed";
     const fs::path dir = fs::temp_directory_path() / ("tavo-window-" + std::to_string(getpid()));
     fs::create_directories(dir);
     const std::string ts = (dir / "s.ts").string();
@@ -30,8 +67,8 @@ TEST(TavoplayWindow, ShowsTheTestPatternAndPrintsCaptions) {
     const std::string display = ":" + std::to_string(100 + getpid() % 100);
     const pid_t xvfb = fork();
     if (xvfb == 0) {
-        execlp("Xvfb", "Xvfb", display.c_str(), "-screen", "0", "1920x1080x24", "-nolisten", "tcp",
-               nullptr);
+        execlp("Xvfb", "Xvfb", display.c_str(), "-screen", "0", (size + "x24").c_str(), "-nolisten",
+               "tcp", nullptr);
         _exit(127);
     }
     std::this_thread::sleep_for(std::chrono::seconds(2));
@@ -45,7 +82,8 @@ TEST(TavoplayWindow, ShowsTheTestPatternAndPrintsCaptions) {
     // The picture, grabbed from the screen while the stream plays, scaled down.
     std::this_thread::sleep_for(std::chrono::seconds(6));
     std::vector<unsigned char> rgb(160 * 90 * 3);
-    FILE* grab = popen((env + "ffmpeg -v error -f x11grab -video_size 1920x1080 -i " + display +
+    const std::string geometry = windowGeometry(display);
+    FILE* grab = popen((env + "ffmpeg -v error -f x11grab -video_size " + size + " -i " + display +
                         " -frames:v 1 -vf scale=160:90 -f rawvideo -pix_fmt rgb24 -")
                            .c_str(),
                        "r");
@@ -58,6 +96,7 @@ TEST(TavoplayWindow, ShowsTheTestPatternAndPrintsCaptions) {
     kill(xvfb, SIGTERM);
     waitpid(xvfb, nullptr, 0);
     ASSERT_EQ(got, rgb.size());
+    EXPECT_EQ(geometry, screen.window);
     // Colour bars: most of the screen lit, in several clearly different colours.
     size_t lit = 0;
     std::set<int> colours;
@@ -77,5 +116,9 @@ TEST(TavoplayWindow, ShowsTheTestPatternAndPrintsCaptions) {
     EXPECT_NE(printed.find("caption: Olá"), std::string::npos) << printed;
     fs::remove_all(dir);
 }
+
+INSTANTIATE_TEST_SUITE_P(Screens, TavoplayWindow,
+                         testing::Values(Screen{1920, 1080, "1920x1080+0+0"},
+                                         Screen{1024, 768, "1024x576+0+96"}));
 
 }  // namespace

@@ -40,7 +40,8 @@ status_t makeDirectory(const std::string& dir) {
     std::filesystem::create_directories(dir, ec);
     struct stat st {};
     if (stat(dir.c_str(), &st) != 0 || !S_ISDIR(st.st_mode)) {
-        TAVO_LOGE("%s: cannot create the service directory %s\n", "addService", dir.c_str());
+        TAVO_LOGE("%s: cannot create the service directory %s: %s\n", "addService", dir.c_str(),
+                  ec ? ec.message().c_str() : "not a directory");
         return PERMISSION_DENIED;
     }
     return OK;

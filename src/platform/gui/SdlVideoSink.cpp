@@ -2,6 +2,7 @@
 
 #include <pthread.h>
 
+#include <algorithm>
 #include <atomic>
 #include <cerrno>
 #include <chrono>
@@ -21,6 +22,17 @@ namespace {
 
 // SDL's video subsystem may be started by one thread of the process at a time.
 std::atomic<bool> gWindowOpen{false};
+
+// The largest size with the picture's aspect ratio that fits in `bounds`; a picture
+// that fits already keeps its own size (pixels are not enlarged unasked).
+SDL_Point fitWithin(int width, int height, int boundsWidth, int boundsHeight) {
+    if (boundsWidth <= 0 || boundsHeight <= 0 || (width <= boundsWidth && height <= boundsHeight))
+        return {width, height};
+    const double scale = std::min(static_cast<double>(boundsWidth) / width,
+                                  static_cast<double>(boundsHeight) / height);
+    return {std::max(1, static_cast<int>(width * scale)),
+            std::max(1, static_cast<int>(height * scale))};
+}
 
 }  // namespace
 
@@ -77,17 +89,40 @@ private:
     // Makes the window, renderer and texture fit a picture of this format and size.
     bool upload(uint32_t format, int width, int height) {
         if (mWindow == nullptr) {
-            mWindow =
-                SDL_CreateWindow("TavoPlayer", SDL_WINDOWPOS_UNDEFINED, SDL_WINDOWPOS_UNDEFINED,
-                                 width, height, SDL_WINDOW_RESIZABLE | SDL_WINDOW_SHOWN);
+            const SDL_Rect usable = usableBounds(0);
+            const SDL_Point size = fitWithin(width, height, usable.w, usable.h);
+            const bool known = usable.w > 0 && usable.h > 0;
+            mWindow = SDL_CreateWindow(
+                "TavoPlayer", known ? usable.x + (usable.w - size.x) / 2 : SDL_WINDOWPOS_UNDEFINED,
+                known ? usable.y + (usable.h - size.y) / 2 : SDL_WINDOWPOS_UNDEFINED, size.x,
+                size.y, SDL_WINDOW_RESIZABLE | SDL_WINDOW_SHOWN);
             if (mWindow != nullptr)
                 mRenderer = SDL_CreateRenderer(mWindow, -1, 0);
             if (mRenderer == nullptr) {
                 TAVO_LOGE("%s: no SDL window: %s\n", __func__, SDL_GetError());
                 return false;
             }
+            // A window manager's title bar and frame come on top of the size asked
+            // for; once it has framed the window they are known and taken off.
+            int top = 0, left = 0, bottom = 0, right = 0;
+            if (known && SDL_GetWindowBordersSize(mWindow, &top, &left, &bottom, &right) == 0 &&
+                top + left + bottom + right > 0) {
+                const SDL_Point inner =
+                    fitWithin(width, height, usable.w - left - right, usable.h - top - bottom);
+                SDL_SetWindowSize(mWindow, inner.x, inner.y);
+                SDL_SetWindowPosition(mWindow,
+                                      usable.x + left + (usable.w - left - right - inner.x) / 2,
+                                      usable.y + top + (usable.h - top - bottom - inner.y) / 2);
+            }
+            int shownWidth = 0, shownHeight = 0;
+            SDL_GetWindowSize(mWindow, &shownWidth, &shownHeight);
+            TAVO_LOGI("%s: window %dx%d for %dx%d pictures in a usable %dx%d\n", __func__,
+                      shownWidth, shownHeight, width, height, usable.w, usable.h);
         } else if (width != mWidth || height != mHeight) {
-            SDL_SetWindowSize(mWindow, width, height);
+            const int display = std::max(0, SDL_GetWindowDisplayIndex(mWindow));
+            const SDL_Rect usable = usableBounds(display);
+            const SDL_Point size = fitWithin(width, height, usable.w, usable.h);
+            SDL_SetWindowSize(mWindow, size.x, size.y);
         }
         if (mTexture != nullptr && format == mFormat && width == mWidth && height == mHeight)
             return true;
@@ -105,6 +140,16 @@ private:
         mWidth = width;
         mHeight = height;
         return true;
+    }
+
+    // The display's area less the panels and docks of the desktop; the whole
+    // display where the system cannot tell, nothing at all where it has no mode.
+    static SDL_Rect usableBounds(int display) {
+        SDL_Rect bounds{0, 0, 0, 0};
+        if (SDL_GetDisplayUsableBounds(display, &bounds) != 0 &&
+            SDL_GetDisplayBounds(display, &bounds) != 0)
+            bounds = {0, 0, 0, 0};
+        return bounds;
     }
 
     void draw(uint64_t pts90k, int width, int height) {

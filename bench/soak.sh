@@ -79,8 +79,9 @@ python3 "$HERE/avsync.py" play --marks "$WORK/video.log" "$WORK/audio.log" "$WOR
     >"$WORK/marks.txt"
 python3 - "$WORK/rss.txt" "$WORK/marks.txt" <<'EOF'
 import sys
-rss = [line.split() for line in open(sys.argv[1])]
-rss = [(float(t), int(k), int(ns)) for t, k, ns in rss]
+rows = [line.split() for line in open(sys.argv[1])]
+rss = [(float(r[0]), int(r[1]), int(r[2])) for r in rows]
+split = [(int(r[3]), int(r[4]), int(r[5])) for r in rows]
 lines = open(sys.argv[2]).read().splitlines()
 marks = [(int(l.split()[1]), float(l.split()[2])) for l in lines if l.startswith("mark ")]
 summary = [l for l in lines if l.startswith("av-sync:")]
@@ -88,21 +89,26 @@ if not rss or not marks:
     print("soak: no samples or no marks")
     sys.exit(1)
 t0 = rss[0][2]
-print("   t s   rss MiB   av offset ms (marks in the 10 s before)")
+print("   t s   rss MiB  (anon, files, of which rings)   av offset ms (marks in the 10 s before)")
 prev = None
-for t, k, ns in rss:
+for (t, k, ns), (anon, files, rings) in zip(rss, split):
     window = [o for m, o in marks if (prev is None or m > prev) and m <= ns]
     off = f"{sum(window) / len(window):7.1f} ({len(window)})" if window else "      -"
-    print(f"{t:6.1f} {k / 1024:9.2f}   {off}")
+    print(f"{t:6.1f} {k / 1024:9.2f}  ({anon / 1024:6.2f}, {files / 1024:6.2f}, {rings / 1024:5.2f})   {off}")
     prev = ns
 minute = [r for r in rss if r[0] >= 60.0]
 base = minute[0]
+b = split[rss.index(base)]
 growth = (rss[-1][1] - base[1]) / 1024
 peak = (max(k for _, k, _ in minute) - base[1]) / 1024
 print(f"rss growth after the first minute: {growth:.2f} MiB (at {base[0]:.0f} s "
       f"{base[1] / 1024:.2f} MiB, at {rss[-1][0]:.0f} s {rss[-1][1] / 1024:.2f} MiB, "
       f"highest {peak:+.2f} MiB above the first-minute figure); target <= 1 MiB: "
       f"{'met' if growth <= 1.0 else 'missed'}")
+print(f"  of which anonymous {(split[-1][0] - b[0]) / 1024:+.2f} MiB, file-backed "
+      f"{(split[-1][1] - b[1]) / 1024:+.2f} MiB, the rings' shared memory "
+      f"{(split[-1][2] - b[2]) / 1024:+.2f} MiB (a ring's pages become resident as its "
+      f"writer first goes round it)")
 xs = [(m - t0) / 1e9 for m, _ in marks]
 ys = [o for _, o in marks]
 first = [o for x, o in zip(xs, ys) if x < 60]

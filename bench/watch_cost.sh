@@ -63,3 +63,9 @@ awk -v oc="$ours_cpu" -v ou="$ours_user" -v os="$ours_sys" -v ow="$ours_wall" \
         oh / 1024, parts, mh / 1024, mh / oh
     printf "peak rss target 80 MiB: tavoplayer %s\n", (oh / 1024 <= 80 ? "within" : "over")
 }'
+# Where our CPU time went, by process and thread name (as last sampled, so a little
+# below the totals above), and mpv's for comparison.
+for name in tavoplayer mpv; do
+    awk -v who="$name" '$1 == "cpu" && $4 >= 0.05 { line = line sprintf(" %s/%s %.2f", $2, $3, $4) }
+        END { print "threads of " who ":" line }' "$WORK/$name.mem"
+done

@@ -186,8 +186,9 @@ def play(args):
     if args.marks:
         for ns, off in offsets:
             print(f"mark {ns} {off:.3f}")
+    # On standard output too, ahead of the summary, which stays the last line.
     print(f"avsync: {len(shown)} mark pictures shown, {len(tones)} bursts heard, "
-          f"{len(offsets)} paired", file=sys.stderr)
+          f"{len(offsets)} paired", flush=True)
     if not offsets:
         print("av-sync: mean nan ms, worst ahead nan ms, worst behind nan ms over 0 marks")
         return 1

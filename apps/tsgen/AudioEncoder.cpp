@@ -9,6 +9,7 @@ extern "C" {
 #include <libavutil/samplefmt.h>
 }
 
+#include <algorithm>
 #include <cmath>
 
 #include "AvError.h"
@@ -36,8 +37,11 @@ const char* encoderName(AudioCodec codec) {
 
 AudioEncoder::AudioEncoder(const Options& options) : mOptions(options) {
     mTotalSamples = static_cast<int64_t>(std::llround(options.durationSec * options.audioRate));
-    // A tone per seed, on a 10 Hz grid from 300 Hz to 1.5 kHz, unless asked for.
-    mToneHz = options.toneHz > 0 ? options.toneHz : 300.0 + 10.0 * (options.seed % 121);
+    // A tone per seed, on a 10 Hz grid from 300 Hz to 1.5 kHz, unless asked for;
+    // 1 kHz for sync marks, the usual lip-sync beep.
+    mToneHz = options.toneHz > 0  ? options.toneHz
+              : options.syncMarks ? 1000.0
+                                  : 300.0 + 10.0 * (options.seed % 121);
 }
 
 AudioEncoder::~AudioEncoder() {
@@ -91,6 +95,7 @@ int AudioEncoder::open() {
         mError = std::string("cannot open the ") + name + " encoder: " + avError(rc);
         return 1;
     }
+    mPrimingSamples = mContext->initial_padding;
     mFrame->format = mContext->sample_fmt;
     mFrame->nb_samples = frameSamples();
     mFrame->sample_rate = mContext->sample_rate;
@@ -103,6 +108,32 @@ int AudioEncoder::open() {
         return 1;
     }
     return 0;
+}
+
+// Burst length of a sync mark: 40 ms, long enough to be found in any decoded
+// frame, short enough to stay one event.
+constexpr int64_t kSyncBurstMs = 40;
+
+double AudioEncoder::syncMarkLevel(int64_t inputSample) const {
+    // Time stamps count decoded samples from the first picture's PTS, and the
+    // decoder gives input sample t back at t + priming (the encoder's delay, which
+    // the plain tone does not need to care about): the burst is moved earlier by
+    // that much so that its first sample decodes exactly at the mark's PTS.
+    const int64_t at = inputSample + mPrimingSamples;
+    const int64_t period = mOptions.syncMarkSample(1);
+    const int64_t k = period > 0 ? at / period : 0;
+    const int64_t burst = kSyncBurstMs * mOptions.audioRate / 1000;
+    for (int64_t mark = std::max<int64_t>(1, k - 1); mark <= k + 1; ++mark) {
+        const int64_t start = mOptions.syncMarkSample(mark);
+        if (at >= start && at < start + burst) {
+            const double phase =
+                2.0 * M_PI *
+                std::fmod(mToneHz * static_cast<double>(at - start), mOptions.audioRate) /
+                mOptions.audioRate;
+            return 0.5 * std::sin(phase);
+        }
+    }
+    return 0.0;
 }
 
 void AudioEncoder::fillTone() {
@@ -125,7 +156,10 @@ void AudioEncoder::fillTone() {
             const double phase = 2.0 * M_PI *
                                  std::fmod(hz * static_cast<double>(t), mOptions.audioRate) /
                                  mOptions.audioRate;
-            const double s = t < mTotalSamples ? 0.25 * std::sin(phase) : 0.0;
+            double s = t < mTotalSamples ? 0.25 * std::sin(phase) : 0.0;
+            if (mOptions.syncMarks) {
+                s = t < mTotalSamples ? syncMarkLevel(t) : 0.0;
+            }
             const int plane = planar ? ch : 0;
             const int index = planar ? i : i * channels + ch;
             switch (packed) {

@@ -35,6 +35,7 @@ private:
     int encodeFrame(std::vector<uint8_t>& framed);
     int sendNextFrame();
     void fillTone();
+    double syncMarkLevel(int64_t inputSample) const;
 
     const Options& mOptions;
     std::unique_ptr<AacFramer> mFramer;
@@ -48,6 +49,7 @@ private:
     bool mFlushed = false;
     bool mEnded = false;
     double mToneHz = 1000.0;
+    int64_t mPrimingSamples = 0;  // the encoder's delay: input sample t decodes at t + this
     std::string mError;
 };
 

@@ -31,6 +31,7 @@ enum OptionId {
     kOptAudioBitrate,
     kOptAudioFramesPerPes,
     kOptToneHz,
+    kOptSyncMarks,
     kOptCaption,
     kOptNoCaptionStream,
     kOptCaptionMgmtInterval,
@@ -168,7 +169,12 @@ Output and content:
       --audio-frames-per-pes N  audio frames in each PES packet (default 1)
       --latm-config-interval N  StreamMuxConfig in every N-th LOAS frame, the others set
                              useSameStreamMux (default 1: in every frame)
-      --tone-hz HZ           test tone frequency (default: from the seed)
+      --tone-hz HZ           test tone frequency (default: from the seed; 1000 with
+                             --sync-marks)
+      --sync-marks           lip-sync marks: dark pictures and silence, except a white
+                             picture and a 40 ms tone burst at the same PTS on every
+                             picture that is a multiple of the rounded frame rate (30 at
+                             29.97 Hz: every 1.001 s, the first at 1.001 s)
       --caption SEC:TEXT     caption statement shown at SEC (repeatable); TEXT is UTF-8
                              with escapes \xNN (any caption code), \n (APR), \f (CS), \\
       --caption-mgmt-interval SEC  caption management data period (default 5)
@@ -240,6 +246,7 @@ int OptionParser::parse(int argc, char** argv, Options& o) {
         {"audio-bitrate", required_argument, nullptr, kOptAudioBitrate},
         {"audio-frames-per-pes", required_argument, nullptr, kOptAudioFramesPerPes},
         {"tone-hz", required_argument, nullptr, kOptToneHz},
+        {"sync-marks", no_argument, nullptr, kOptSyncMarks},
         {"caption", required_argument, nullptr, kOptCaption},
         {"caption-mgmt-interval", required_argument, nullptr, kOptCaptionMgmtInterval},
         {"no-caption-stream", no_argument, nullptr, kOptNoCaptionStream},
@@ -425,6 +432,9 @@ int OptionParser::parse(int argc, char** argv, Options& o) {
                 if (!parseDouble(arg, 20, 20000, o.toneHz)) {
                     return bad("--tone-hz (20..20000)");
                 }
+                break;
+            case kOptSyncMarks:
+                o.syncMarks = true;
                 break;
             case kOptCaption: {
                 const auto colon = arg.find(':');
@@ -631,6 +641,9 @@ int OptionParser::parse(int argc, char** argv, Options& o) {
     if (o.audioChannels > 2 &&
         (o.audioCodec == AudioCodec::kMp2 || o.audioCodec == AudioCodec::kMp3)) {
         return fail("--audio-channels above 2 needs AAC (--audio latm or adts)");
+    }
+    if (o.syncMarks && o.audioCodec == AudioCodec::kNone) {
+        return fail("--sync-marks needs audio (the tone burst is half of each mark)");
     }
     if (!o.captions.empty() && !o.captionStream) {
         return fail("--caption cannot be combined with --no-caption-stream");

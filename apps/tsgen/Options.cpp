@@ -59,4 +59,15 @@ int64_t Options::effectiveMuxRate() const {
     return (raw + step - 1) / step * step;
 }
 
+int Options::syncMarkPeriodFrames() const {
+    return std::max(1, (fpsNum + fpsDen / 2) / fpsDen);
+}
+
+int64_t Options::syncMarkSample(int64_t k) const {
+    // Picture n is shown at n * fpsDen / fpsNum seconds; its sample, rounded to
+    // the nearest (exact at 29.97 Hz and 48 kHz: 48048 samples per mark).
+    const int64_t num = k * syncMarkPeriodFrames() * static_cast<int64_t>(fpsDen) * audioRate;
+    return (num + fpsNum / 2) / fpsNum;
+}
+
 }  // namespace TavoPlayer::tsgen

@@ -52,6 +52,9 @@ struct Options {
     int audioFramesPerPes = 1;
     int latmConfigInterval = 1;  // StreamMuxConfig in every n-th LOAS frame
     double toneHz = 0;           // 0: chosen from the seed
+    // Lip-sync marks: a dark, silent programme with a white picture and a tone
+    // burst at the same PTS about once a second (see syncMarkPeriodFrames).
+    bool syncMarks = false;
 
     bool captionStream = true;
     std::vector<CaptionEvent> captions;
@@ -92,6 +95,13 @@ struct Options {
     int64_t effectiveVideoBitrate() const;
     int64_t effectiveAudioBitrate() const;
     int64_t effectiveMuxRate() const;
+    // Pictures from one sync mark to the next: the frame rate rounded (30 at
+    // 29.97 Hz, so a mark every 1.001 s); the first mark is this picture, not 0,
+    // so that the audio encoder's priming never cuts a burst.
+    int syncMarkPeriodFrames() const;
+    // The first audio sample of mark k (k >= 1), counted from the first
+    // picture's PTS in samples of audioRate.
+    int64_t syncMarkSample(int64_t k) const;
 };
 
 }  // namespace TavoPlayer::tsgen

@@ -24,11 +24,29 @@ uint32_t mix(uint32_t x) {
 
 }  // namespace
 
-TestPattern::TestPattern(int width, int height, uint32_t seed)
-    : mWidth(width), mHeight(height), mSeed(seed) {}
+TestPattern::TestPattern(int width, int height, uint32_t seed, int syncMarkPeriod)
+    : mWidth(width), mHeight(height), mSeed(seed), mSyncMarkPeriod(syncMarkPeriod) {}
 
 void TestPattern::render(int64_t frameIndex, uint8_t* y, int yStride, uint8_t* u, int uStride,
                          uint8_t* v, int vStride) const {
+    if (mSyncMarkPeriod > 0) {
+        const bool mark = frameIndex > 0 && frameIndex % mSyncMarkPeriod == 0;
+        const uint8_t luma = mark ? kMarkLuma : kDarkLuma;
+        for (int row = 0; row < mHeight; ++row) {
+            std::fill_n(y + static_cast<std::ptrdiff_t>(row) * yStride, mWidth, luma);
+        }
+        for (int row = 0; row < mHeight / 2; ++row) {
+            std::fill_n(u + static_cast<std::ptrdiff_t>(row) * uStride, mWidth / 2, 128);
+            std::fill_n(v + static_cast<std::ptrdiff_t>(row) * vStride, mWidth / 2, 128);
+        }
+    } else {
+        renderBars(frameIndex, y, yStride, u, uStride, v, vStride);
+    }
+    renderFrameNumber(frameIndex, y, yStride, u, uStride, v, vStride);
+}
+
+void TestPattern::renderBars(int64_t frameIndex, uint8_t* y, int yStride, uint8_t* u, int uStride,
+                             uint8_t* v, int vStride) const {
     const int barWidth = std::max(1, mWidth / 8);
     const int scroll = static_cast<int>((frameIndex * 4 + (mSeed % 97)) % mWidth);
     // The bars are the same on every row: build one row of each plane and copy it.
@@ -87,7 +105,10 @@ void TestPattern::render(int64_t frameIndex, uint8_t* y, int yStride, uint8_t* u
         std::fill_n(u + static_cast<std::ptrdiff_t>(row) * uStride + cx, cw, 128);
         std::fill_n(v + static_cast<std::ptrdiff_t>(row) * vStride + cx, cw, 128);
     }
+}
 
+void TestPattern::renderFrameNumber(int64_t frameIndex, uint8_t* y, int yStride, uint8_t* u,
+                                    int uStride, uint8_t* v, int vStride) const {
     // Frame number code, on a black band, when the picture is wide enough.
     if (mWidth >= (kIndexBits + 2) * kIndexBlock && mHeight >= 3 * kIndexBlock) {
         for (int row = 0; row < 3 * kIndexBlock; ++row) {

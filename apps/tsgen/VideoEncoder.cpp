@@ -17,7 +17,9 @@ extern "C" {
 namespace TavoPlayer::tsgen {
 
 VideoEncoder::VideoEncoder(const Options& options)
-    : mOptions(options), mPattern(options.width, options.height, options.seed) {
+    : mOptions(options),
+      mPattern(options.width, options.height, options.seed,
+               options.syncMarks ? options.syncMarkPeriodFrames() : 0) {
     mFrameCount =
         std::max<int64_t>(1, std::llround(options.durationSec * options.fpsNum / options.fpsDen));
 }

@@ -128,10 +128,7 @@ private:
             : android::Thread(false), mRenderer(renderer) {}
 
     private:
-        android::status_t readyToRun() override {
-            setCurrentThreadName("AudioRenderer");
-            return android::OK;
-        }
+        android::status_t readyToRun() override;
         bool threadLoop() override;
         AudioRenderer* mRenderer;
         unsigned int mLastStatus = 0;

@@ -1,5 +1,6 @@
 #include "renderer/AudioRenderer.h"
 
+#include <sys/resource.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -598,6 +599,19 @@ unsigned int AudioRenderer::render() {
     advanceAudioClock(payloadBytes);
     releaseInput(header.size);
     return OK;
+}
+
+android::status_t AudioRenderer::RenderThread::readyToRun() {
+    setCurrentThreadName("AudioRenderer");
+    // The platform's audio priority, which libutils applies only on Android: here the
+    // thread raises itself. At the normal priority a busy machine holds the writer up
+    // until the device runs dry, and every such gap leaves the sound that much later
+    // than the pictures for good, since the audio clock counts the samples written.
+    // Raising a priority needs CAP_SYS_NICE; without it the thread runs at the
+    // normal one.
+    if (setpriority(PRIO_PROCESS, static_cast<id_t>(gettid()), android::PRIORITY_AUDIO) != 0)
+        TAVO_LOGD("%s: audio priority not available: %s\n", __func__, strerror(errno));
+    return android::OK;
 }
 
 bool AudioRenderer::RenderThread::threadLoop() {

@@ -165,6 +165,7 @@ const char* const kBadOptions[] = {
     "-o /dev/null --mux-rate 200000|below the contents",
     "-o /dev/null --bogus|unknown option --bogus",
     "-o /dev/null --audio mp2 --audio-channels 6|needs AAC",
+    "-o /dev/null --sync-marks --audio none|--sync-marks needs audio",
     "-o /dev/null --seed|needs a value",
     "-o /dev/null stray|unexpected argument 'stray'",
     "-d 0.1 --size 64x64 -o /nonexistent-dir/out.ts|cannot open /nonexistent-dir/out.ts|1"};

@@ -282,7 +282,8 @@ TEST_F(LivePlayback, EveryPipelineThreadIsNamedAndNoneOutlivesStop) {
     // /proc shows at most 15 characters of a name.
     for (const char* expected :
          {"TSReceiver", "TSParser", "MCInputThread", "MCOutputThread", "VideoRenderer",
-          "AudioRenderer", "CCWorkerThread", "CCWorkerThreadR", "OutputDeviceThr", "PollingThread"})
+          "AudioRenderer", "CCWorkerThread", "CCWorkerThreadR", "OutputDeviceThr", "PollingThread",
+          "H264Decoder"})
         EXPECT_EQ(names.count(expected) > 0, true) << "no thread named " << expected;
     EXPECT_EQ(names.count("TSParser"), 4u);
     ASSERT_EQ(mController->stop(), 0u);

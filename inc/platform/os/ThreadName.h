@@ -12,4 +12,21 @@ inline void setCurrentThreadName(const char* name) {
     prctl(PR_SET_NAME, reinterpret_cast<unsigned long>(name), 0, 0, 0);
 }
 
+// Threads that a library starts inherit the name of the thread that starts them. This
+// names the calling thread for them while it lives and gives the caller its own name
+// back at the end.
+class ScopedThreadName {
+public:
+    explicit ScopedThreadName(const char* name) {
+        prctl(PR_GET_NAME, reinterpret_cast<unsigned long>(mCaller), 0, 0, 0);
+        setCurrentThreadName(name);
+    }
+    ~ScopedThreadName() { setCurrentThreadName(mCaller); }
+    ScopedThreadName(const ScopedThreadName&) = delete;
+    ScopedThreadName& operator=(const ScopedThreadName&) = delete;
+
+private:
+    char mCaller[16] = {};
+};
+
 }  // namespace TavoPlayer

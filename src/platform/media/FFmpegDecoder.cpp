@@ -14,6 +14,7 @@ extern "C" {
 #include <libswscale/swscale.h>
 }
 
+#include "platform/os/ThreadName.h"
 #include "platform/os/Trace.h"
 
 namespace android {
@@ -116,7 +117,13 @@ bool FFmpegDecoder::openCodec(const char* name, const uint8_t* extradata, size_t
         memcpy(mContext->extradata, extradata, extradataSize);
         mContext->extradata_size = static_cast<int>(extradataSize);
     }
-    const int result = avcodec_open2(mContext, codec, nullptr);
+    int result;
+    {
+        // The frame-threading workers start here: they carry this name, not the name
+        // of whichever thread (a binder thread, the codec looper) opened the codec.
+        TavoPlayer::ScopedThreadName workers(mKind == Kind::Avc ? "H264Decoder" : "AudioDecoder");
+        result = avcodec_open2(mContext, codec, nullptr);
+    }
     if (result < 0) {
         char text[AV_ERROR_MAX_STRING_SIZE];
         TAVO_LOGE("%s: FFmpeg cannot open %s: %s\n", __func__, name,

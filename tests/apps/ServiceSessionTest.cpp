@@ -22,8 +22,8 @@
 
 #include "platform/binder/IServiceManager.h"
 #include "platform/binder/Parcel.h"
-#include "service/BnCTavoPlayerClient.h"
 #include "service/ICTavoPlayer.h"
+#include "support/NullPlayerClient.h"
 #include "support/RunCommand.h"
 
 namespace {
@@ -154,28 +154,7 @@ TEST_F(ServiceSession, AClientThatDiesMidPlaybackLeavesTheServiceReadyForTheNext
     EXPECT_NE(daemonLog().find("binderDied"), std::string::npos) << daemonLog();
 }
 
-// A client that takes every callback and does nothing with it.
-class SilentClient : public TavoPlayer::BnCTavoPlayerClient {
-    void openUriComplete(int32_t) override {}
-    void startComplete(int32_t) override {}
-    void onCaptureFrame(uint8_t*, int32_t, int32_t, int32_t) override {}
-    void onSignalStatusChanged(int32_t, int32_t) override {}
-    void closedCaptionText(const uint8_t*, int32_t) override {}
-    void onStopComplete(int32_t) override {}
-    void onError(int32_t) override {}
-    void onBufferingBegin() override {}
-    void onBufferingEnd() override {}
-    void onBuffering(int32_t) override {}
-    void onAudioSessionId(int32_t) override {}
-    void onStartVideoTask(int32_t, int32_t) override {}
-    void onTimeUpdate(int32_t) override {}
-    void onEndOfContent() override {}
-    void onRecorderStarted(int32_t) override {}
-    void onRecorderStopped(int32_t) override {}
-    void onPaused(int32_t) override {}
-    void onResumed(int32_t) override {}
-    void onSeeked(int32_t) override {}
-};
+using SilentClient = TavoPlayer::test::NullPlayerClient;
 
 TEST_F(ServiceSession, AClientThatDiesDuringOpenLeavesTheServiceClosedAndReady) {
     // The client sends its open and is gone before the service can answer: the

@@ -28,7 +28,7 @@
 #include "platform/binder/ProcessState.h"
 #include "platform/os/Trace.h"
 #include "service/BnCTavoPlayer.h"
-#include "service/BnCTavoPlayerClient.h"
+#include "support/NullPlayerClient.h"
 
 extern char** environ;
 
@@ -408,30 +408,12 @@ TEST_F(ServiceProtocolTest, EveryCodeReadsItsArgumentsInOrderAndReplies) {
 }
 
 // The client side of the callbacks, recording what arrives.
-class RecordingClient : public BnCTavoPlayerClient {
+class RecordingClient : public test::NullPlayerClient {
 public:
-    void openUriComplete(int32_t) override {}
-    void startComplete(int32_t) override {}
     void onCaptureFrame(uint8_t* data, int32_t width, int32_t height, int32_t) override {
         std::lock_guard<std::mutex> lock(mLock);
         pixels.assign(data, data + static_cast<size_t>(width) * height * 4);
     }
-    void onSignalStatusChanged(int32_t, int32_t) override {}
-    void closedCaptionText(const uint8_t*, int32_t) override {}
-    void onStopComplete(int32_t) override {}
-    void onError(int32_t) override {}
-    void onBufferingBegin() override {}
-    void onBufferingEnd() override {}
-    void onBuffering(int32_t) override {}
-    void onAudioSessionId(int32_t) override {}
-    void onStartVideoTask(int32_t, int32_t) override {}
-    void onTimeUpdate(int32_t) override {}
-    void onEndOfContent() override {}
-    void onRecorderStarted(int32_t) override {}
-    void onRecorderStopped(int32_t) override {}
-    void onPaused(int32_t) override {}
-    void onResumed(int32_t) override {}
-    void onSeeked(int32_t) override {}
 
     bool waitFrame() {
         std::unique_lock<std::mutex> lock(mLock);

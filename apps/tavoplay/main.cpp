@@ -69,6 +69,10 @@ void usage(FILE* out) {
                  "                    there is no display or no sound card)\n"
                  "      --loop        play a file again and again\n"
                  "      --probe       print the programme found and its MTV URI, then exit\n"
+                 "      --service DIR  play through the tavoplayerd already serving in DIR\n"
+                 "                    (the system one: /run/tavoplayer) instead of a private\n"
+                 "                    one; that service reads its own source, so SOURCE must\n"
+                 "                    be what it reads (typically its tuner, dvb:N)\n"
                  "  -h, --help        this text\n\n"
                  "Keys: space pause/resume, c capture to PNG, r record on/off,\n"
                  "      a next audio PID, s captions on/off, q quit.\n"
@@ -266,20 +270,95 @@ struct RawTerminal {
 
 std::atomic<bool> gQuit{false};
 
+// Set when a running service's connection goes away.
+struct DeathFlag : android::IBinder::DeathRecipient {
+    void binderDied(const android::wp<android::IBinder>&) override { dead = true; }
+    std::atomic<bool> dead{false};
+};
+
+// Starts a tavoplayerd of this program's own on `source`, with its socket folder and log
+// in `dir`; standard input (what the probe read first) is forwarded to it for "-".
+pid_t startPrivateService(const std::string& dir, const std::string& source,
+                          const std::string& consumed, bool loop, bool isDvb,
+                          const std::string& videoSink, const std::string& audioSink,
+                          const char* argv0) {
+    std::string demux;
+    if (source == "-")
+        demux = "stdin";
+    else if (source.rfind("udp://", 0) == 0 || isDvb)
+        demux = source;
+    else
+        demux = "file:" + fs::absolute(source).string() + (loop ? "?loop=1" : "");
+    int feed[2] = {-1, -1};
+    if (source == "-" && pipe(feed) != 0)
+        fail(1, "cannot make a pipe");
+    const pid_t daemon = fork();
+    if (daemon == 0) {
+        // The private service goes with this program, however it ends.
+        prctl(PR_SET_PDEATHSIG, SIGTERM);
+        setenv("TAVOPLAYER_SERVICE_DIR", (dir + "/svc").c_str(), 1);
+        setenv("TAVOPLAYER_PROP_tavoplayer_demux_source", demux.c_str(), 1);
+        setenv("TAVOPLAYER_PROP_tavoplayer_video_sink", videoSink.c_str(), 1);
+        if (!audioSink.empty())
+            setenv("TAVOPLAYER_PROP_tavoplayer_audio_sink", audioSink.c_str(), 1);
+        if (getenv("TAVOPLAYER_PROP_tavoplayer_recordings_dir") == nullptr)
+            setenv("TAVOPLAYER_PROP_tavoplayer_recordings_dir", (dir + "/recordings").c_str(), 1);
+        if (feed[0] >= 0) {
+            dup2(feed[0], STDIN_FILENO);
+            ::close(feed[0]);
+            ::close(feed[1]);
+        } else {
+            const int null = open("/dev/null", O_RDONLY);
+            dup2(null, STDIN_FILENO);
+        }
+        const int log =
+            open((dir + "/tavoplayerd.log").c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0644);
+        dup2(log, STDERR_FILENO);
+        const std::string path = daemonPath(argv0);
+        execlp(path.c_str(), path.c_str(), "--log-level", "warning", nullptr);
+        _exit(127);
+    }
+    if (daemon < 0)
+        fail(1, "cannot start tavoplayerd");
+    std::thread pump;
+    if (feed[1] >= 0) {
+        ::close(feed[0]);
+        // Standard input goes on to the service: first what the probe read.
+        pump = std::thread([&consumed, out = feed[1]] {
+            signal(SIGPIPE, SIG_IGN);
+            if (write(out, consumed.data(), consumed.size()) >= 0) {
+                char buffer[65536];
+                ssize_t n;
+                while (!gQuit && (n = read(STDIN_FILENO, buffer, sizeof buffer)) > 0)
+                    if (write(out, buffer, static_cast<size_t>(n)) != n)
+                        break;
+            }
+            ::close(out);
+        });
+        pump.detach();
+    }
+    return daemon;
+}
+
 }  // namespace
 
 int main(int argc, char** argv) {
-    static const option kOptions[] = {
-        {"program", required_argument, nullptr, 'p'},  {"headless", no_argument, nullptr, 'H'},
-        {"loop", no_argument, nullptr, 'L'},           {"probe", no_argument, nullptr, 'P'},
-        {"channels", required_argument, nullptr, 'C'}, {"channel", required_argument, nullptr, 'N'},
-        {"help", no_argument, nullptr, 'h'},           {nullptr, 0, nullptr, 0}};
+    static const option kOptions[] = {{"program", required_argument, nullptr, 'p'},
+                                      {"headless", no_argument, nullptr, 'H'},
+                                      {"loop", no_argument, nullptr, 'L'},
+                                      {"probe", no_argument, nullptr, 'P'},
+                                      {"channels", required_argument, nullptr, 'C'},
+                                      {"channel", required_argument, nullptr, 'N'},
+                                      {"service", required_argument, nullptr, 'S'},
+                                      {"help", no_argument, nullptr, 'h'},
+                                      {nullptr, 0, nullptr, 0}};
     int program = 0;
     bool headless = false;
     bool loop = false;
     bool probeOnly = false;
     std::string channelsFile;
     std::string channel;
+    std::string serviceDir;
     int opt;
     while ((opt = getopt_long(argc, argv, "p:h", kOptions, nullptr)) != -1) {
         switch (opt) {
@@ -302,6 +381,9 @@ int main(int argc, char** argv) {
                 break;
             case 'N':
                 channel = optarg;
+                break;
+            case 'S':
+                serviceDir = optarg;
                 break;
             case 'h':
                 usage(stdout);
@@ -330,6 +412,8 @@ int main(int argc, char** argv) {
         fail(2, "--channel needs --channels FILE");
     if (!channel.empty() && !isDvb)
         fail(2, "--channel tunes a dvb: source only");
+    if (!serviceDir.empty() && source == "-")
+        fail(2, "standard input cannot reach a running service; play it without --service");
 
     // 0. The tuner, when asked to tune: it stays tuned while this process runs.
     tavoplay::DvbTuner tuner;
@@ -377,7 +461,8 @@ int main(int argc, char** argv) {
     // 2. Outputs.
     std::string videoSink = "sdl";
     std::string audioSink;  // the audio track's own default
-    if (headless || getenv("DISPLAY") == nullptr || !haveSoundCard()) {
+    // A running service keeps the outputs it was started with.
+    if (serviceDir.empty() && (headless || getenv("DISPLAY") == nullptr || !haveSoundCard())) {
         if (!headless)
             std::printf("no %s here: playing to the null outputs\n",
                         getenv("DISPLAY") == nullptr ? "display" : "sound card");
@@ -387,76 +472,32 @@ int main(int argc, char** argv) {
             audioSink = "null";
     }
 
-    // 3. A private service on this source.
-    char dirTemplate[] = "/tmp/tavoplay-XXXXXX";
-    if (mkdtemp(dirTemplate) == nullptr)
-        fail(1, std::string("cannot make a service directory: ") + std::strerror(errno));
-    const std::string dir = dirTemplate;
-    std::string demux;
-    if (source == "-")
-        demux = "stdin";
-    else if (source.rfind("udp://", 0) == 0 || isDvb)
-        demux = source;
-    else
-        demux = "file:" + fs::absolute(source).string() + (loop ? "?loop=1" : "");
-    int feed[2] = {-1, -1};
-    if (source == "-" && pipe(feed) != 0)
-        fail(1, "cannot make a pipe");
-    const pid_t daemon = fork();
-    if (daemon == 0) {
-        // The private service goes with this program, however it ends.
-        prctl(PR_SET_PDEATHSIG, SIGTERM);
-        setenv("TAVOPLAYER_SERVICE_DIR", (dir + "/svc").c_str(), 1);
-        setenv("TAVOPLAYER_PROP_tavoplayer_demux_source", demux.c_str(), 1);
-        setenv("TAVOPLAYER_PROP_tavoplayer_video_sink", videoSink.c_str(), 1);
-        if (!audioSink.empty())
-            setenv("TAVOPLAYER_PROP_tavoplayer_audio_sink", audioSink.c_str(), 1);
-        if (getenv("TAVOPLAYER_PROP_tavoplayer_recordings_dir") == nullptr)
-            setenv("TAVOPLAYER_PROP_tavoplayer_recordings_dir", (dir + "/recordings").c_str(), 1);
-        if (feed[0] >= 0) {
-            dup2(feed[0], STDIN_FILENO);
-            ::close(feed[0]);
-            ::close(feed[1]);
-        } else {
-            const int null = open("/dev/null", O_RDONLY);
-            dup2(null, STDIN_FILENO);
-        }
-        const int log =
-            open((dir + "/tavoplayerd.log").c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0644);
-        dup2(log, STDERR_FILENO);
-        const std::string path = daemonPath(argv[0]);
-        execlp(path.c_str(), path.c_str(), "--log-level", "warning", nullptr);
-        _exit(127);
+    // 3. A private service on this source, or the running one asked for.
+    pid_t daemon = -1;
+    std::string dir;
+    if (!serviceDir.empty()) {
+        std::printf("playing through the service in %s, which reads its own source\n",
+                    serviceDir.c_str());
+    } else {
+        char dirTemplate[] = "/tmp/tavoplay-XXXXXX";
+        if (mkdtemp(dirTemplate) == nullptr)
+            fail(1, std::string("cannot make a service directory: ") + std::strerror(errno));
+        dir = dirTemplate;
+        daemon =
+            startPrivateService(dir, source, consumed, loop, isDvb, videoSink, audioSink, argv[0]);
     }
-    if (daemon < 0)
-        fail(1, "cannot start tavoplayerd");
-    std::thread pump;
-    if (feed[1] >= 0) {
-        ::close(feed[0]);
-        // Standard input goes on to the service: first what the probe read.
-        pump = std::thread([&consumed, out = feed[1]] {
-            signal(SIGPIPE, SIG_IGN);
-            if (write(out, consumed.data(), consumed.size()) >= 0) {
-                char buffer[65536];
-                ssize_t n;
-                while (!gQuit && (n = read(STDIN_FILENO, buffer, sizeof buffer)) > 0)
-                    if (write(out, buffer, static_cast<size_t>(n)) != n)
-                        break;
-            }
-            ::close(out);
-        });
-        pump.detach();
-    }
-    setenv("TAVOPLAYER_SERVICE_DIR", (dir + "/svc").c_str(), 1);
+    setenv("TAVOPLAYER_SERVICE_DIR", (serviceDir.empty() ? dir + "/svc" : serviceDir).c_str(), 1);
     setenv("TAVOPLAYER_PROP_tavoplayer_video_sink", "null", 1);  // our own stand-in only
     auto cleanUp = [&](int status) {
         gQuit = true;
-        kill(daemon, SIGTERM);
-        waitpid(daemon, nullptr, 0);
-        fs::remove_all(dir + "/svc");
-        std::error_code ec;
-        fs::remove(dir + "/tavoplayerd.log", ec);
-        fs::remove(dir, ec);  // keeps recordings made here
+        if (daemon > 0) {
+            kill(daemon, SIGTERM);
+            waitpid(daemon, nullptr, 0);
+            fs::remove_all(dir + "/svc");
+            std::error_code ec;
+            fs::remove(dir + "/tavoplayerd.log", ec);
+            fs::remove(dir, ec);  // keeps recordings made here
+        }
         std::exit(status);
     };
 
@@ -465,20 +506,43 @@ int main(int argc, char** argv) {
     sp<TavoPlayer::ICTavoPlayer> service =
         android::interface_cast<TavoPlayer::ICTavoPlayer>(binder);
     if (service == nullptr) {
-        std::fprintf(stderr, "tavoplay: tavoplayerd did not start (log: %s/tavoplayerd.log)\n",
-                     dir.c_str());
+        if (daemon > 0)
+            std::fprintf(stderr, "tavoplay: tavoplayerd did not start (log: %s/tavoplayerd.log)\n",
+                         dir.c_str());
+        else
+            std::fprintf(stderr, "tavoplay: no TavoPlayer service in %s\n", serviceDir.c_str());
         gQuit = true;
-        kill(daemon, SIGTERM);
-        waitpid(daemon, nullptr, 0);
+        if (daemon > 0) {
+            kill(daemon, SIGTERM);
+            waitpid(daemon, nullptr, 0);
+        }
         return 1;
     }
+    // A running service is not our child: its death comes as a death notice.
+    sp<DeathFlag> died = new DeathFlag();
+    if (daemon < 0)
+        binder->linkToDeath(died);
+    auto serviceGone = [&](std::string* how) {
+        int status = 0;
+        if (daemon < 0) {
+            *how = "its connection closed";
+            return died->dead.load();
+        }
+        if (waitpid(daemon, &status, WNOHANG) != daemon)
+            return false;
+        *how = (WIFSIGNALED(status) ? "killed by signal " + std::to_string(WTERMSIG(status))
+                                    : "exit status " + std::to_string(WEXITSTATUS(status))) +
+               "; its log is " + dir + "/tavoplayerd.log";
+        return true;
+    };
     sp<Viewer> viewer = new Viewer();
     service->registerClient(viewer);
     service->setSurface(android::Surface::create());
     // The answers are one-way callbacks: wait for each before going on.
     auto answered = [&](const std::atomic<int>& status) {
+        std::string how;
         for (int i = 0; i < 300 && status == -1; ++i) {
-            if (waitpid(daemon, nullptr, WNOHANG) == daemon)
+            if (serviceGone(&how))
                 break;
             std::this_thread::sleep_for(std::chrono::milliseconds(100));
         }
@@ -505,15 +569,10 @@ int main(int argc, char** argv) {
     bool recording = false;
     int captures = 0;
     while (!gQuit) {
-        int status = 0;
-        if (waitpid(daemon, &status, WNOHANG) == daemon) {
-            const std::string how = WIFSIGNALED(status)
-                                        ? "killed by signal " + std::to_string(WTERMSIG(status))
-                                        : "exit status " + std::to_string(WEXITSTATUS(status));
+        std::string how;
+        if (serviceGone(&how)) {
             // Its log stays for the reader.
-            std::fprintf(stderr,
-                         "\ntavoplay: the service died (%s; its log is %s/tavoplayerd.log)\n",
-                         how.c_str(), dir.c_str());
+            std::fprintf(stderr, "\ntavoplay: the service died (%s)\n", how.c_str());
             std::exit(1);
         }
         // A file does not come back once its packets stop: its end is the first

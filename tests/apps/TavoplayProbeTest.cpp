@@ -2,6 +2,7 @@
 // stream, and where the audio payload overrules a mislabelling PMT.
 #include <gtest/gtest.h>
 #include <sys/wait.h>
+#include <unistd.h>
 
 #include <cstdio>
 #include <filesystem>
@@ -104,6 +105,14 @@ TEST(TavoplayBadSource, EachGivesItsReasonAndStatus) {
         {"timeout 60 sh -c '" TAVO_BINARY_DIR "/apps/tavoplay/tavoplay --headless " + live +
              " & p=$!; sleep 5; kill -KILL $(cat /proc/$p/task/*/children); wait $p'",
          1, "tavoplay: the service died (killed by signal 9"},
+        // A running service played through --service is killed.
+        {"timeout 60 sh -c 'TAVOPLAYER_SERVICE_DIR=" + dir.string() +
+             "/svc TAVOPLAYER_PROP_tavoplayer_demux_source=file:" + live +
+             " TAVOPLAYER_PROP_tavoplayer_video_sink=null " TAVO_BINARY_DIR
+             "/apps/tavoplayerd/tavoplayerd 2>/dev/null & d=$!; sleep 1; (sleep 5; kill -KILL $d) "
+             "& " +
+             tavoplay + "--service " + dir.string() + "/svc " + live + "'",
+         1, "tavoplay: the service died (its connection closed)"},
     };
     for (const auto& c : cases) {
         if (c.command.find(streams) != std::string::npos &&
@@ -134,6 +143,31 @@ TEST(TavoplayProbe, ARealIsdbTbCaptureIn204BytePackets) {
     EXPECT_EQ(lastLine(out),
               "MTV://tuner/live?pcrPid=256;videoPid=273;audioPid=274;"
               "IsLATMAudio=1;isMPEG2Audio=0;subtitlePid=278;");
+}
+
+// With --service, tavoplay plays through a tavoplayerd that is already serving (as the
+// system one does on its tuner) and leaves it serving when the stream ends.
+TEST(TavoplayRunningService, PlaysThroughItAndLeavesItServing) {
+    const fs::path dir = fs::temp_directory_path() / ("tavo-running-" + std::to_string(getpid()));
+    fs::create_directories(dir);
+    const std::string ts = (dir / "live.ts").string();
+    std::string out;
+    ASSERT_EQ(
+        runCommand(std::string(TAVO_TSGEN_PATH) + " -o " + ts + " -d 8 --caption '1:Olá'", &out), 0)
+        << out;
+    const std::string svc = (dir / "svc").string();
+    const std::string script =
+        "TAVOPLAYER_SERVICE_DIR=" + svc + " TAVOPLAYER_PROP_tavoplayer_demux_source=file:" + ts +
+        " TAVOPLAYER_PROP_tavoplayer_video_sink=null TAVOPLAYER_PROP_tavoplayer_audio_sink=null " +
+        TAVO_BINARY_DIR "/apps/tavoplayerd/tavoplayerd 2>/dev/null & d=$!; sleep 1; " +
+        "timeout 60 " TAVO_BINARY_DIR "/apps/tavoplay/tavoplay --service " + svc + " " + ts +
+        "; s=$?; kill -0 $d && echo still serving; kill $d; wait $d; exit $s";
+    out.clear();
+    EXPECT_EQ(runCommand("sh -c '" + script + "'", &out), 0) << out;
+    EXPECT_NE(out.find("caption: Olá"), std::string::npos) << out;
+    EXPECT_NE(out.find("end of stream"), std::string::npos) << out;
+    EXPECT_NE(out.find("still serving"), std::string::npos) << out;
+    fs::remove_all(dir);
 }
 
 }  // namespace

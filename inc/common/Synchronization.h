@@ -7,10 +7,10 @@
 //
 // Threads: the TS parsers call setBasePCR; the renderers getPCR and resetPCR; the
 // controller setOffsetTime, pause, resume and resetPCR; the dump thread dump.
-// setBasePCR, getPCR and resetPCR hold mLock. PCR listeners are called from
-// setBasePCR with mLock held, so a listener must not call setBasePCR or getPCR.
-// pause, resume, setOffsetTime and dump take no lock, as designed; the renderers
-// tolerate that race.
+// setBasePCR, getPCR, resetPCR, pause, resume and dump hold mLock. PCR listeners are
+// called from setBasePCR with mLock held, so a listener must not call setBasePCR or
+// getPCR. setOffsetTime takes no lock: the controller sets the offsets before it starts
+// the parsers that read them.
 #pragma once
 
 #include <time.h>

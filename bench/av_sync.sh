@@ -19,6 +19,8 @@ set -euo pipefail
 BUILD=${BUILD:-build}
 DURATION=${DURATION:-70}
 HERE=$(cd "$(dirname "$0")" && pwd)
+# shellcheck source=bench/logging_service.sh
+. "$HERE/logging_service.sh"
 TSGEN=$BUILD/apps/tsgen/tsgen
 DAEMON=$BUILD/apps/tavoplayerd/tavoplayerd
 CTL=$BUILD/apps/tavoctl/tavoctl
@@ -50,21 +52,7 @@ python3 "$HERE/avsync.py" stream "$WORK/marks.ts"
 
 # 2. Play it in a service of its own.
 URI=$("$PLAY" --probe "$WORK/marks.ts" | tail -n 1)
-SVC=$WORK/svc
-mkdir -p "$SVC"
-TAVOPLAYER_SERVICE_DIR=$SVC \
-TAVOPLAYER_PROP_tavoplayer_demux_source="file:$(realpath "$WORK/marks.ts")" \
-TAVOPLAYER_PROP_tavoplayer_video_sink=null \
-TAVOPLAYER_PROP_tavoplayer_video_log="$WORK/video.log" \
-TAVOPLAYER_PROP_tavoplayer_audio_sink="wav:$WORK/audio.wav" \
-TAVOPLAYER_PROP_tavoplayer_audio_log="$WORK/audio.log" \
-TAVOPLAYER_PROP_tavoplayer_recordings_dir="$WORK/rec" \
-    "$DAEMON" --log-level warning 2>"$WORK/tavoplayerd.log" &
-DAEMON_PID=$!
-for _ in $(seq 50); do
-    "$CTL" --service-dir "$SVC" state >/dev/null 2>&1 && break
-    sleep 0.1
-done
+start_logging_service "file:$(realpath "$WORK/marks.ts")"
 # The file: source stops at the end of the file; the last seconds of sound drain.
 "$CTL" --service-dir "$SVC" "open 5 $URI" start "wait $((DURATION + 2))" stop close \
     >"$WORK/tavoctl.log" 2>&1 || { cat "$WORK/tavoctl.log" >&2; exit 1; }

@@ -17,6 +17,8 @@ BUILD=${BUILD:-build}
 MINUTES=${MINUTES:-10}
 LOOP_SECONDS=${LOOP_SECONDS:-30}
 HERE=$(cd "$(dirname "$0")" && pwd)
+# shellcheck source=bench/logging_service.sh
+. "$HERE/logging_service.sh"
 TSGEN=$BUILD/apps/tsgen/tsgen
 DAEMON=$BUILD/apps/tavoplayerd/tavoplayerd
 CTL=$BUILD/apps/tavoctl/tavoctl
@@ -45,21 +47,7 @@ SECONDS_TOTAL=$((MINUTES * 60))
 echo "load before: $(uptime)"
 "$TSGEN" -o "$WORK/loop.ts" -d "$LOOP_SECONDS" --sync-marks
 URI=$("$PLAY" --probe "$WORK/loop.ts" | tail -n 1)
-SVC=$WORK/svc
-mkdir -p "$SVC"
-TAVOPLAYER_SERVICE_DIR=$SVC \
-TAVOPLAYER_PROP_tavoplayer_demux_source="file:$(realpath "$WORK/loop.ts")?loop=1" \
-TAVOPLAYER_PROP_tavoplayer_video_sink=null \
-TAVOPLAYER_PROP_tavoplayer_video_log="$WORK/video.log" \
-TAVOPLAYER_PROP_tavoplayer_audio_sink="wav:$WORK/audio.wav" \
-TAVOPLAYER_PROP_tavoplayer_audio_log="$WORK/audio.log" \
-TAVOPLAYER_PROP_tavoplayer_recordings_dir="$WORK/rec" \
-    "$DAEMON" --log-level warning 2>"$WORK/tavoplayerd.log" &
-DAEMON_PID=$!
-for _ in $(seq 50); do
-    "$CTL" --service-dir "$SVC" state >/dev/null 2>&1 && break
-    sleep 0.1
-done
+start_logging_service "file:$(realpath "$WORK/loop.ts")?loop=1"
 # The client stays connected for the whole run: a client that goes away is a viewer
 # gone, and the service cleans up after it.
 "$CTL" --service-dir "$SVC" "open 5 $URI" start "wait $((SECONDS_TOTAL + 2))" stop close \

@@ -71,7 +71,7 @@ std::string RecPlayerService::recordingsDir() {
     std::string dir = propertyGetString(kRecordingsDirProperty, "");
     if (!dir.empty())
         return dir;
-    // XDG Base Directory Specification: user data under $XDG_DATA_HOME, which
+    // The XDG base directory convention: user data under $XDG_DATA_HOME, which
     // defaults to ~/.local/share.
     const char* xdg = getenv("XDG_DATA_HOME");
     if (xdg != nullptr && xdg[0] == '/')

@@ -1,0 +1,21 @@
+# Sourced by the measurement scripts: starts a tavoplayerd of their own on SOURCE (a
+# demux source) with the null video sink, the WAV audio sink and both presentation
+# logs in $WORK, and waits until it answers. Needs WORK, DAEMON and CTL; sets SVC
+# (its socket folder) and DAEMON_PID.
+start_logging_service() {
+    SVC=$WORK/svc
+    mkdir -p "$SVC"
+    TAVOPLAYER_SERVICE_DIR=$SVC \
+    TAVOPLAYER_PROP_tavoplayer_demux_source="$1" \
+    TAVOPLAYER_PROP_tavoplayer_video_sink=null \
+    TAVOPLAYER_PROP_tavoplayer_video_log="$WORK/video.log" \
+    TAVOPLAYER_PROP_tavoplayer_audio_sink="wav:$WORK/audio.wav" \
+    TAVOPLAYER_PROP_tavoplayer_audio_log="$WORK/audio.log" \
+    TAVOPLAYER_PROP_tavoplayer_recordings_dir="$WORK/rec" \
+        "$DAEMON" --log-level warning 2>"$WORK/tavoplayerd.log" &
+    DAEMON_PID=$!
+    for _ in $(seq 50); do
+        "$CTL" --service-dir "$SVC" state >/dev/null 2>&1 && break
+        sleep 0.1
+    done
+}

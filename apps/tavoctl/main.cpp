@@ -20,7 +20,6 @@
 #include <string>
 #include <vector>
 
-#include "PngWriter.h"
 #include "platform/binder/IServiceManager.h"
 #include "platform/binder/ProcessState.h"
 #include "platform/gui/Surface.h"
@@ -28,6 +27,7 @@
 #include "service/BnCTavoPlayerClient.h"
 #include "service/ICTavoPlayer.h"
 #include "tavoapps/CaptionText.h"
+#include "tavoapps/PngWriter.h"
 
 using android::sp;
 using android::String16;
@@ -83,7 +83,7 @@ public:
         std::string result = "not saved";
         if (!path.empty()) {
             result = flag != 0 ? "2-byte pixels are not written as PNG"
-                               : tavoctl::writeArgbPng(path, data, w, h, width, height);
+                               : tavoapps::writeArgbPng(path, data, w, h, width, height);
             if (result.empty())
                 result = "saved " + path;
         }

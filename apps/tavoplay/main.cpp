@@ -36,6 +36,7 @@
 #include "service/BnCTavoPlayerClient.h"
 #include "service/ICTavoPlayer.h"
 #include "tavoapps/CaptionText.h"
+#include "tavoapps/PngWriter.h"
 
 using android::sp;
 using tavoplay::AudioCoding;
@@ -101,8 +102,17 @@ public:
 
     void openUriComplete(int32_t s) override { openStatus = s; }
     void startComplete(int32_t s) override { startStatus = s; }
-    void onCaptureFrame(uint8_t*, int32_t w, int32_t h, int32_t) override {
-        line("captured a %dx%d frame", w, h);
+    // The captured picture, as the service shows it, goes to capture-N.png in the
+    // working folder.
+    void onCaptureFrame(uint8_t* pixels, int32_t w, int32_t h, int32_t flag) override {
+        const std::string path = "capture-" + std::to_string(++mCaptures) + ".png";
+        const std::string why = flag != 0 || pixels == nullptr
+                                    ? "not a 32-bit picture"
+                                    : tavoapps::writeArgbPng(path, pixels, w, h, w, h);
+        if (why.empty())
+            line("captured a %dx%d frame to %s", w, h, path.c_str());
+        else
+            line("capture not saved: %s", why.c_str());
     }
     void onSignalStatusChanged(int32_t, int32_t current) override {
         signal = current;
@@ -153,6 +163,7 @@ private:
     int mBuffering = 0;
     int mWidth = 0;
     int mHeight = 0;
+    std::atomic<int> mCaptures{0};
 };
 
 // Reads the start of the source into the probe. For '-', the bytes read are kept:

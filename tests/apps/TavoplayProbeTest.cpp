@@ -170,4 +170,31 @@ TEST(TavoplayRunningService, PlaysThroughItAndLeavesItServing) {
     fs::remove_all(dir);
 }
 
+// Keys from a terminal (script(1) gives tavoplay one): space pauses and resumes, c
+// saves the shown picture as a PNG, q quits before the stream's end with status 0.
+TEST(TavoplayKeys, PauseCaptureAndQuit) {
+    const fs::path dir = fs::temp_directory_path() / ("tavo-keys-" + std::to_string(getpid()));
+    fs::create_directories(dir);
+    std::string out;
+    ASSERT_EQ(
+        runCommand(std::string(TAVO_TSGEN_PATH) + " -o " + (dir / "live.ts").string() + " -d 30",
+                   &out),
+        0)
+        << out;
+    const std::string keys =
+        "(sleep 7; printf \" \"; sleep 1; printf \" \"; sleep 1; printf c; "
+        "sleep 2; printf q)";
+    EXPECT_EQ(runCommand("cd " + dir.string() + " && " + keys +
+                             " | timeout 60 script -qfec '" TAVO_BINARY_DIR
+                             "/apps/tavoplay/tavoplay --headless live.ts' /dev/null",
+                         &out),
+              0)
+        << out;
+    EXPECT_NE(out.find("[paused]"), std::string::npos) << out;
+    EXPECT_NE(out.find("captured a 1920x1080 frame to capture-1.png"), std::string::npos) << out;
+    EXPECT_GT(fs::file_size(dir / "capture-1.png"), 10000u);
+    EXPECT_EQ(out.find("end of stream"), std::string::npos) << out;
+    fs::remove_all(dir);
+}
+
 }  // namespace

@@ -1,4 +1,4 @@
-#include "PngWriter.h"
+#include "tavoapps/PngWriter.h"
 
 #include <cstdio>
 #include <cstring>
@@ -10,7 +10,7 @@ extern "C" {
 #include <libswscale/swscale.h>
 }
 
-namespace tavoctl {
+namespace tavoapps {
 
 namespace {
 
@@ -72,4 +72,4 @@ std::string writeArgbPng(const std::string& path, const uint8_t* pixels, int src
     return written && closed ? "" : "cannot write " + path;
 }
 
-}  // namespace tavoctl
+}  // namespace tavoapps

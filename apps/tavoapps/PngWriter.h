@@ -4,7 +4,7 @@
 #include <cstdint>
 #include <string>
 
-namespace tavoctl {
+namespace tavoapps {
 
 // `pixels` holds width x height 32-bit pixels 0xAARRGGBB in host order, as the
 // service's frame capture makes them, srcWidth x srcHeight; the PNG is scaled to
@@ -13,4 +13,4 @@ namespace tavoctl {
 std::string writeArgbPng(const std::string& path, const uint8_t* pixels, int srcWidth,
                          int srcHeight, int width, int height);
 
-}  // namespace tavoctl
+}  // namespace tavoapps

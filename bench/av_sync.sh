@@ -21,13 +21,7 @@ DURATION=${DURATION:-70}
 HERE=$(cd "$(dirname "$0")" && pwd)
 # shellcheck source=bench/logging_service.sh
 . "$HERE/logging_service.sh"
-TSGEN=$BUILD/apps/tsgen/tsgen
-DAEMON=$BUILD/apps/tavoplayerd/tavoplayerd
-CTL=$BUILD/apps/tavoctl/tavoctl
-PLAY=$BUILD/apps/tavoplay/tavoplay
-for tool in "$TSGEN" "$DAEMON" "$CTL" "$PLAY"; do
-    [ -x "$tool" ] || { echo "av_sync: $tool is missing; build first (README)" >&2; exit 2; }
-done
+find_programs av_sync
 
 WORK=$(mktemp -d /tmp/av_sync-XXXXXX)
 DAEMON_PID=

@@ -19,13 +19,7 @@ LOOP_SECONDS=${LOOP_SECONDS:-30}
 HERE=$(cd "$(dirname "$0")" && pwd)
 # shellcheck source=bench/logging_service.sh
 . "$HERE/logging_service.sh"
-TSGEN=$BUILD/apps/tsgen/tsgen
-DAEMON=$BUILD/apps/tavoplayerd/tavoplayerd
-CTL=$BUILD/apps/tavoctl/tavoctl
-PLAY=$BUILD/apps/tavoplay/tavoplay
-for tool in "$TSGEN" "$DAEMON" "$CTL" "$PLAY"; do
-    [ -x "$tool" ] || { echo "soak: $tool is missing; build first (README)" >&2; exit 2; }
-done
+find_programs soak
 
 WORK=$(mktemp -d /tmp/soak-XXXXXX)
 DAEMON_PID=

@@ -107,7 +107,12 @@ unsigned int RingBuffer::configureImpl(const char* function, std::string name, u
         close(fd);
         return 1;
     }
-    void* first = mmap(mBuffer, mSize, PROT_READ | PROT_WRITE, MAP_SHARED | MAP_FIXED, fd, 0);
+    // The first view is populated now, so the ring's memory is taken once at configure
+    // instead of page by page while it fills (a 6 MiB ring at a few Mbit/s takes minutes
+    // to be touched throughout), and the writers meet no first-touch faults. The second
+    // view only serves records that run past the end and is left to fault in.
+    void* first =
+        mmap(mBuffer, mSize, PROT_READ | PROT_WRITE, MAP_SHARED | MAP_FIXED | MAP_POPULATE, fd, 0);
     if (first != mBuffer) {
         const int err = errno;
         TAVO_LOGE("%s: mmap failed 2 fd = %d. error code: (%d : %s)\n", function, fd, err,

@@ -89,8 +89,7 @@ print(f"rss growth after the first minute: {growth:.2f} MiB (at {base[0]:.0f} s 
       f"{'met' if growth <= 1.0 else 'missed'}")
 print(f"  of which anonymous {(split[-1][0] - b[0]) / 1024:+.2f} MiB, file-backed "
       f"{(split[-1][1] - b[1]) / 1024:+.2f} MiB, the rings' shared memory "
-      f"{(split[-1][2] - b[2]) / 1024:+.2f} MiB (a ring's pages become resident as its "
-      f"writer first goes round it)")
+      f"{(split[-1][2] - b[2]) / 1024:+.2f} MiB")
 xs = [(m - t0) / 1e9 for m, _ in marks]
 ys = [o for _, o in marks]
 first = [o for x, o in zip(xs, ys) if x < 60]

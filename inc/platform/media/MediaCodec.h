@@ -73,6 +73,8 @@ public:
     static constexpr size_t kVideoInputBuffers = 4;
     static constexpr size_t kVideoInputCapacity = 2 * 1024 * 1024;
     static constexpr size_t kVideoOutputBuffers = 10;
+    // Picture blocks kept for reuse beyond those of the output buffers.
+    static constexpr size_t kVideoSpareBlocks = 2;
     static constexpr size_t kAudioInputBuffers = 8;
     static constexpr size_t kAudioInputCapacity = 16 * 1024;
     static constexpr size_t kAudioOutputBuffers = 8;

@@ -1,7 +1,8 @@
 // SinkSurface: the one implementation of Surface. It crops each picture the codec
-// shows to the window's crop rectangle, packs it as NV12 into a picture of its own
-// (pooled, so that steady playback allocates nothing), keeps it as the most
-// recently shown picture for capture and hands it to its sink.
+// shows to the window's crop rectangle and either references the codec's planes
+// (showSharedPicture: no copy) or packs them as NV12 into a picture of its own
+// (showPicture; pooled, so that steady playback allocates nothing), keeps it as the
+// most recently shown picture for capture and hands it to its sink.
 //
 // Capture: dequeueBuffer gives out a buffer that holds a reference to the most
 // recently shown picture (the picture is never written again while referenced, so
@@ -44,6 +45,8 @@ public:
     const char* sinkName() const { return mSink != nullptr ? mSink->name() : ""; }
 
     int showPicture(const SurfacePicture& picture) override;
+    int showSharedPicture(const SurfacePicture& picture,
+                          std::shared_ptr<const void> storage) override;
     int setCrop(const android_native_rect_t* crop) override;
     int dequeueBuffer(ANativeWindowBuffer** buffer) override;
     int queueBuffer(ANativeWindowBuffer* buffer, int fenceFd) override;
@@ -56,6 +59,10 @@ public:
 private:
     class Buffer;
     class PicturePool;
+
+    // Both ways of showing: a copy into a pooled picture (storage null) or a
+    // reference to the shared planes.
+    int show(const SurfacePicture& picture, std::shared_ptr<const void> storage);
 
     mutable std::mutex mLock;
     bool mHasCrop = false;

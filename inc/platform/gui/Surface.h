@@ -5,13 +5,14 @@
 // capture dequeues the most recently shown picture from.
 //
 // This header is the contract between the codec and capture on one side and the
-// surface on the other: the codec uses Surface::showPicture and
-// native_window_set_crop; the capture dequeues a buffer, maps it with
+// surface on the other: the codec uses Surface::showSharedPicture (or
+// showPicture) and native_window_set_crop; the capture dequeues a buffer, maps it with
 // GraphicBufferMapper::lockYCbCr and queues it back.
 #pragma once
 
 #include <cstddef>
 #include <cstdint>
+#include <memory>
 
 #include <utils/RefBase.h>
 #include <utils/StrongPointer.h>
@@ -32,7 +33,7 @@ struct SurfacePicture {
     int32_t yStride;
     const uint8_t* uv;
     int32_t uvStride;
-    int32_t width;   // coded size; the window's crop rectangle selects what is shown
+    int32_t width;  // coded size; the window's crop rectangle selects what is shown
     int32_t height;
     int64_t ptsUs;
     bool interlaced;
@@ -42,7 +43,7 @@ struct SurfacePicture {
 struct Rect {
     int32_t left;
     int32_t top;
-    int32_t right;  // exclusive
+    int32_t right;   // exclusive
     int32_t bottom;  // exclusive
 };
 
@@ -104,6 +105,14 @@ public:
     // Shows `picture` now (the codec calls this when a buffer is rendered), copying
     // what the sink needs before returning. 0 or a negative status.
     virtual int showPicture(const SurfacePicture& picture) = 0;
+    // Shows `picture` whose planes stay valid and unchanged for as long as anyone
+    // holds `storage`: a surface may keep a reference instead of copying. This
+    // default copies, as showPicture does.
+    virtual int showSharedPicture(const SurfacePicture& picture,
+                                  std::shared_ptr<const void> storage) {
+        (void)storage;
+        return showPicture(picture);
+    }
 };
 
 }  // namespace android

@@ -100,9 +100,9 @@ bool Deinterlacer::push(const SinkPicture& picture) {
     in->format = AV_PIX_FMT_NV12;
     in->pts = static_cast<int64_t>(picture.pts90k);
     in->data[0] = const_cast<uint8_t*>(picture.y());
-    in->linesize[0] = picture.width;
+    in->linesize[0] = picture.lumaStride();
     in->data[1] = const_cast<uint8_t*>(picture.uv());
-    in->linesize[1] = picture.width;
+    in->linesize[1] = picture.chromaStride();
     in->interlaced_frame = 1;
     in->top_field_first = picture.topFieldFirst ? 1 : 0;
     // The frame holds no buffer references, so the source copies the planes.

@@ -66,8 +66,8 @@ public:
                 return;
         }
         if (upload(SDL_PIXELFORMAT_NV12, picture.width, picture.height) &&
-            SDL_UpdateNVTexture(mTexture, nullptr, picture.y(), picture.width, picture.uv(),
-                                picture.width) == 0) {
+            SDL_UpdateNVTexture(mTexture, nullptr, picture.y(), picture.lumaStride(), picture.uv(),
+                                picture.chromaStride()) == 0) {
             draw(picture.pts90k, picture.width, picture.height);
         }
     }

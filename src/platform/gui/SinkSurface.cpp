@@ -63,8 +63,10 @@ public:
         }
         if (mLocked)
             return -EBUSY;
-        if (bounds.left == 0 && bounds.top == 0 && bounds.right == p.width &&
-            bounds.bottom == p.height) {
+        // A whole packed picture is mapped in place; anything else (a part, or
+        // planes shared with the codec, rows apart by its stride) is packed first.
+        if (p.storage == nullptr && bounds.left == 0 && bounds.top == 0 &&
+            bounds.right == p.width && bounds.bottom == p.height) {
             mapPlanes(p.y(), p.uv(), static_cast<size_t>(p.width), ycbcr);
         } else {
             packSubRectangle(bounds, ycbcr);
@@ -91,8 +93,8 @@ private:
         ycbcr->chroma_step = 2;
     }
 
-    // A part of the picture is copied out, packed like a whole one, so that a
-    // reader may take the planes as contiguous rows of the rectangle's width.
+    // The rectangle is copied out, packed like a whole picture, so that a reader
+    // may take the planes as contiguous rows of the rectangle's width.
     void packSubRectangle(const Rect& bounds, android_ycbcr* ycbcr) {
         const SinkPicture& p = *mPicture;
         const int32_t left = bounds.left & ~1;
@@ -102,12 +104,14 @@ private:
         const size_t chromaWidth = (width + 1) & ~size_t{1};
         const size_t chromaRows = (height + 1) / 2;
         mScratch.assign(width * height + chromaWidth * chromaRows, 0);
+        const size_t yStride = static_cast<size_t>(p.lumaStride());
+        const size_t uvStride = static_cast<size_t>(p.chromaStride());
         for (size_t row = 0; row < height; ++row)
-            memcpy(&mScratch[row * width], p.y() + (top + row) * p.width + left, width);
+            memcpy(&mScratch[row * width], p.y() + (top + row) * yStride + left, width);
         uint8_t* uv = mScratch.data() + width * height;
         const size_t chromaCopy = std::min(chromaWidth, static_cast<size_t>(p.width - left));
         for (size_t row = 0; row < chromaRows; ++row)
-            memcpy(uv + row * chromaWidth, p.uv() + (top / 2 + row) * p.width + left, chromaCopy);
+            memcpy(uv + row * chromaWidth, p.uv() + (top / 2 + row) * uvStride + left, chromaCopy);
         mapPlanes(mScratch.data(), uv, width, ycbcr);
         ycbcr->cstride = chromaWidth;
     }
@@ -131,6 +135,15 @@ SinkSurface::~SinkSurface() {
 }
 
 int SinkSurface::showPicture(const SurfacePicture& picture) {
+    return show(picture, nullptr);
+}
+
+int SinkSurface::showSharedPicture(const SurfacePicture& picture,
+                                   std::shared_ptr<const void> storage) {
+    return show(picture, std::move(storage));
+}
+
+int SinkSurface::show(const SurfacePicture& picture, std::shared_ptr<const void> storage) {
     if (mSink == nullptr)
         return -ENODEV;
     if (picture.y == nullptr || picture.uv == nullptr || picture.width < 2 || picture.height < 2 ||
@@ -161,7 +174,8 @@ int SinkSurface::showPicture(const SurfacePicture& picture) {
         height = picture.height & ~1;
     }
 
-    std::shared_ptr<SinkPicture> shown = mPool->take();
+    std::shared_ptr<SinkPicture> shown =
+        storage != nullptr ? std::make_shared<SinkPicture>() : mPool->take();
     shown->width = width;
     shown->height = height;
     shown->ptsUs = picture.ptsUs;
@@ -169,16 +183,28 @@ int SinkSurface::showPicture(const SurfacePicture& picture) {
     shown->pts90k = TavoPlayer::mask33(static_cast<uint64_t>(picture.ptsUs * 9 / 100));
     shown->interlaced = picture.interlaced;
     shown->topFieldFirst = picture.topFieldFirst;
-    shown->data.resize(shown->byteSize());
-    uint8_t* y = shown->data.data();
-    for (int32_t row = 0; row < height; ++row) {
-        memcpy(y + static_cast<size_t>(row) * width,
-               picture.y + static_cast<size_t>(top + row) * picture.yStride + left, width);
-    }
-    uint8_t* uv = y + static_cast<size_t>(width) * height;
-    for (int32_t row = 0; row < height / 2; ++row) {
-        memcpy(uv + static_cast<size_t>(row) * width,
-               picture.uv + static_cast<size_t>(top / 2 + row) * picture.uvStride + left, width);
+    const uint8_t* cropY = picture.y + static_cast<size_t>(top) * picture.yStride + left;
+    const uint8_t* cropUV = picture.uv + static_cast<size_t>(top / 2) * picture.uvStride + left;
+    if (storage != nullptr) {
+        // The planes stay unchanged while referenced: no copy, the crop is where the
+        // picture starts and its rows are the codec's.
+        shown->storage = std::move(storage);
+        shown->sharedY = cropY;
+        shown->sharedUV = cropUV;
+        shown->yStride = picture.yStride;
+        shown->uvStride = picture.uvStride;
+    } else {
+        shown->data.resize(shown->byteSize());
+        uint8_t* y = shown->data.data();
+        for (int32_t row = 0; row < height; ++row) {
+            memcpy(y + static_cast<size_t>(row) * width,
+                   cropY + static_cast<size_t>(row) * picture.yStride, width);
+        }
+        uint8_t* uv = y + static_cast<size_t>(width) * height;
+        for (int32_t row = 0; row < height / 2; ++row) {
+            memcpy(uv + static_cast<size_t>(row) * width,
+                   cropUV + static_cast<size_t>(row) * picture.uvStride, width);
+        }
     }
 
     std::shared_ptr<const SinkPicture> published = std::move(shown);

@@ -39,11 +39,18 @@ bool Y4mVideoSink::toPlanar(const SinkPicture& picture) {
     uint8_t* planes[3] = {mPlanar.data(), mPlanar.data() + lumaSize,
                           mPlanar.data() + lumaSize + lumaSize / 4};
     if (picture.width == mWidth && picture.height == mHeight) {
-        memcpy(planes[0], picture.y(), lumaSize);
-        const uint8_t* uv = picture.uv();
-        for (size_t i = 0; i < lumaSize / 4; ++i) {
-            planes[1][i] = uv[2 * i];
-            planes[2][i] = uv[2 * i + 1];
+        const size_t width = static_cast<size_t>(mWidth);
+        const size_t chromaWidth = width / 2;
+        for (int32_t row = 0; row < mHeight; ++row)
+            memcpy(planes[0] + row * width, picture.y() + row * picture.lumaStride(), width);
+        for (int32_t row = 0; row < mHeight / 2; ++row) {
+            const uint8_t* uv = picture.uv() + row * picture.chromaStride();
+            uint8_t* cb = planes[1] + row * chromaWidth;
+            uint8_t* cr = planes[2] + row * chromaWidth;
+            for (size_t i = 0; i < chromaWidth; ++i) {
+                cb[i] = uv[2 * i];
+                cr[i] = uv[2 * i + 1];
+            }
         }
         return true;
     }
@@ -53,7 +60,7 @@ bool Y4mVideoSink::toPlanar(const SinkPicture& picture) {
     if (mScaler == nullptr)
         return false;
     const uint8_t* source[2] = {picture.y(), picture.uv()};
-    const int sourceStrides[2] = {picture.width, picture.width};
+    const int sourceStrides[2] = {picture.lumaStride(), picture.chromaStride()};
     const int strides[3] = {mWidth, mWidth / 2, mWidth / 2};
     return sws_scale(mScaler, source, sourceStrides, 0, picture.height, planes, strides) == mHeight;
 }

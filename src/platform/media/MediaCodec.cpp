@@ -88,8 +88,13 @@ MediaCodec::MediaCodec(const sp<ALooper>& looper, Kind kind, const char* name)
     for (InputSlot& slot : mInputs)
         slot.buffer = new MediaCodecBuffer(inputCapacity, AV_INPUT_BUFFER_PADDING_SIZE);
     mOutputs.resize(outputs);
+    // Pictures may be shared with the surface after their buffer is refilled; the
+    // pool takes their bytes back for the next refill. Two spare blocks cover the
+    // surface's last picture and one being captured or presented.
+    const std::shared_ptr<ByteBlockPool> pool =
+        video ? std::make_shared<ByteBlockPool>(kVideoSpareBlocks) : nullptr;
     for (OutputSlot& slot : mOutputs)
-        slot.buffer = new MediaCodecBuffer(outputCapacity, 0);
+        slot.buffer = new MediaCodecBuffer(outputCapacity, 0, pool);
     mQueuedInputs.reserve(inputs);
     mReadyOutputs.reserve(outputs);
 }
@@ -317,6 +322,7 @@ status_t MediaCodec::getOutputFormat(sp<AMessage>* format) const {
 status_t MediaCodec::renderOutputBufferAndRelease(size_t index) {
     sp<Surface> surface;
     SurfacePicture picture{};
+    std::shared_ptr<const void> storage;
     {
         Mutex::Autolock lock(mLock);
         if (mState != State::Started || index >= mOutputs.size() ||
@@ -324,12 +330,15 @@ status_t MediaCodec::renderOutputBufferAndRelease(size_t index) {
             return BAD_VALUE;
         surface = mSurface;
         picture = mOutputs[index].picture;
+        if (surface != nullptr && mKind == Kind::Avc)
+            storage = mOutputs[index].buffer->share();
     }
     status_t result = OK;
-    // The buffer stays the client's while the surface copies from it, so the
-    // decoding loop cannot refill it meanwhile.
+    // The surface keeps the picture's bytes instead of copying them; the decoding
+    // loop refills this buffer into other bytes while they are shared. (The buffer
+    // also stays the client's until the surface returns, for a surface that copies.)
     if (surface != nullptr && mKind == Kind::Avc)
-        result = surface->showPicture(picture);
+        result = surface->showSharedPicture(picture, std::move(storage));
     Mutex::Autolock lock(mLock);
     if (mState == State::Started && mOutputs[index].owner == Owner::Client) {
         mOutputs[index].owner = Owner::Codec;
@@ -468,12 +477,17 @@ bool MediaCodec::placeFrame() {
                 mDecoder->dropFrame();
                 return false;
             }
+            // A free buffer whose bytes nobody shares is refilled in place; one
+            // whose bytes a surface still shows would take a new block.
             bool found = false;
             for (size_t i = 0; i < mOutputs.size(); ++i) {
-                if (mOutputs[i].owner == Owner::Codec) {
+                if (mOutputs[i].owner != Owner::Codec)
+                    continue;
+                if (!found || !mOutputs[i].buffer->shared()) {
                     index = i;
                     found = true;
-                    break;
+                    if (!mOutputs[i].buffer->shared())
+                        break;
                 }
             }
             if (found)

@@ -169,6 +169,94 @@ TEST_F(CaptureBufferTest, MapsTheLastPictureAsNV12AndKeepsItWhileDequeued) {
     EXPECT_EQ(mSurface->queueBuffer(buffer, -1), 0);
 }
 
+// Pictures shown with shared planes (the codec's output buffers): the surface keeps
+// a reference instead of a copy, every reader honours the rows' stride and the
+// crop, and the planes are let go once nothing shows or captures them.
+class SharedPictureTest : public testing::Test {
+protected:
+    static constexpr android_native_rect_t kCrop{4, 2, 68, 50};  // 64 x 48 at (4, 2)
+
+    // A padded picture whose planes live as long as the returned reference.
+    static std::shared_ptr<const TestPicture> makePicture(int seed, int64_t ptsUs = 0) {
+        return std::make_shared<const TestPicture>(80, 64, seed, ptsUs);
+    }
+    static int show(Surface& surface, const std::shared_ptr<const TestPicture>& picture) {
+        return surface.showSharedPicture(picture->picture(), picture);
+    }
+    static void expectCropOf(const TestPicture& picture, const uint8_t* y, size_t yStride,
+                             const uint8_t* uv, size_t uvStride) {
+        for (int row = 0; row < 48; ++row) {
+            for (int col = 0; col < 64; ++col)
+                ASSERT_EQ(y[row * yStride + col], picture.lumaAt(row + 2, col + 4)) << row;
+        }
+        for (int row = 0; row < 24; ++row) {
+            for (int byte = 0; byte < 64; ++byte)
+                ASSERT_EQ(uv[row * uvStride + byte], picture.chromaAt(row + 1, byte + 4)) << row;
+        }
+    }
+};
+
+TEST_F(SharedPictureTest, KeepsAReferenceToTheCropAndCapturesItPacked) {
+    sp<SinkSurface> surface = createSurface("null");
+    ASSERT_NE(surface, nullptr);
+    ASSERT_EQ(native_window_set_crop(surface.get(), &kCrop), 0);
+    std::shared_ptr<const TestPicture> first = makePicture(1);
+    const std::weak_ptr<const TestPicture> firstAlive = first;
+    ASSERT_EQ(show(*surface, first), 0);
+
+    std::shared_ptr<const SinkPicture> last = surface->lastPicture();
+    ASSERT_NE(last, nullptr);
+    EXPECT_EQ(last->width, 64);
+    EXPECT_EQ(last->height, 48);
+    // No copy: the picture starts at the crop inside the shared planes.
+    EXPECT_EQ(last->y(), first->y.data() + 2 * first->stride + 4);
+    EXPECT_EQ(last->uv(), first->uv.data() + 1 * first->stride + 4);
+    EXPECT_EQ(last->lumaStride(), first->stride);
+    expectCropOf(*first, last->y(), last->lumaStride(), last->uv(), last->chromaStride());
+    last.reset();
+
+    ANativeWindowBuffer* buffer = nullptr;
+    ASSERT_EQ(surface->dequeueBuffer(&buffer), 0);
+    first.reset();
+    // Shown later, while the capture holds the first picture.
+    ASSERT_EQ(show(*surface, makePicture(2)), 0);
+    EXPECT_FALSE(firstAlive.expired());
+
+    // The capture reads packed rows at the picture's width, chroma straight after luma.
+    android_ycbcr ycbcr{};
+    GraphicBufferMapper& mapper = GraphicBufferMapper::get();
+    ASSERT_EQ(mapper.lockYCbCr(buffer, 3, Rect{0, 0, 64, 48}, &ycbcr), 0);
+    EXPECT_EQ(ycbcr.ystride, 64u);
+    EXPECT_EQ(ycbcr.cstride, 64u);
+    const auto* y = static_cast<const uint8_t*>(ycbcr.y);
+    const auto* cb = static_cast<const uint8_t*>(ycbcr.cb);
+    EXPECT_EQ(cb, y + 64 * 48);
+    EXPECT_EQ(static_cast<const uint8_t*>(ycbcr.cr), cb + 1);
+    expectCropOf(*firstAlive.lock(), y, 64, cb, 64);
+    EXPECT_EQ(mapper.unlock(buffer), 0);
+    EXPECT_EQ(surface->queueBuffer(buffer, -1), 0);
+
+    // Neither shown nor captured any more: the planes are let go.
+    EXPECT_TRUE(firstAlive.expired());
+}
+
+TEST_F(SharedPictureTest, Y4mSinkWritesTheCropOfSharedPlanes) {
+    const std::string path = tempPath("shared.y4m");
+    std::shared_ptr<const TestPicture> picture = makePicture(3);
+    {
+        sp<SinkSurface> surface = createSurface("y4m:" + path);
+        ASSERT_NE(surface, nullptr);
+        ASSERT_EQ(native_window_set_crop(surface.get(), &kCrop), 0);
+        ASSERT_EQ(show(*surface, picture), 0);
+    }
+    const std::string frame =
+        runCommand("ffmpeg -v error -i '" + path + "' -frames:v 1 -f rawvideo -pix_fmt nv12 -");
+    unlink(path.c_str());
+    ASSERT_EQ(frame.size(), 64u * 48u * 3 / 2);
+    const auto* y = reinterpret_cast<const uint8_t*>(frame.data());
+    expectCropOf(*picture, y, 64, y + 64 * 48, 64);
+}
+
 TEST(Y4mSinkTest, FFprobeReadsEveryPictureAtTheFirstPicturesSize) {
     const std::string path = tempPath("out.y4m");
     {

@@ -130,14 +130,16 @@ TEST_F(MP4ControllerFileTest, PauseStopsTheTimeAndResumeAndSeekMoveIt) {
 
 struct BadPathCase {
     const char* name;
-    std::function<std::map<std::string, std::string>(const MediaTestFiles&)> config;
+    std::string (MediaTestFiles::*path)() const;  // null: no path key at all
 };
 
 class MP4ControllerBadPathTest : public MP4ControllerFileTest,
                                  public ::testing::WithParamInterface<BadPathCase> {};
 
 TEST_P(MP4ControllerBadPathTest, ConfigureAcceptsAndStartEndsInErrorOne) {
-    std::map<std::string, std::string> config = GetParam().config(*sFiles);
+    std::map<std::string, std::string> config;
+    if (GetParam().path != nullptr)
+        config["path"] = (sFiles->*GetParam().path)();
     EXPECT_EQ(mController->configure(config), 0u);
     EXPECT_EQ(config.count("path"), 1u) << "looked up with the map's subscript";
     EXPECT_EQ(mController->start(), 0u);
@@ -146,19 +148,11 @@ TEST_P(MP4ControllerBadPathTest, ConfigureAcceptsAndStartEndsInErrorOne) {
     EXPECT_TRUE(mListeners["frame"].empty());
 }
 
-INSTANTIATE_TEST_SUITE_P(
-    Paths, MP4ControllerBadPathTest,
-    ::testing::Values(
-        BadPathCase{"Missing",
-                    [](auto& f) {
-                        return std::map<std::string, std::string>{{"path", f.missing()}};
-                    }},
-        BadPathCase{"NoPathKey", [](auto&) { return std::map<std::string, std::string>{}; }},
-        BadPathCase{"NotMedia",
-                    [](auto& f) {
-                        return std::map<std::string, std::string>{{"path", f.notMedia()}};
-                    }}),
-    [](const auto& info) { return std::string(info.param.name); });
+INSTANTIATE_TEST_SUITE_P(Paths, MP4ControllerBadPathTest,
+                         ::testing::Values(BadPathCase{"Missing", &MediaTestFiles::missing},
+                                           BadPathCase{"NoPathKey", nullptr},
+                                           BadPathCase{"NotMedia", &MediaTestFiles::notMedia}),
+                         [](const auto& info) { return std::string(info.param.name); });
 
 // A media player that plays nothing: it records the calls made to it and reports the
 // position it is given.

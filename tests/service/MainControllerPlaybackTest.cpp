@@ -272,12 +272,10 @@ TEST_F(LivePlayback, TimeStampsWrappingAt2Pow33KeepThePicturesComing) {
 
 // AAC whose PMT names the other transport (LATM as ADTS and the reverse), played as the
 // PMT says: the extractor finds the real one and the sound still reaches the output.
-class LiveMislabelledAudio
-    : public LivePlayback,
-      public testing::WithParamInterface<std::pair<std::string, std::string>> {};
+class LiveMislabelledAudio : public LiveCarriage {};
 
 TEST_P(LiveMislabelledAudio, StillPlays) {
-    play("-d 7 " + GetParam().first, {{"IsLATMAudio", GetParam().second}});
+    play(std::string("-d 7 ") + GetParam().tsgenOptions, GetParam().config);
     sleepUntil(7);
     mController->stop();
     EXPECT_GT(fs::file_size(wavPath()), 2u * 48000 * 4) << eventLog();
@@ -285,9 +283,9 @@ TEST_P(LiveMislabelledAudio, StillPlays) {
 
 INSTANTIATE_TEST_SUITE_P(
     Tsgen, LiveMislabelledAudio,
-    testing::Values(std::make_pair(std::string("--latm-as-adts"), std::string("0")),
-                    std::make_pair(std::string("--audio adts --adts-as-latm"), std::string("1"))),
-    [](const auto& info) { return std::string(info.index == 0 ? "LatmAsAdts" : "AdtsAsLatm"); });
+    testing::Values(Carriage{"LatmAsAdts", "--latm-as-adts", {{"IsLATMAudio", "0"}}},
+                    Carriage{"AdtsAsLatm", "--audio adts --adts-as-latm", {{"IsLATMAudio", "1"}}}),
+    [](const testing::TestParamInfo<Carriage>& info) { return std::string(info.param.name); });
 
 TEST_F(LivePlayback, EveryPipelineThreadIsNamedAndNoneOutlivesStop) {
     const std::vector<std::string> before = threadNames();

@@ -151,7 +151,6 @@ TEST_F(ServiceSession, AClientThatDiesMidPlaybackLeavesTheServiceReadyForTheNext
         << next;
     // The first line is the state the dead client left: Closed.
     EXPECT_NE(next.find("state 1 Closed"), std::string::npos) << next;
-    EXPECT_NE(daemonLog().find("binderDied"), std::string::npos) << daemonLog();
 }
 
 using SilentClient = TavoPlayer::test::NullPlayerClient;
@@ -198,7 +197,7 @@ TEST_F(ServiceSession, AClientThatDiesDuringOpenLeavesTheServiceClosedAndReady) 
 }
 
 // Datagrams that break the frame rules of docs/protocol.md, each on a connection of
-// its own: the service hangs that connection up with a log line and goes on serving.
+// its own: the service hangs that connection up and goes on serving.
 // The first row, a well-formed getState, shows that the others differ by their fault.
 TEST_F(ServiceSession, MalformedFramesHangUpTheirConnectionOnly) {
     android::Parcel body;
@@ -252,12 +251,6 @@ TEST_F(ServiceSession, MalformedFramesHangUpTheirConnectionOnly) {
     }
     std::string out;
     EXPECT_EQ(tavoctl("state", &out), 0) << out;
-    size_t logged = 0;
-    const std::string log = daemonLog();
-    for (size_t at = log.find("malformed frame"); at != std::string::npos;
-         at = log.find("malformed frame", at + 1))
-        ++logged;
-    EXPECT_EQ(logged, 5u) << log;
 }
 
 // A source that is not a transport stream: the service plays it as a broadcast

@@ -10,6 +10,7 @@
 #include <string>
 
 #include "support/RunCommand.h"
+#include "support/ScopedEnv.h"
 
 namespace {
 
@@ -25,8 +26,6 @@ std::string lastLine(const std::string& text) {
 const std::string kTavoplay = TAVO_BINARY_DIR "/apps/tavoplay/tavoplay --probe ";
 
 TEST(TavoplayProbe, FindsEachProgrammesPidsAndTrustsTheAudioPayload) {
-    const fs::path dir = fs::temp_directory_path() / ("tavo-probe-" + std::to_string(getpid()));
-    fs::create_directories(dir);
     const struct {
         const char* tsgenOptions;
         const char* uri;
@@ -44,22 +43,14 @@ TEST(TavoplayProbe, FindsEachProgrammesPidsAndTrustsTheAudioPayload) {
         {"--audio adts --audio-stream-type 0x11",
          "pcrPid=273;videoPid=273;audioPid=274;IsLATMAudio=0;isMPEG2Audio=0;subtitlePid=304;"},
     };
-    int index = 0;
     for (const auto& c : cases) {
         SCOPED_TRACE(c.tsgenOptions);
-        const std::string file = (dir / ("s" + std::to_string(index++) + ".ts")).string();
+        const std::string& file = TavoPlayer::test::tsgenStream(1, c.tsgenOptions);
+        ASSERT_FALSE(file.empty());
         std::string out;
-        ASSERT_EQ(
-            runCommand(std::string(TAVO_TSGEN_PATH) + " -o " + file + " -d 1 " + c.tsgenOptions,
-                       &out),
-            0)
-            << out;
-        out.clear();
         EXPECT_EQ(runCommand(kTavoplay + file, &out), 0) << out;
-        const std::string expected = std::string("MTV://tuner/live?") + c.uri;
-        EXPECT_EQ(lastLine(out), expected);
+        EXPECT_EQ(lastLine(out), std::string("MTV://tuner/live?") + c.uri);
     }
-    fs::remove_all(dir);
 }
 
 // Each source that cannot be played, or stops being playable, ends tavoplay with
@@ -75,10 +66,8 @@ TEST(TavoplayBadSource, EachGivesItsReasonAndStatus) {
                                "\tBANDWIDTH_HZ = 6000000\n\tISDBT_LAYER_ENABLED = 7\n"
                                "\tISDBT_LAYERB_MODULATION = QAM/64\n\tDELIVERY_SYSTEM = ISDBT\n";
     std::ofstream(garbled) << "FREQUENCY = 563142857\n[TV EXEMPLO HD]\n";
-    const std::string live = (dir / "live.ts").string();
-    std::string made;
-    ASSERT_EQ(runCommand(std::string(TAVO_TSGEN_PATH) + " -o " + live + " -d 30", &made), 0)
-        << made;
+    const std::string& live = TavoPlayer::test::tsgenStream(30);
+    ASSERT_FALSE(live.empty());
     const std::string tavoplay =
         "timeout 60 " TAVO_BINARY_DIR "/apps/tavoplay/tavoplay --headless ";
     const struct {
@@ -150,11 +139,8 @@ TEST(TavoplayProbe, ARealIsdbTbCaptureIn204BytePackets) {
 TEST(TavoplayRunningService, PlaysThroughItAndLeavesItServing) {
     const fs::path dir = fs::temp_directory_path() / ("tavo-running-" + std::to_string(getpid()));
     fs::create_directories(dir);
-    const std::string ts = (dir / "live.ts").string();
-    std::string out;
-    ASSERT_EQ(
-        runCommand(std::string(TAVO_TSGEN_PATH) + " -o " + ts + " -d 8 --caption '1:Olá'", &out), 0)
-        << out;
+    const std::string& ts = TavoPlayer::test::tsgenStream(8, "--caption '1:Olá'");
+    ASSERT_FALSE(ts.empty());
     const std::string svc = (dir / "svc").string();
     const std::string script =
         "TAVOPLAYER_SERVICE_DIR=" + svc + " TAVOPLAYER_PROP_tavoplayer_demux_source=file:" + ts +
@@ -162,7 +148,7 @@ TEST(TavoplayRunningService, PlaysThroughItAndLeavesItServing) {
         TAVO_BINARY_DIR "/apps/tavoplayerd/tavoplayerd 2>/dev/null & d=$!; sleep 1; " +
         "timeout 60 " TAVO_BINARY_DIR "/apps/tavoplay/tavoplay --service " + svc + " " + ts +
         "; s=$?; kill -0 $d && echo still serving; kill $d; wait $d; exit $s";
-    out.clear();
+    std::string out;
     EXPECT_EQ(runCommand("sh -c '" + script + "'", &out), 0) << out;
     EXPECT_NE(out.find("caption: Olá"), std::string::npos) << out;
     EXPECT_NE(out.find("end of stream"), std::string::npos) << out;

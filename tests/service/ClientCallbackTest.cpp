@@ -24,8 +24,7 @@ public:
         uint32_t code;
         uint32_t flags;
         std::vector<int32_t> ints;  // every integer after the token
-        size_t bytesAfterToken;
-        int fd = -1;  // a dup of the descriptor sent, if any
+        int fd = -1;                // a dup of the descriptor sent, if any
     };
     ~RawClient() override {
         for (const Call& c : calls) {
@@ -38,11 +37,9 @@ public:
 protected:
     android::status_t onTransact(uint32_t code, const Parcel& data, Parcel*,
                                  uint32_t flags) override {
-        Call call{code, flags, {}, 0};
+        Call call{code, flags, {}};
         if (!data.enforceInterface(String16("TavoPlayerClient")))
             return -1;
-        const size_t start = data.dataPosition();
-        call.bytesAfterToken = data.dataSize() - start;
         if (code == ICTavoPlayerClient::ON_CAPTURE_FRAME) {
             for (int i = 0; i < 3; ++i)
                 call.ints.push_back(data.readInt32());

@@ -38,6 +38,11 @@ struct SurfacePicture {
     int64_t ptsUs;
     bool interlaced;
     bool topFieldFirst;
+    // Planar chroma instead, when `uv` is null: the Cb and Cr planes, `cStride` bytes
+    // a row, as a decoder gives them (only showSharedPicture takes such pictures).
+    const uint8_t* cb = nullptr;
+    const uint8_t* cr = nullptr;
+    int32_t cStride = 0;
 };
 
 struct Rect {
@@ -107,12 +112,9 @@ public:
     virtual int showPicture(const SurfacePicture& picture) = 0;
     // Shows `picture` whose planes stay valid and unchanged for as long as anyone
     // holds `storage`: a surface may keep a reference instead of copying. This
-    // default copies, as showPicture does.
+    // default copies, as showPicture does (interleaving planar chroma first).
     virtual int showSharedPicture(const SurfacePicture& picture,
-                                  std::shared_ptr<const void> storage) {
-        (void)storage;
-        return showPicture(picture);
-    }
+                                  std::shared_ptr<const void> storage);
 };
 
 }  // namespace android

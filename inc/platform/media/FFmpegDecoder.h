@@ -6,6 +6,7 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <memory>
 #include <vector>
 
 struct AVCodecContext;
@@ -68,6 +69,19 @@ public:
     // Converts the held frame into `out` (NV12 at the coded size with strides equal
     // to the width, or interleaved s16) and drops it. false when it cannot (logged).
     bool writeFrame(uint8_t* out, size_t capacity, const DecodedInfo& info);
+    // The held picture's planes, referenced as decoded instead of converted: 8-bit
+    // 4:2:0 planar pictures only (what the H.264 decoder gives for the profiles
+    // broadcast uses). The frame leaves the decoder and lives while `owner` does.
+    struct Planes {
+        std::shared_ptr<const void> owner;
+        const uint8_t* y = nullptr;
+        const uint8_t* cb = nullptr;
+        const uint8_t* cr = nullptr;
+        int32_t yStride = 0;
+        int32_t cStride = 0;
+    };
+    // false (the frame stays held) when the picture is not 8-bit 4:2:0 planar.
+    bool takePlanes(Planes* planes);
     void dropFrame();
 
 private:

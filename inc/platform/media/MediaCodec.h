@@ -160,6 +160,9 @@ private:
         uint32_t flags = 0;
         sp<AMessage> format;  // the output format the buffer was decoded in
         SurfacePicture picture{};
+        // The decoder's own frame when the picture is shown from its planes (a
+        // surface is set): the buffer then carries no bytes. Released with the buffer.
+        std::shared_ptr<const void> frame;
     };
 
     MediaCodec(const sp<ALooper>& looper, Kind kind, const char* name);

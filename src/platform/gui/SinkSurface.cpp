@@ -146,8 +146,12 @@ int SinkSurface::showSharedPicture(const SurfacePicture& picture,
 int SinkSurface::show(const SurfacePicture& picture, std::shared_ptr<const void> storage) {
     if (mSink == nullptr)
         return -ENODEV;
-    if (picture.y == nullptr || picture.uv == nullptr || picture.width < 2 || picture.height < 2 ||
-        picture.yStride < picture.width || picture.uvStride < picture.width) {
+    // NV12, or planar chroma (Cb and Cr planes of half the width) kept as decoded.
+    const bool planar = picture.uv == nullptr && picture.cb != nullptr && picture.cr != nullptr;
+    if (picture.y == nullptr || picture.width < 2 || picture.height < 2 ||
+        picture.yStride < picture.width ||
+        (planar ? picture.cStride < (picture.width + 1) / 2
+                : picture.uv == nullptr || picture.uvStride < picture.width)) {
         return -EINVAL;
     }
     android_native_rect_t crop{0, 0, picture.width, picture.height};
@@ -184,7 +188,11 @@ int SinkSurface::show(const SurfacePicture& picture, std::shared_ptr<const void>
     shown->interlaced = picture.interlaced;
     shown->topFieldFirst = picture.topFieldFirst;
     const uint8_t* cropY = picture.y + static_cast<size_t>(top) * picture.yStride + left;
-    const uint8_t* cropUV = picture.uv + static_cast<size_t>(top / 2) * picture.uvStride + left;
+    const size_t chromaOffset = static_cast<size_t>(top / 2) * picture.cStride + left / 2;
+    const uint8_t* cropCb = planar ? picture.cb + chromaOffset : nullptr;
+    const uint8_t* cropCr = planar ? picture.cr + chromaOffset : nullptr;
+    const uint8_t* cropUV =
+        planar ? nullptr : picture.uv + static_cast<size_t>(top / 2) * picture.uvStride + left;
     if (storage != nullptr) {
         // The planes stay unchanged while referenced: no copy, the crop is where the
         // picture starts and its rows are the codec's.
@@ -193,6 +201,10 @@ int SinkSurface::show(const SurfacePicture& picture, std::shared_ptr<const void>
         shown->sharedUV = cropUV;
         shown->yStride = picture.yStride;
         shown->uvStride = picture.uvStride;
+        if (planar) {
+            shown->planarChroma = std::make_shared<const PlanarChroma>(
+                cropCb, cropCr, picture.cStride, width / 2, height / 2);
+        }
     } else {
         shown->data.resize(shown->byteSize());
         uint8_t* y = shown->data.data();
@@ -201,9 +213,14 @@ int SinkSurface::show(const SurfacePicture& picture, std::shared_ptr<const void>
                    cropY + static_cast<size_t>(row) * picture.yStride, width);
         }
         uint8_t* uv = y + static_cast<size_t>(width) * height;
-        for (int32_t row = 0; row < height / 2; ++row) {
-            memcpy(uv + static_cast<size_t>(row) * width,
-                   cropUV + static_cast<size_t>(row) * picture.uvStride, width);
+        if (planar) {
+            PlanarChroma::interleave(cropCb, cropCr, picture.cStride, width / 2, height / 2, uv,
+                                     width);
+        } else {
+            for (int32_t row = 0; row < height / 2; ++row) {
+                memcpy(uv + static_cast<size_t>(row) * width,
+                       cropUV + static_cast<size_t>(row) * picture.uvStride, width);
+            }
         }
     }
 

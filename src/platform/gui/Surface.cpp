@@ -2,8 +2,10 @@
 
 #include <cstdlib>
 #include <string>
+#include <vector>
 
 #include "platform/gui/NullVideoSink.h"
+#include "platform/gui/PlanarChroma.h"
 #include "platform/gui/SdlVideoSink.h"
 #include "platform/gui/SinkSurface.h"
 #include "platform/gui/Y4mVideoSink.h"
@@ -73,6 +75,22 @@ sp<Surface> Surface::create() {
     }
     TAVO_LOGI("%s: video sink %s\n", __func__, surface->sinkName());
     return surface;
+}
+
+int Surface::showSharedPicture(const SurfacePicture& picture, std::shared_ptr<const void> storage) {
+    (void)storage;
+    if (picture.uv != nullptr || picture.cb == nullptr || picture.cr == nullptr)
+        return showPicture(picture);
+    if (picture.width < 2 || picture.height < 2 || picture.cStride < (picture.width + 1) / 2)
+        return -22;  // -EINVAL
+    const int32_t uvStride = (picture.width + 1) & ~1;
+    std::vector<uint8_t> uv(static_cast<size_t>(uvStride) * ((picture.height + 1) / 2));
+    PlanarChroma::interleave(picture.cb, picture.cr, picture.cStride, uvStride / 2,
+                             (picture.height + 1) / 2, uv.data(), uvStride);
+    SurfacePicture packed = picture;
+    packed.uv = uv.data();
+    packed.uvStride = uvStride;
+    return showPicture(packed);
 }
 
 }  // namespace android

@@ -224,6 +224,33 @@ bool FFmpegDecoder::describeFrame(DecodedInfo* info) {
     return true;
 }
 
+bool FFmpegDecoder::takePlanes(Planes* planes) {
+    if (!mHaveFrame || mKind != Kind::Avc)
+        return false;
+    const auto format = static_cast<AVPixelFormat>(mFrame->format);
+    if ((format != AV_PIX_FMT_YUV420P && format != AV_PIX_FMT_YUVJ420P) ||
+        mFrame->linesize[0] <= 0 || mFrame->linesize[1] <= 0 ||
+        mFrame->linesize[1] != mFrame->linesize[2]) {
+        return false;
+    }
+    AVFrame* frame = av_frame_alloc();
+    if (frame == nullptr)
+        return false;
+    av_frame_move_ref(frame, mFrame);
+    mHaveFrame = false;
+    planes->y = frame->data[0];
+    planes->cb = frame->data[1];
+    planes->cr = frame->data[2];
+    planes->yStride = frame->linesize[0];
+    planes->cStride = frame->linesize[1];
+    // The frame's buffers go back to the decoder's pool when the last holder lets go.
+    planes->owner = std::shared_ptr<const void>(frame, [](const void* held) {
+        AVFrame* owned = static_cast<AVFrame*>(const_cast<void*>(held));
+        av_frame_free(&owned);
+    });
+    return true;
+}
+
 bool FFmpegDecoder::writeFrame(uint8_t* out, size_t capacity, const DecodedInfo& info) {
     if (!mHaveFrame || info.bytes > capacity) {
         TAVO_LOGW("%s: frame of %zu bytes does not fit %zu\n", __func__, info.bytes, capacity);

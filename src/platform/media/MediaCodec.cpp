@@ -178,8 +178,10 @@ status_t MediaCodec::stop() {
     mDecoder.reset();
     for (InputSlot& slot : mInputs)
         slot.owner = Owner::Codec;
-    for (OutputSlot& slot : mOutputs)
+    for (OutputSlot& slot : mOutputs) {
         slot.owner = Owner::Codec;
+        slot.frame.reset();
+    }
     mQueuedInputs.clear();
     mReadyOutputs.clear();
     mState = State::Initialized;
@@ -330,8 +332,10 @@ status_t MediaCodec::renderOutputBufferAndRelease(size_t index) {
             return BAD_VALUE;
         surface = mSurface;
         picture = mOutputs[index].picture;
-        if (surface != nullptr && mKind == Kind::Avc)
-            storage = mOutputs[index].buffer->share();
+        if (surface != nullptr && mKind == Kind::Avc) {
+            storage = mOutputs[index].frame != nullptr ? mOutputs[index].frame
+                                                       : mOutputs[index].buffer->share();
+        }
     }
     status_t result = OK;
     // The surface keeps the picture's bytes instead of copying them; the decoding
@@ -342,6 +346,7 @@ status_t MediaCodec::renderOutputBufferAndRelease(size_t index) {
     Mutex::Autolock lock(mLock);
     if (mState == State::Started && mOutputs[index].owner == Owner::Client) {
         mOutputs[index].owner = Owner::Codec;
+        mOutputs[index].frame.reset();
         mWork.broadcast();
     }
     return result;
@@ -353,6 +358,7 @@ status_t MediaCodec::releaseOutputBuffer(size_t index) {
         mOutputs[index].owner != Owner::Client)
         return BAD_VALUE;
     mOutputs[index].owner = Owner::Codec;
+    mOutputs[index].frame.reset();
     mWork.broadcast();
     return OK;
 }
@@ -470,8 +476,10 @@ bool MediaCodec::placeFrame() {
         return true;
     }
     size_t index = 0;
+    bool toSurface = false;
     {
         Mutex::Autolock lock(mLock);
+        toSurface = mSurface != nullptr && mKind == Kind::Avc;
         for (;;) {
             if (mStopRequested) {
                 mDecoder->dropFrame();
@@ -497,22 +505,38 @@ bool MediaCodec::placeFrame() {
         // Still owned by the codec: the client cannot see it until it is Ready.
     }
     OutputSlot& slot = mOutputs[index];
-    slot.buffer->ensureCapacity(info.bytes);
-    if (!mDecoder->writeFrame(slot.buffer->base(), slot.buffer->capacity(), info)) {
-        Mutex::Autolock lock(mLock);
-        ++mRejectedUnits;
-        return true;
-    }
-    slot.buffer->setRange(0, info.bytes);
-    slot.ptsUs = info.ptsUs;
-    slot.flags = info.keyFrame ? static_cast<uint32_t>(BUFFER_FLAG_SYNCFRAME) : 0u;
-    slot.format = formatFor(info);
-    if (mKind == Kind::Avc) {
+    slot.picture = SurfacePicture{};
+    FFmpegDecoder::Planes planes;
+    if (toSurface && mDecoder->takePlanes(&planes)) {
+        // The surface shows the decoder's planes as they are: no conversion here,
+        // and the buffer carries no bytes, as a codec's output does when it renders
+        // to a surface. Whoever reads the chroma interleaves it then.
+        slot.frame = std::move(planes.owner);
+        slot.buffer->setRange(0, 0);
+        slot.picture.y = planes.y;
+        slot.picture.yStride = planes.yStride;
+        slot.picture.cb = planes.cb;
+        slot.picture.cr = planes.cr;
+        slot.picture.cStride = planes.cStride;
+    } else {
+        slot.frame.reset();
+        slot.buffer->ensureCapacity(info.bytes);
+        if (!mDecoder->writeFrame(slot.buffer->base(), slot.buffer->capacity(), info)) {
+            Mutex::Autolock lock(mLock);
+            ++mRejectedUnits;
+            return true;
+        }
+        slot.buffer->setRange(0, info.bytes);
         uint8_t* base = slot.buffer->base();
         slot.picture.y = base;
         slot.picture.yStride = info.width;
         slot.picture.uv = base + static_cast<size_t>(info.width) * info.height;
         slot.picture.uvStride = (info.width + 1) & ~1;
+    }
+    slot.ptsUs = info.ptsUs;
+    slot.flags = info.keyFrame ? static_cast<uint32_t>(BUFFER_FLAG_SYNCFRAME) : 0u;
+    slot.format = formatFor(info);
+    if (mKind == Kind::Avc) {
         slot.picture.width = info.width;
         slot.picture.height = info.height;
         slot.picture.ptsUs = info.ptsUs;

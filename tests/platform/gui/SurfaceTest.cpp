@@ -257,6 +257,57 @@ TEST_F(SharedPictureTest, Y4mSinkWritesTheCropOfSharedPlanes) {
     expectCropOf(*picture, y, 64, y + 64 * 48, 64);
 }
 
+// Pictures whose chroma the decoder left planar: every way in gives the same NV12
+// crop as the interleaved picture would (the surface that keeps a reference, the
+// one that copies, and a surface that implements only showPicture).
+TEST_F(SharedPictureTest, PlanarChromaGivesTheSameCropAsNv12) {
+    struct OnlyShowPicture : Surface {
+        int showPicture(const SurfacePicture& p) override {
+            shown.assign(p.uv, p.uv + p.uvStride * (p.height / 2));
+            stride = p.uvStride;
+            return 0;
+        }
+        int setCrop(const android_native_rect_t*) override { return 0; }
+        int dequeueBuffer(ANativeWindowBuffer**) override { return -1; }
+        int queueBuffer(ANativeWindowBuffer*, int) override { return -1; }
+        std::vector<uint8_t> shown;
+        int32_t stride = 0;
+    };
+    std::shared_ptr<const TestPicture> nv12 = makePicture(4);
+    const int32_t cStride = nv12->stride / 2 + 8;  // padded, as decoder planes are
+    std::vector<uint8_t> cb(cStride * nv12->height / 2), cr(cb.size());
+    for (int32_t row = 0; row < nv12->height / 2; ++row) {
+        for (int32_t i = 0; i < nv12->width / 2; ++i) {
+            cb[row * cStride + i] = nv12->chromaAt(row, 2 * i);
+            cr[row * cStride + i] = nv12->chromaAt(row, 2 * i + 1);
+        }
+    }
+    SurfacePicture planar = nv12->picture();
+    planar.uv = nullptr;
+    planar.uvStride = 0;
+    planar.cb = cb.data();
+    planar.cr = cr.data();
+    planar.cStride = cStride;
+
+    for (const bool shared : {true, false}) {
+        sp<SinkSurface> surface = createSurface("null");
+        ASSERT_NE(surface, nullptr);
+        ASSERT_EQ(native_window_set_crop(surface.get(), &kCrop), 0);
+        ASSERT_EQ(shared ? surface->showSharedPicture(planar, nv12) : surface->showPicture(planar),
+                  0);
+        std::shared_ptr<const SinkPicture> last = surface->lastPicture();
+        ASSERT_NE(last, nullptr);
+        SCOPED_TRACE(shared ? "shared" : "copied");
+        expectCropOf(*nv12, last->y(), last->lumaStride(), last->uv(), last->chromaStride());
+    }
+    sp<OnlyShowPicture> copying = new OnlyShowPicture();
+    ASSERT_EQ(copying->showSharedPicture(planar, nv12), 0);
+    for (int32_t row = 0; row < nv12->height / 2; ++row) {
+        for (int32_t byte = 0; byte < nv12->width; ++byte)
+            ASSERT_EQ(copying->shown[row * copying->stride + byte], nv12->chromaAt(row, byte));
+    }
+}
+
 TEST(Y4mSinkTest, FFprobeReadsEveryPictureAtTheFirstPicturesSize) {
     const std::string path = tempPath("out.y4m");
     {

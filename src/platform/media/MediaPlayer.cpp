@@ -12,10 +12,57 @@
 
 #include "platform/gui/Surface.h"
 #include "platform/media/MediaPlayerOutputs.h"
+#include "platform/os/SharedLibrary.h"
 #include "platform/os/Trace.h"
 
 namespace android {
 namespace {
+
+// libmpv, opened when the first player is made (see SharedLibrary): a process that
+// never plays a file does not load it and its dependencies.
+struct MpvLibrary {
+    decltype(&::mpv_command) mpv_command;
+    decltype(&::mpv_create) mpv_create;
+    decltype(&::mpv_error_string) mpv_error_string;
+    decltype(&::mpv_free_node_contents) mpv_free_node_contents;
+    decltype(&::mpv_get_property) mpv_get_property;
+    decltype(&::mpv_initialize) mpv_initialize;
+    decltype(&::mpv_observe_property) mpv_observe_property;
+    decltype(&::mpv_request_log_messages) mpv_request_log_messages;
+    decltype(&::mpv_set_property) mpv_set_property;
+    decltype(&::mpv_set_property_string) mpv_set_property_string;
+    decltype(&::mpv_terminate_destroy) mpv_terminate_destroy;
+    decltype(&::mpv_wait_event) mpv_wait_event;
+    decltype(&::mpv_wakeup) mpv_wakeup;
+
+    // The table, resolved once; nullptr when libmpv cannot be loaded (logged).
+    static const MpvLibrary* get() {
+        // libmpv's soname follows its client API's major version.
+        static const std::string soname =
+            "libmpv.so." + std::to_string(MPV_CLIENT_API_VERSION >> 16);
+        return SharedLibrary::loadOnce<MpvLibrary>(
+            soname.c_str(), [](void* handle, MpvLibrary& table) {
+                return TAVO_RESOLVE(handle, table, mpv_command) &&
+                       TAVO_RESOLVE(handle, table, mpv_create) &&
+                       TAVO_RESOLVE(handle, table, mpv_error_string) &&
+                       TAVO_RESOLVE(handle, table, mpv_free_node_contents) &&
+                       TAVO_RESOLVE(handle, table, mpv_get_property) &&
+                       TAVO_RESOLVE(handle, table, mpv_initialize) &&
+                       TAVO_RESOLVE(handle, table, mpv_observe_property) &&
+                       TAVO_RESOLVE(handle, table, mpv_request_log_messages) &&
+                       TAVO_RESOLVE(handle, table, mpv_set_property) &&
+                       TAVO_RESOLVE(handle, table, mpv_set_property_string) &&
+                       TAVO_RESOLVE(handle, table, mpv_terminate_destroy) &&
+                       TAVO_RESOLVE(handle, table, mpv_wait_event) &&
+                       TAVO_RESOLVE(handle, table, mpv_wakeup);
+            });
+    }
+};
+
+// Only for players that exist: their constructor loaded the table.
+const MpvLibrary& libmpv() {
+    return *MpvLibrary::get();
+}
 
 // Reply ids of the observed libmpv properties.
 enum : uint64_t {
@@ -38,10 +85,10 @@ int newAudioSessionId() {
 // Sets a libmpv option or property; a failure is logged with its name, because
 // libmpv builds differ in the options they know.
 int setOption(mpv_handle* handle, const char* name, const std::string& value) {
-    const int err = mpv_set_property_string(handle, name, value.c_str());
+    const int err = libmpv().mpv_set_property_string(handle, name, value.c_str());
     if (err < 0) {
         TAVO_LOGW("%s: mpv option %s=%s: %s\n", "MediaPlayer", name, value.c_str(),
-                  mpv_error_string(err));
+                  libmpv().mpv_error_string(err));
     }
     return err;
 }
@@ -88,7 +135,11 @@ void waitForLastReference(const sp<T>& thread) {
 }  // namespace
 
 MediaPlayer::MediaPlayer() : mAudioSessionId(newAudioSessionId()) {
-    mpv_handle* handle = mpv_create();
+    if (MpvLibrary::get() == nullptr) {
+        TAVO_LOGE("%s: Could not create the mpv player\n", __func__);
+        return;
+    }
+    mpv_handle* handle = libmpv().mpv_create();
     if (handle == nullptr) {
         TAVO_LOGE("%s: Could not create the mpv player\n", __func__);
         return;
@@ -122,17 +173,19 @@ MediaPlayer::MediaPlayer() : mAudioSessionId(newAudioSessionId()) {
     for (const auto& [name, value] : outputs.options)
         setOption(handle, name.c_str(), value);
 
-    const int err = mpv_initialize(handle);
+    const int err = libmpv().mpv_initialize(handle);
     if (err < 0) {
-        TAVO_LOGE("%s: Could not initialise the mpv player: %s\n", __func__, mpv_error_string(err));
-        mpv_terminate_destroy(handle);
+        TAVO_LOGE("%s: Could not initialise the mpv player: %s\n", __func__,
+                  libmpv().mpv_error_string(err));
+        libmpv().mpv_terminate_destroy(handle);
         return;
     }
-    mpv_observe_property(handle, kVideoParams, "video-params", MPV_FORMAT_NODE);
-    mpv_observe_property(handle, kEofReached, "eof-reached", MPV_FORMAT_FLAG);
-    mpv_observe_property(handle, kCacheBufferingState, "cache-buffering-state", MPV_FORMAT_INT64);
-    mpv_observe_property(handle, kPausedForCache, "paused-for-cache", MPV_FORMAT_FLAG);
-    mpv_request_log_messages(handle, "warn");
+    libmpv().mpv_observe_property(handle, kVideoParams, "video-params", MPV_FORMAT_NODE);
+    libmpv().mpv_observe_property(handle, kEofReached, "eof-reached", MPV_FORMAT_FLAG);
+    libmpv().mpv_observe_property(handle, kCacheBufferingState, "cache-buffering-state",
+                                  MPV_FORMAT_INT64);
+    libmpv().mpv_observe_property(handle, kPausedForCache, "paused-for-cache", MPV_FORMAT_FLAG);
+    libmpv().mpv_request_log_messages(handle, "warn");
     mHandle = handle;
 }
 
@@ -163,13 +216,13 @@ bool MediaPlayer::CallbackThread::threadLoop() {
     sp<MediaPlayer> player = mPlayer.promote();
     if (player == nullptr)
         return false;
-    mpv_event* event = mpv_wait_event(player->mHandle, kEventWaitSeconds);
+    mpv_event* event = libmpv().mpv_wait_event(player->mHandle, kEventWaitSeconds);
     while (event->event_id != MPV_EVENT_NONE) {
         {
             std::lock_guard<std::mutex> lock(player->mLock);
             player->handleEvent_l(*event);
         }
-        event = mpv_wait_event(player->mHandle, 0);
+        event = libmpv().mpv_wait_event(player->mHandle, 0);
     }
     player->deliverPending();
     return !exitPending();
@@ -196,7 +249,7 @@ void MediaPlayer::deliverPending() {
 void MediaPlayer::post_l(int msg, int ext1, int ext2) {
     mPending.push_back({msg, ext1, ext2});
     if (mHandle != nullptr)
-        mpv_wakeup(mHandle);
+        libmpv().mpv_wakeup(mHandle);
 }
 
 void MediaPlayer::handleEvent_l(const mpv_event& event) {
@@ -226,7 +279,7 @@ void MediaPlayer::handleEvent_l(const mpv_event& event) {
     switch (event.event_id) {
         case MPV_EVENT_FILE_LOADED: {
             int flag = 0;
-            mpv_get_property(mHandle, "demuxer-via-network", MPV_FORMAT_FLAG, &flag);
+            libmpv().mpv_get_property(mHandle, "demuxer-via-network", MPV_FORMAT_FLAG, &flag);
             mNetworkSource = flag != 0;
             return;
         }
@@ -270,14 +323,14 @@ void MediaPlayer::handleEndFile_l(const mpv_event& event) {
     if (mState == MEDIA_PLAYER_PREPARING) {
         const int err =
             e->reason == MPV_END_FILE_REASON_ERROR ? e->error : MPV_ERROR_NOTHING_TO_PLAY;
-        failPrepare_l(statusFromMpvError(err), mpv_error_string(err));
+        failPrepare_l(statusFromMpvError(err), libmpv().mpv_error_string(err));
         return;
     }
     if (e->reason == MPV_END_FILE_REASON_ERROR &&
         (mState & (MEDIA_PLAYER_PREPARED | MEDIA_PLAYER_STARTED | MEDIA_PLAYER_PAUSED |
                    MEDIA_PLAYER_PLAYBACK_COMPLETE))) {
         TAVO_LOGE("%s: Playback of %s failed: %s\n", "MediaPlayer", mUrl.c_str(),
-                  mpv_error_string(e->error));
+                  libmpv().mpv_error_string(e->error));
         mState = MEDIA_PLAYER_STATE_ERROR;
         post_l(MEDIA_ERROR, MEDIA_ERROR_UNKNOWN, statusFromMpvError(e->error));
     } else if (e->reason == MPV_END_FILE_REASON_EOF && mState == MEDIA_PLAYER_STARTED) {
@@ -348,11 +401,11 @@ void MediaPlayer::handleProperty_l(const mpv_event& event) {
 
 void MediaPlayer::readVideoSize_l() {
     mpv_node node;
-    if (mpv_get_property(mHandle, "video-params", MPV_FORMAT_NODE, &node) < 0)
+    if (libmpv().mpv_get_property(mHandle, "video-params", MPV_FORMAT_NODE, &node) < 0)
         return;
     const int w = static_cast<int>(intValue(mapValue(node, "dw")));
     const int h = static_cast<int>(intValue(mapValue(node, "dh")));
-    mpv_free_node_contents(&node);
+    libmpv().mpv_free_node_contents(&node);
     if (w > 0 && h > 0) {
         mVideoWidth = w;
         mVideoHeight = h;
@@ -391,7 +444,7 @@ void MediaPlayer::disconnect() {
     if (thread != nullptr) {
         thread->requestExit();
         if (mHandle != nullptr)
-            mpv_wakeup(mHandle);
+            libmpv().mpv_wakeup(mHandle);
         // A listener that disconnects from its notification runs on the callback
         // thread, which cannot join itself (WOULD_BLOCK): it ends by itself after the
         // round, touching libmpv no more.
@@ -400,7 +453,7 @@ void MediaPlayer::disconnect() {
     }
     std::lock_guard<std::mutex> lock(mLock);
     if (mHandle != nullptr) {
-        mpv_terminate_destroy(mHandle);
+        libmpv().mpv_terminate_destroy(mHandle);
         mHandle = nullptr;
     }
 }
@@ -447,9 +500,10 @@ status_t MediaPlayer::setListener(const sp<MediaPlayerListener>& listener) {
 }
 
 status_t MediaPlayer::command_l(const char* const* args) {
-    const int err = mpv_command(mHandle, const_cast<const char**>(args));
+    const int err = libmpv().mpv_command(mHandle, const_cast<const char**>(args));
     if (err < 0) {
-        TAVO_LOGE("%s: mpv %s failed: %s\n", "MediaPlayer", args[0], mpv_error_string(err));
+        TAVO_LOGE("%s: mpv %s failed: %s\n", "MediaPlayer", args[0],
+                  libmpv().mpv_error_string(err));
         return UNKNOWN_ERROR;
     }
     return OK;
@@ -457,7 +511,7 @@ status_t MediaPlayer::command_l(const char* const* args) {
 
 status_t MediaPlayer::setPause_l(bool pause) {
     int flag = pause ? 1 : 0;
-    const int err = mpv_set_property(mHandle, "pause", MPV_FORMAT_FLAG, &flag);
+    const int err = libmpv().mpv_set_property(mHandle, "pause", MPV_FORMAT_FLAG, &flag);
     return err < 0 ? UNKNOWN_ERROR : OK;
 }
 
@@ -490,7 +544,7 @@ status_t MediaPlayer::prepare() {
     const char* load[] = {"loadfile", mUrl.c_str(), "replace", nullptr};
     int64_t entry = -1;
     if (command_l(load) != OK ||
-        mpv_get_property(mHandle, "playlist/0/id", MPV_FORMAT_INT64, &entry) < 0) {
+        libmpv().mpv_get_property(mHandle, "playlist/0/id", MPV_FORMAT_INT64, &entry) < 0) {
         failPrepare_l(MEDIA_ERROR_UNSUPPORTED, "the player refused the source");
         return mPrepareStatus;
     }
@@ -602,7 +656,8 @@ status_t MediaPlayer::getCurrentPosition(int* msec) {
         return NO_INIT;
     double seconds = 0;
     // Nothing loaded (idle, stopped, failed): position 0.
-    if (!mFileStarted || mpv_get_property(mHandle, "time-pos", MPV_FORMAT_DOUBLE, &seconds) < 0)
+    if (!mFileStarted ||
+        libmpv().mpv_get_property(mHandle, "time-pos", MPV_FORMAT_DOUBLE, &seconds) < 0)
         seconds = 0;
     *msec = static_cast<int>(std::llround(std::max(seconds, 0.0) * 1000.0));
     return OK;
@@ -615,7 +670,8 @@ status_t MediaPlayer::getDuration(int* msec) {
     if (mDisconnected || mHandle == nullptr)
         return NO_INIT;
     double seconds = 0;
-    if (!mFileStarted || mpv_get_property(mHandle, "duration", MPV_FORMAT_DOUBLE, &seconds) < 0)
+    if (!mFileStarted ||
+        libmpv().mpv_get_property(mHandle, "duration", MPV_FORMAT_DOUBLE, &seconds) < 0)
         return INVALID_OPERATION;
     *msec = static_cast<int>(std::llround(std::max(seconds, 0.0) * 1000.0));
     return OK;
@@ -627,7 +683,7 @@ status_t MediaPlayer::setVolume(float leftVolume, float rightVolume) {
         return NO_INIT;
     mVolume = std::clamp(std::max(leftVolume, rightVolume), 0.0f, 1.0f);
     double percent = mVolume * 100.0;
-    const int err = mpv_set_property(mHandle, "volume", MPV_FORMAT_DOUBLE, &percent);
+    const int err = libmpv().mpv_set_property(mHandle, "volume", MPV_FORMAT_DOUBLE, &percent);
     return err < 0 ? UNKNOWN_ERROR : OK;
 }
 

@@ -6,12 +6,12 @@
 // tavoplayer.audio.sink:
 //   alsa[:DEVICE]  ALSA PCM DEVICE ("default" when omitted); the default sink when
 //                  the machine has a sound card. Device latency: the buffer ALSA
-//                  grants for a 100 ms request (kAlsaLatencyMs); underruns are
+//                  grants for a 188 ms request (kAlsaLatencyMs); underruns are
 //                  recovered with snd_pcm_recover and logged.
 //   wav:PATH       a RIFF/WAVE file, created anew by every track, written at the
-//                  pace of hardware. Device latency 50 ms (kSimulatedLatencyMs).
+//                  pace of hardware. Device latency 188 ms (kSimulatedLatencyMs).
 //   null           nothing is kept; writes are paced by the monotonic clock like
-//                  hardware. Device latency 50 ms (kSimulatedLatencyMs).
+//                  hardware. Device latency 188 ms (kSimulatedLatencyMs).
 // The device latency is the queue between a write and the sound leaving: a write
 // into an idle device leaves that much later, and a writer is held back while the
 // device holds more than that. Every sink reports the monotonic time at which the
@@ -58,8 +58,14 @@ public:
     };
     using callback_t = void (*)(int event, void* user, void* info);
 
-    static constexpr uint32_t kSimulatedLatencyMs = 50;
-    static constexpr uint32_t kAlsaLatencyMs = 100;
+    // The device latency of every sink. The audio renderer writes sound 158 to 201 ms
+    // ahead of its time stamp (it plays a fragment as it is within 201 ms of its clock
+    // and inserts silence in 42.7 ms steps beyond), a lead made for a television's
+    // output path. A device that holds 188 ms puts the sound between 13 ms ahead of
+    // and 30 ms behind its picture, inside the window viewers accept (ATSC IS-191:
+    // 15 ms ahead, 45 ms behind).
+    static constexpr uint32_t kSimulatedLatencyMs = 188;
+    static constexpr uint32_t kAlsaLatencyMs = 188;
     // Rates a track accepts, as the platform's mixer does.
     static constexpr uint32_t kMinSampleRate = 4000;
     static constexpr uint32_t kMaxSampleRate = 192000;

@@ -4,10 +4,8 @@
 // streams, which share the data group and data unit framing.
 #include <dirent.h>
 #include <gtest/gtest.h>
-#include <unistd.h>
 
 #include <cstdio>
-#include <cstdlib>
 #include <map>
 #include <string>
 #include <vector>
@@ -15,6 +13,7 @@
 #include "decoder/ClosedCaptionDecoder.h"
 #include "support/CaptionBuilder.h"
 #include "support/CaptionTestDoubles.h"
+#include "support/ScopedEnv.h"
 #include "support/TraceCapture.h"
 #include "support/TsTestUtil.h"
 #include "tsparser/TSParser.h"
@@ -47,16 +46,10 @@ Bytes tsgenCaptionStream(const std::vector<Caption>& captions) {
 #ifndef TAVO_TSGEN_PATH
     return {};
 #else
-    const std::string path = "/tmp/tavo_cc_chain_" + std::to_string(getpid()) + ".ts";
-    std::string command = std::string(TAVO_TSGEN_PATH) + " -o " + path +
-                          " -d 6 --size 64x64 --audio none --mux-rate 600000";
+    std::string options = "--size 64x64 --audio none --mux-rate 600000";
     for (const auto& c : captions)
-        command += " --caption '" + std::to_string(c.sec) + ":" + c.argument + "'";
-    bool ok = false;
-    runCommand(command + " 2>&1", &ok);
-    Bytes ts = ok ? fileBytes(path) : Bytes{};
-    unlink(path.c_str());
-    return ts;
+        options += " --caption '" + std::to_string(c.sec) + ":" + c.argument + "'";
+    return fileBytes(tsgenStream(6, options));
 #endif
 }
 

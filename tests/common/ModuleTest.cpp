@@ -1,6 +1,5 @@
 #include "common/Module.h"
 
-#include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
 #include <cstdio>
@@ -14,13 +13,10 @@ namespace {
 class TestModule : public Module {
 public:
     explicit TestModule(const std::string& name) : Module(name) {}
-    TestModule(const TestModule& other) : android::RefBase(), Module(other) {}
     unsigned int start() override { return 0; }
     unsigned int stop() override { return 0; }
     size_t outputCount() const { return mOutputs.size(); }
     const OutputList& outputs() const { return mOutputs; }
-    bool hasInput() const { return mInput != nullptr; }
-    size_t listenerCount() const { return mErrorListeners.size(); }
 };
 
 struct Call {
@@ -77,27 +73,6 @@ TEST_F(ModuleTest, RemoveOutputKeepsOrderAndAdvancesIterator) {
     EXPECT_EQ(c, *whereB);
     // The module held the only other reference to b besides this test.
     EXPECT_EQ(1, b->getStrongCount());
-}
-
-TEST_F(ModuleTest, CopyKeepsOnlyTheName) {
-    RecordingListener listener(1, &calls);
-    module->addErrorListener(listener);
-    module->setInput(new RingBuffer);
-    module->addOutput(new RingBuffer, nullptr);
-    android::sp<TestModule> copy = new TestModule(*module);
-    EXPECT_EQ("TS Parser", copy->getModuleName());
-    EXPECT_EQ(0u, copy->outputCount());
-    EXPECT_FALSE(copy->hasInput());
-    EXPECT_EQ(0u, copy->listenerCount());
-}
-
-TEST_F(ModuleTest, SetInputReplacesTheReference) {
-    android::sp<RingBuffer> first = new RingBuffer, second = new RingBuffer;
-    module->setInput(first);
-    EXPECT_EQ(2, first->getStrongCount());
-    module->setInput(second);
-    EXPECT_EQ(1, first->getStrongCount());
-    EXPECT_EQ(2, second->getStrongCount());
 }
 
 TEST_F(ModuleTest, DumpWritesIndentedName) {

@@ -10,7 +10,6 @@
 #include "common/data/PESData.h"
 #include "common/data/VideoFrameData.h"
 #include "platform/gui/GraphicBuffer.h"
-#include "support/TraceCapture.h"
 
 namespace TavoPlayer {
 namespace {
@@ -34,11 +33,7 @@ protected:
 TEST_F(RecordInRingTest, PesRecordSizeAndAdvance) {
     const struct {
         uint32_t pesBytes, recordSize, advance;
-    } cases[] = {{2000, 2040, 2040},
-                 {2001, 2041, 2044},
-                 {2002, 2042, 2044},
-                 {2003, 2043, 2044},
-                 {0, 40, 40}};
+    } cases[] = {{2000, 2040, 2040}, {2001, 2041, 2044}, {2003, 2043, 2044}, {0, 40, 40}};
     for (const auto& c : cases) {
         SCOPED_TRACE(c.pesBytes);
         ring->reset();
@@ -154,20 +149,6 @@ TEST(RecordTextTest, ToStringAndFromString) {
     EXPECT_TRUE(videoBack.fromString(text.data()));
     EXPECT_EQ(80u, videoBack.mSize);
     EXPECT_EQ(0x1FFFFFFFFu, videoBack.mPTS);
-}
-
-TEST(RecordTextTest, CaptionRecordHasNoTextFormAndNoRawBytes) {
-    test::TraceCapture trace;
-    ClosedCaptionFragmentData r;
-    char text[] = "anything";
-    EXPECT_TRUE(r.fromString(text));
-    EXPECT_EQ("", r.toString());
-    unsigned char sentinel = 0;
-    unsigned char* data = &sentinel;
-    unsigned int size = 77;
-    EXPECT_EQ(0, r.getRaw(&data, &size));
-    EXPECT_EQ(&sentinel, data);  // untouched
-    EXPECT_EQ(77u, size);
 }
 
 // ---------------------------------------------------------------------------------

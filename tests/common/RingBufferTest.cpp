@@ -12,6 +12,7 @@
 #include <thread>
 
 #include "support/TraceCapture.h"
+#include "support/TsTestUtil.h"
 
 namespace TavoPlayer {
 namespace {
@@ -224,14 +225,7 @@ TEST(RingBufferWakeTest, TheOtherSideOrAResetEndsTheWait) {
 // Picture and dump: the dump's text is part of the service's diagnostic output.
 
 std::string dumpText(RingBuffer& r, int indent) {
-    char* buffer = nullptr;
-    size_t length = 0;
-    FILE* f = open_memstream(&buffer, &length);
-    r.dump(f, indent);
-    fclose(f);
-    std::string text(buffer, length);
-    free(buffer);
-    return text;
+    return test::printed([&](FILE* f) { r.dump(f, indent); });
 }
 
 // A ring of eight pages whose counters first move on by `wrap`, then to `head`

@@ -19,8 +19,10 @@
 #include "common/data/AudioFragmentData.h"
 #include "common/data/VideoFrameData.h"
 #include "platform/audio/AudioTrack.h"
+#include "support/CaptionTestDoubles.h"
 #include "support/NamedRow.h"
 #include "support/TraceCapture.h"
+#include "support/TsTestUtil.h"
 
 namespace TavoPlayer {
 namespace {
@@ -28,6 +30,7 @@ namespace {
 using test::PrintTo;
 
 using test::TraceCapture;
+using test::waitUntil;
 
 constexpr Uint33 kAnchor = 1'000'000;  // the clock's PCR while the test runs
 
@@ -51,16 +54,6 @@ struct Listener : AudioRenderer::AudioRenderedListener, ErrorListener {
     std::vector<int> sessions;
     mutable std::vector<unsigned int> errors;
 };
-
-bool eventually(const std::function<bool()>& condition) {
-    const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(10);
-    while (!condition()) {
-        if (std::chrono::steady_clock::now() > deadline)
-            return false;
-        std::this_thread::sleep_for(std::chrono::milliseconds(5));
-    }
-    return true;
-}
 
 // The renderer against the real clock (on a monotonic time the test holds still),
 // a real ring, and the WAV sink, whose file shows exactly what reached the device.
@@ -144,12 +137,8 @@ protected:
         return v;
     }
 
-    uint64_t mNowMs = 5'000'000;
-    android::sp<Synchronization> mClock = new Synchronization([this](timespec* ts) {
-        ts->tv_sec = static_cast<time_t>(mNowMs / 1000);
-        ts->tv_nsec = static_cast<long>(mNowMs % 1000 * 1'000'000);
-        return true;
-    });
+    test::ManualClock mManual;
+    android::sp<Synchronization> mClock = mManual.make();
     android::sp<RingBuffer> mRing = new RingBuffer();
     Listener mListener;
     TraceCapture mTrace;
@@ -180,7 +169,7 @@ TEST_P(AudioTimingTest, EarlyGetsSilenceLateLosesItsHead) {
     ASSERT_EQ(0u, build(c.anchor));
     // The output device thread has seen the Bluetooth output once the change is flagged.
     if (c.bluetooth) {
-        ASSERT_TRUE(eventually([&] { return mRenderer->checkOutputDevice(); }));
+        ASSERT_TRUE(waitUntil([&] { return mRenderer->checkOutputDevice(); }));
     }
     const std::vector<uint8_t> payload = pcm(c.payloadBytes);
     writeRecord(mask33(c.anchor + static_cast<uint64_t>(c.ptsOffsetTicks)), 2, 48000, payload);
@@ -312,7 +301,7 @@ TEST_F(AudioRendererTest, AnOutputThatCannotOpenOrFailsLeavesTheRendererRunning)
     EXPECT_EQ(ERROR_RENDERER_NO_OUTPUT, build());
     EXPECT_EQ(0u, mRenderer->start());
     writeRecord(kAnchor, 2, 48000, pcm(1920));
-    EXPECT_TRUE(eventually([&] { return mRing->usedSpace() == 0; }));
+    EXPECT_TRUE(waitUntil([&] { return mRing->usedSpace() == 0; }));
     EXPECT_EQ(0u, mRenderer->stop());
     mRenderer.clear();
     {
@@ -325,14 +314,14 @@ TEST_F(AudioRendererTest, AnOutputThatCannotOpenOrFailsLeavesTheRendererRunning)
     ASSERT_EQ(0u, build());
     ASSERT_EQ(0u, mRenderer->start());
     writeRecord(kAnchor, 2, 48000, pcm(1920));
-    ASSERT_TRUE(eventually([&] { return mTrace.count("Could not write") >= 4; }));
+    ASSERT_TRUE(waitUntil([&] { return mTrace.count("Could not write") >= 4; }));
     {
         std::lock_guard<std::mutex> lock(mListener.mutex);
         // Reported when the output starts failing, not on every pass.
         EXPECT_EQ(std::vector<unsigned int>{ERROR_RENDERER_SHORT_WRITE}, mListener.errors);
     }
     writeRecord(kAnchor + 1800, 2, 48000, pcm(1920));
-    EXPECT_TRUE(eventually([&] { return mRing->usedSpace() == 0; }));
+    EXPECT_TRUE(waitUntil([&] { return mRing->usedSpace() == 0; }));
     EXPECT_EQ(0u, mRenderer->stop());
     EXPECT_EQ(-1, mListener.sessions.back());
 }
@@ -345,13 +334,13 @@ TEST_F(AudioRendererTest, EveryResyncPathFlushesAndDropsSynchronisation) {
         EXPECT_TRUE(mRenderer->isSynced());
         const int before = mRenderer->resyncCount();
         cause();
-        return eventually([&] { return !mRenderer->isSynced(); }) &&
+        return waitUntil([&] { return !mRenderer->isSynced(); }) &&
                mRenderer->resyncCount() == before + 1;
     };
     EXPECT_TRUE(resyncedBy([&] { mRenderer->setOutputEnable(false); }));
     EXPECT_EQ(0.0f, mRenderer->volume());
     EXPECT_TRUE(resyncedBy([&] {
-        mNowMs += 20;  // a re-base of the driving source reaches its listeners
+        mManual.nowMs += 20;  // a re-base of the driving source reaches its listeners
         mClock->setBasePCR(kAnchor + 500'000, Synchronization::RealPCR);
     }));
     mClock->resetPCR();
@@ -360,13 +349,7 @@ TEST_F(AudioRendererTest, EveryResyncPathFlushesAndDropsSynchronisation) {
     EXPECT_TRUE(resyncedBy([&] { mRenderer->startResyncTimer(); }));
 #endif
 
-    char* text = nullptr;
-    size_t length = 0;
-    FILE* out = open_memstream(&text, &length);
-    mRenderer->dump(out, 0);
-    fclose(out);
-    const std::string dump(text, length);
-    free(text);
+    const std::string dump = test::printed([&](FILE* out) { mRenderer->dump(out, 0); });
     EXPECT_NE(std::string::npos, dump.find("\tAudio Volume: 0.0\n\tResync PCR Count: " +
                                            std::to_string(mRenderer->resyncCount()) + "\n"));
     EXPECT_NE(std::string::npos,

@@ -1,7 +1,7 @@
-// Test doubles for the caption renderer: a monotonic clock that moves only when
-// told to, a listener that keeps what it receives (and the stream clock at that
-// moment), and a renderer whose timed waits are recorded and run the clock forward
-// instead of sleeping. Header-only: only tests that link the renderer include it.
+// Test doubles for the renderers: a monotonic clock that moves only when told to, a listener that
+// keeps what it receives (and the stream clock at that moment), and a renderer whose timed waits
+// are recorded and run the clock forward instead of sleeping. Header-only: only tests that link the
+// renderer include it.
 #pragma once
 
 #include <time.h>
@@ -19,15 +19,16 @@ namespace TavoPlayer::test {
 struct ManualClock {
     std::atomic<int64_t> nowMs{1'000'000};
     std::atomic<int> reads{0};
-    android::sp<Synchronization> make() {
-        return new Synchronization([this](timespec* ts) {
+    Synchronization::MonotonicClock reader() {
+        return [this](timespec* ts) {
             const int64_t ms = nowMs.load();
             ts->tv_sec = ms / 1000;
             ts->tv_nsec = (ms % 1000) * 1'000'000;
             reads.fetch_add(1);
             return true;
-        });
+        };
     }
+    android::sp<Synchronization> make() { return new Synchronization(reader()); }
 };
 
 class RecordingListener : public ClosedCaptionListener {

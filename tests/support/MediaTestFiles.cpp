@@ -31,7 +31,6 @@ MediaTestFiles::MediaTestFiles() {
     const std::string commands[] = {
         ff + video + "320x240" + tone + " -t " + d + h264 + aac +
             " -movflags +faststart -shortest '" + mp4() + "' 2>&1",
-        ff + video + "176x144" + tone + " -t " + d + h264 + aac + " -shortest '" + mkv() + "' 2>&1",
         ff + tone + " -t " + d + aac + " '" + audioOnly() + "' 2>&1",
     };
     for (const std::string& command : commands) {

@@ -22,7 +22,6 @@ public:
     const std::string& error() const { return mError; }
 
     std::string mp4() const { return mDir + "/av.mp4"; }               // H.264 320x240 + AAC
-    std::string mkv() const { return mDir + "/av.mkv"; }               // H.264 176x144 + AAC
     std::string audioOnly() const { return mDir + "/audio.m4a"; }      // AAC
     std::string brokenHeader() const { return mDir + "/broken.mp4"; }  // moov overwritten
     std::string truncated() const { return mDir + "/truncated.mp4"; }  // first 60 %

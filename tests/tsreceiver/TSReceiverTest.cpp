@@ -3,7 +3,6 @@
 #include <gtest/gtest.h>
 
 #include <chrono>
-#include <cstdlib>
 #include <memory>
 
 #include "platform/dtv/Demux.h"
@@ -143,22 +142,6 @@ TEST_F(TSReceiverEndToEnd, StreamFromTheByteBuilder) {
         kFour);
 }
 
-TEST_F(TSReceiverEndToEnd, StreamFromTsgen) {
-#ifndef TAVO_TSGEN_PATH
-    GTEST_SKIP() << "tsgen is not built in this tree";
-#else
-    const std::string path = std::string(TAVO_BINARY_DIR) + "/tsreceiver_tsgen.ts";
-    const std::string command = std::string(TAVO_TSGEN_PATH) + " -o " + path +
-                                " -d 2 --size 320x240 --pcr-pid 0x100 --caption 0.2:Ola"
-                                " --seed 4 2>/dev/null";
-    ASSERT_EQ(std::system(command.c_str()), 0) << command;
-    const std::vector<uint8_t> stream = fileBytes(path);
-    std::remove(path.c_str());
-    ASSERT_GT(stream.size(), 188u * 100);
-    run(stream, kFour);
-#endif
-}
-
 TEST_F(TSReceiverEndToEnd, IndependentSampleBroadcast) {
     // A real ISDB-Tb capture: 200 packets, video on 0x111, audio on 0x114 and 0x115.
     const auto plain = fileBytes(kSamples + "188_first200pkts.ts");
@@ -292,18 +275,7 @@ TEST_F(TSReceiverTest, DestroyingARunningReceiverJoinsItsThread) {
     expectNoThreadLeft();
 }
 
-// --- bad input ----------------------------------------------------------------------
-
-TEST_F(TSReceiverTest, FileThatIsNoTransportStreamLeavesTheReceiverRunningIdle) {
-    std::vector<uint8_t> noise(100 * 1024);
-    for (size_t i = 0; i < noise.size(); ++i)
-        noise[i] = static_cast<uint8_t>(i * 31 % 0x46);
-    FileSource source(noise, "");
-    addOutputs(1);
-    configureAndStart({{VIDEO_PID, 0x111}});
-    ASSERT_TRUE(sourceEnded());
-    EXPECT_EQ(drains[0]->count(), 0u);
-}
+// --- diagnostics ------------------------------------------------------------------
 
 TEST_F(TSReceiverTest, DumpListsPidsHandlesAndOutputs) {
     addOutputs(2, 1 << 16, false);

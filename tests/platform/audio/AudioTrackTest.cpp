@@ -4,15 +4,12 @@
 
 #include <cstdint>
 #include <fstream>
-#include <iterator>
-#include <sstream>
 #include <string>
 #include <vector>
 
-#include <utils/String8.h>
-
 #include "platform/audio/AudioSystem.h"
 #include "platform/audio/AudioTrack.h"
+#include "support/TsTestUtil.h"
 
 namespace android {
 namespace {
@@ -37,13 +34,6 @@ protected:
     }
     static void setSink(const std::string& sink) {
         setenv("TAVOPLAYER_PROP_tavoplayer_audio_sink", sink.c_str(), 1);
-    }
-    static std::vector<uint8_t> readFile(const std::string& path, size_t from = 0) {
-        std::ifstream in(path, std::ios::binary);
-        std::vector<uint8_t> bytes((std::istreambuf_iterator<char>(in)),
-                                   std::istreambuf_iterator<char>());
-        return from < bytes.size() ? std::vector<uint8_t>(bytes.begin() + from, bytes.end())
-                                   : std::vector<uint8_t>();
     }
     // (leave ns, bytes) per logged write.
     std::vector<std::pair<int64_t, size_t>> logLines() const {
@@ -116,7 +106,7 @@ TEST_F(AudioPlatformTest, WavSinkKeepsThePcmWrittenWithItsVolumeAndAHeader) {
         ASSERT_EQ(NO_ERROR, track->setVolume(0.0f, 0.0f));
         EXPECT_EQ(4800, track->write(first.data(), first.size()));
     }
-    const std::vector<uint8_t> file = readFile(path);
+    const std::vector<uint8_t> file = TavoPlayer::test::fileBytes(path);
     ASSERT_EQ(44u + 4800 + 1200 + 4800, file.size());
     auto le32 = [&](size_t at) {
         return file[at] | file[at + 1] << 8 | file[at + 2] << 16 | uint32_t(file[at + 3]) << 24;
@@ -186,7 +176,7 @@ TEST_F(AudioPlatformTest, AlsaSinkDeliversThePcmInOrderThroughTheFilePlugin) {
             written.insert(written.end(), chunk.begin(), chunk.end());
         }
     }
-    EXPECT_EQ(written, readFile(raw));
+    EXPECT_EQ(written, TavoPlayer::test::fileBytes(raw));
     EXPECT_EQ(12u, logLines().size());
 }
 
@@ -216,23 +206,6 @@ TEST_F(AudioPlatformTest, DeviceConnectionStatesFollowThePropertyOnEveryQuery) {
                               : AUDIO_POLICY_DEVICE_STATE_UNAVAILABLE,
                   AudioSystem::getDeviceConnectionState(c.device, c.address));
     }
-}
-
-TEST_F(AudioPlatformTest, ForcedRoutingAndParametersAreKept) {
-    EXPECT_EQ(NO_ERROR,
-              AudioSystem::setForceUse(AUDIO_POLICY_FORCE_FOR_MEDIA, AUDIO_POLICY_FORCE_SPEAKER));
-    EXPECT_EQ(AUDIO_POLICY_FORCE_SPEAKER, AudioSystem::getForceUse(AUDIO_POLICY_FORCE_FOR_MEDIA));
-    EXPECT_EQ(BAD_VALUE,
-              AudioSystem::setForceUse(AUDIO_POLICY_FORCE_FOR_MEDIA, AUDIO_POLICY_FORCE_CFG_CNT));
-    EXPECT_EQ(BAD_VALUE,
-              AudioSystem::setForceUse(AUDIO_POLICY_FORCE_USE_CNT, AUDIO_POLICY_FORCE_NONE));
-    EXPECT_EQ(AUDIO_POLICY_FORCE_SPEAKER, AudioSystem::getForceUse(AUDIO_POLICY_FORCE_FOR_MEDIA));
-
-    EXPECT_EQ(NO_ERROR, AudioSystem::setParameters(0, String8("audioParam;DMB_FORCE_SPEAKER=off")));
-    EXPECT_EQ(NO_ERROR, AudioSystem::setParameters(0, String8("DMB_FORCE_SPEAKER=on")));
-    EXPECT_EQ(BAD_VALUE, AudioSystem::setParameters(0, String8("")));
-    EXPECT_STREQ("DMB_FORCE_SPEAKER=on;audioParam=",
-                 AudioSystem::getParameters(0, String8("DMB_FORCE_SPEAKER;audioParam;x")).c_str());
 }
 
 }  // namespace

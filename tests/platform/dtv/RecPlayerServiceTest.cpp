@@ -45,8 +45,7 @@ const std::string& tsgenStream(int seconds) {
     return test::tsgenStream(seconds, "--caption 2:Hello --caption 12:World");
 }
 
-// Events from the service,// Events from the service, as the recorder and the clip player receive
-// them.
+// Events from the service, as the recorder and the clip player receive them.
 struct EventLog {
     static void callback(int event, void* userData) {
         auto* self = static_cast<EventLog*>(userData);

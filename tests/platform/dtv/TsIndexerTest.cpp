@@ -2,28 +2,15 @@
 
 #include <vector>
 
-#include "platform/dtv/PcrPacer.h"
 #include "platform/dtv/TsIndexer.h"
+#include "support/TsPacketBuilder.h"
 
 namespace TavoPlayer {
 namespace {
 
 // A packet of `pid` carrying PCR base `base` (90 kHz), ISO/IEC 13818-1, 2.4.3.4.
-std::vector<uint8_t> pcrPacket(uint16_t pid, uint64_t base, bool discontinuity = false) {
-    std::vector<uint8_t> p(188, 0xFF);
-    p[0] = 0x47;
-    p[1] = static_cast<uint8_t>(pid >> 8);
-    p[2] = static_cast<uint8_t>(pid);
-    p[3] = 0x30;
-    p[4] = 7;
-    p[5] = static_cast<uint8_t>(0x10 | (discontinuity ? 0x80 : 0));
-    p[6] = static_cast<uint8_t>(base >> 25);
-    p[7] = static_cast<uint8_t>(base >> 17);
-    p[8] = static_cast<uint8_t>(base >> 9);
-    p[9] = static_cast<uint8_t>(base >> 1);
-    p[10] = static_cast<uint8_t>(((base & 1) << 7) | 0x7E);
-    p[11] = 0;
-    return p;
+test::TsPacket pcrPacket(uint16_t pid, uint64_t base, bool discontinuity = false) {
+    return test::TsPacketBuilder().pid(pid).pcr(base).discontinuity(discontinuity).build();
 }
 
 TEST(TsIndexerTest, TimeLineSumsPcrIntervalsAcrossWrapsAndNewTimeBases) {

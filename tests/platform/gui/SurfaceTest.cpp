@@ -24,6 +24,21 @@ sp<SinkSurface> createSurface(const std::string& sink, const std::string& logPat
     return static_cast<SinkSurface*>(surface.get());
 }
 
+// Checks that the NV12 planes hold the width x height rectangle of `picture` whose
+// top left corner is at (left, top).
+void expectRegion(const TestPicture& picture, int left, int top, int width, int height,
+                  const uint8_t* y, size_t yStride, const uint8_t* uv, size_t uvStride) {
+    for (int row = 0; row < height; ++row) {
+        for (int col = 0; col < width; ++col)
+            ASSERT_EQ(y[row * yStride + col], picture.lumaAt(row + top, col + left)) << row;
+    }
+    for (int row = 0; row < height / 2; ++row) {
+        for (int byte = 0; byte < width; ++byte)
+            ASSERT_EQ(uv[row * uvStride + byte], picture.chromaAt(row + top / 2, byte + left))
+                << row;
+    }
+}
+
 class NullSinkTest : public testing::Test {
 protected:
     // A 1920 x 1088 coded picture shown with the SPS's crop to 1920 x 1080 is the
@@ -49,14 +64,7 @@ TEST_F(NullSinkTest, CountsCropsAndLogsEveryPicture) {
             ASSERT_NE(last, nullptr);
             ASSERT_EQ(last->width, 64);
             ASSERT_EQ(last->height, 48);
-            for (int row = 0; row < 48; ++row) {
-                for (int col = 0; col < 64; ++col)
-                    ASSERT_EQ(last->y()[row * 64 + col], picture.lumaAt(row + 2, col + 4));
-            }
-            for (int row = 0; row < 24; ++row) {
-                for (int byte = 0; byte < 64; ++byte)
-                    ASSERT_EQ(last->uv()[row * 64 + byte], picture.chromaAt(row + 1, byte + 4));
-            }
+            expectRegion(picture, 4, 2, 64, 48, last->y(), 64, last->uv(), 64);
         }
     }
 
@@ -135,14 +143,7 @@ TEST_F(CaptureBufferTest, MapsTheLastPictureAsNV12AndKeepsItWhileDequeued) {
     const auto* y = static_cast<const uint8_t*>(ycbcr.y);
     const auto* cb = static_cast<const uint8_t*>(ycbcr.cb);
     EXPECT_EQ(cb, y + 48 * 32);
-    for (int row = 0; row < 32; ++row) {
-        for (int col = 0; col < 48; ++col)
-            ASSERT_EQ(y[row * 48 + col], first.lumaAt(row, col));
-    }
-    for (int row = 0; row < 16; ++row) {
-        for (int byte = 0; byte < 48; ++byte)
-            ASSERT_EQ(cb[row * 48 + byte], first.chromaAt(row, byte));
-    }
+    expectRegion(first, 0, 0, 48, 32, y, 48, cb, 48);
     EXPECT_EQ(mMapper.unlock(buffer), 0);
 
     // A part of the picture comes packed at its own width.
@@ -185,14 +186,7 @@ protected:
     }
     static void expectCropOf(const TestPicture& picture, const uint8_t* y, size_t yStride,
                              const uint8_t* uv, size_t uvStride) {
-        for (int row = 0; row < 48; ++row) {
-            for (int col = 0; col < 64; ++col)
-                ASSERT_EQ(y[row * yStride + col], picture.lumaAt(row + 2, col + 4)) << row;
-        }
-        for (int row = 0; row < 24; ++row) {
-            for (int byte = 0; byte < 64; ++byte)
-                ASSERT_EQ(uv[row * uvStride + byte], picture.chromaAt(row + 1, byte + 4)) << row;
-        }
+        expectRegion(picture, 4, 2, 64, 48, y, yStride, uv, uvStride);
     }
 };
 

@@ -30,19 +30,16 @@ SurfacePicture TestPicture::picture() const {
     return SurfacePicture{y.data(), stride, uv.data(), stride, width, height, ptsUs, false, true};
 }
 
-ScopedSinkProperties::ScopedSinkProperties(const std::string& sink, const std::string& logPath,
-                                           const std::string& deinterlace) {
+ScopedSinkProperties::ScopedSinkProperties(const std::string& sink, const std::string& logPath) {
     setenv("TAVOPLAYER_PROPERTIES", "/dev/null", 1);
     setenv("TAVOPLAYER_PROP_tavoplayer_video_sink", sink.c_str(), 1);
     setenv("TAVOPLAYER_PROP_tavoplayer_video_log", logPath.c_str(), 1);
-    setenv("TAVOPLAYER_PROP_tavoplayer_video_deinterlace", deinterlace.c_str(), 1);
 }
 
 ScopedSinkProperties::~ScopedSinkProperties() {
     unsetenv("TAVOPLAYER_PROPERTIES");
     unsetenv("TAVOPLAYER_PROP_tavoplayer_video_sink");
     unsetenv("TAVOPLAYER_PROP_tavoplayer_video_log");
-    unsetenv("TAVOPLAYER_PROP_tavoplayer_video_deinterlace");
 }
 
 std::string readFile(const std::string& path) {

@@ -31,8 +31,7 @@ struct TestPicture {
 // Sets the sink properties through the environment for the fixture's lifetime.
 class ScopedSinkProperties {
 public:
-    ScopedSinkProperties(const std::string& sink, const std::string& logPath = "",
-                         const std::string& deinterlace = "");
+    explicit ScopedSinkProperties(const std::string& sink, const std::string& logPath = "");
     ~ScopedSinkProperties();
 };
 

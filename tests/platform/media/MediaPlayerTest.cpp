@@ -157,7 +157,6 @@ TEST_P(MediaPlayerPlaybackTest, PreparesPlaysToTheEndAndNotifiesInOrder) {
 INSTANTIATE_TEST_SUITE_P(
     Files, MediaPlayerPlaybackTest,
     ::testing::Values(PlaybackCase{"Mp4", &MediaTestFiles::mp4, 320, 240, true},
-                      PlaybackCase{"Mkv", &MediaTestFiles::mkv, 176, 144, true},
                       PlaybackCase{"AudioOnly", &MediaTestFiles::audioOnly, 0, 0, true},
                       PlaybackCase{"Truncated", &MediaTestFiles::truncated, 320, 240, false}),
     [](const auto& info) { return std::string(info.param.name); });

@@ -8,7 +8,9 @@
 
 #include "platform/os/Properties.h"
 #include "platform/os/Trace.h"
+#include "support/ScopedEnv.h"
 #include "support/TraceCapture.h"
+#include "support/TsTestUtil.h"
 
 namespace TavoPlayer {
 namespace {
@@ -18,21 +20,9 @@ namespace {
 
 class PropertiesTest : public ::testing::Test {
 protected:
-    void SetUp() override {
-        char name[] = "/tmp/tavo-propsXXXXXX";
-        const int fd = mkstemp(name);
-        ASSERT_GE(fd, 0);
-        close(fd);
-        mPath = name;
-        setenv("TAVOPLAYER_PROPERTIES", mPath.c_str(), 1);
-    }
-    void TearDown() override {
-        unsetenv("TAVOPLAYER_PROPERTIES");
-        unsetenv("TAVOPLAYER_PROP_tavoplayer_demux_source");
-        unlink(mPath.c_str());
-    }
-    void write(const std::string& text) { std::ofstream(mPath) << text; }
-    std::string mPath;
+    void write(const std::string& text) { std::ofstream(mFile.path()) << text; }
+    test::TempFile mFile{{}, ".prop"};
+    test::ScopedEnv mProperties{"TAVOPLAYER_PROPERTIES", mFile.path()};
 };
 
 TEST_F(PropertiesTest, ValuesComeFromTheFileTrimmedAndLastOneWins) {
@@ -59,9 +49,10 @@ TEST_F(PropertiesTest, ValuesComeFromTheFileTrimmedAndLastOneWins) {
 TEST_F(PropertiesTest, EnvironmentOverridesTheFileAndAMissingFileGivesTheDefault) {
     write("tavoplayer.demux.source=file:/a.ts\n");
     EXPECT_EQ("file:/a.ts", propertyGetString("tavoplayer.demux.source", "stdin"));
-    setenv("TAVOPLAYER_PROP_tavoplayer_demux_source", "udp://239.1.1.1:1234", 1);
-    EXPECT_EQ("udp://239.1.1.1:1234", propertyGetString("tavoplayer.demux.source", "stdin"));
-    unsetenv("TAVOPLAYER_PROP_tavoplayer_demux_source");
+    {
+        test::ScopedEnv source("TAVOPLAYER_PROP_tavoplayer_demux_source", "udp://239.1.1.1:1234");
+        EXPECT_EQ("udp://239.1.1.1:1234", propertyGetString("tavoplayer.demux.source", "stdin"));
+    }
     setenv("TAVOPLAYER_PROPERTIES", "/nonexistent/dir/system.prop", 1);
     EXPECT_EQ("stdin", propertyGetString("tavoplayer.demux.source", "stdin"));
 }

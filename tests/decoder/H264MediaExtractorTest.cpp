@@ -214,7 +214,33 @@ protected:
     Bytes mOut = Bytes(1 << 16);
 };
 
-// --- emulation prevention -----------------------------------------------------------
+// --- Exp-Golomb and emulation prevention ------------------------------------------------
+
+class H264GolombTest : public H264Fixture {};
+
+// The codes read back as written; a code running off the buffer (24 zeros, no 1) stops
+// at the buffer's end. Signed codes occur only in SPS fields whose values nothing
+// downstream reads (POC type 1, scaling lists), so no stream comparison sees a wrong
+// se(v) mapping: this does.
+TEST_F(H264GolombTest, UnsignedAndSignedCodesRoundTrip) {
+    const uint64_t unsignedValues[] = {0, 1, 2, 3, 6, 7, 254, 255, 65535, 0x7FFFFFFE, 0xFFFFFFFE};
+    const int64_t signedValues[] = {0, 1, -1, 2, -2, 100, -100, 32767, -32768};
+    Rbsp r;
+    for (uint64_t v : unsignedValues)
+        r.ue(v);
+    for (int64_t v : signedValues)
+        r.se(v);
+    Bytes bytes = r.bytes();
+    ReadBitInterface reader(bytes.data(), bytes.size());
+    for (uint64_t v : unsignedValues)
+        EXPECT_EQ(mExtractor->parseUEGolomb(&reader), v);
+    for (int64_t v : signedValues)
+        EXPECT_EQ(mExtractor->parseSEGolomb(&reader), v);
+    Bytes zeros(3, 0x00);
+    ReadBitInterface short3(zeros.data(), zeros.size());
+    mExtractor->parseUEGolomb(&short3);
+    EXPECT_EQ(short3.remainingBytes(), 0u);
+}
 
 class H264EmulationPreventionTest : public H264Fixture {};
 

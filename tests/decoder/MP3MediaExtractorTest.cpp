@@ -180,27 +180,6 @@ TEST_F(MP3ExtractorFixture, TooFewBytesForTheNextHeader) {
 
 using Units = std::vector<ExtractedUnit>;
 
-// Four 128 kbit/s 44.1 kHz frames (2340 ticks each) cut into records: a frame keeps
-// the PTS current where it began; a record's own PTS is not advanced by a frame that
-// began before it.
-TEST_F(MP3ExtractorFixture, FramesStraddlingRecordsAreWholeWithThePtsOfTheirStart) {
-    std::vector<Bytes> frames;
-    for (uint8_t i = 0; i < 4; ++i)
-        frames.push_back(frame({}, 417, i));
-    const Bytes es = test::joinEs(test::groupCuts(frames, 1, 0, 0));
-    // A: frame 0 and 100 bytes of 1; B: the rest of 1, frame 2, 200 bytes of 3; C: the rest.
-    EXPECT_EQ(run(test::cutAt(es, {0, 517, 1451}, {1000, 50000, 90000})),
-              (Units{{frames[0], 1000, 0},
-                     {frames[1], 1000 + 2340, 0},
-                     {frames[2], 50000, 0},
-                     {frames[3], 50000 + 2340, 0}}));
-    // Frame 0 spread over three records, frame 1 starting the fourth.
-    SetUp();
-    EXPECT_EQ(run(test::cutAt(test::concat({frames[0], frames[1]}), {0, 100, 250, 417},
-                              {10, 20, 30, 40})),
-              (Units{{frames[0], 10, 0}, {frames[1], 40, 0}}));
-}
-
 TEST_F(MP3ExtractorFixture, ResyncSkipsGarbageAndFalseSyncs) {
     // FF E0 with a reserved layer: a false sync that must be stepped over.
     const Bytes garbage = {0x00, 0x12, 0xFF, 0xE0, 0x00, 0x00, 0x00, 0x00, 0x7F};

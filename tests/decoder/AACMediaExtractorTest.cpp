@@ -1,6 +1,7 @@
-// The AAC extractor over PES records in a ring: configuration first and again after
-// reset, the switch between LOAS and ADTS, PTS of units that straddle records,
-// re-segmentation, golden dumps and records that lie about their sizes.
+// The AAC extractor over PES records in a ring: configuration again after reset, the
+// switch between LOAS and ADTS, golden dumps, a writer thread, and records that lie
+// about their sizes. Units, re-segmentation and time stamps against FFmpeg's are in
+// AACReferenceTest.cpp.
 #include "decoder/AACMediaExtractor.h"
 
 #include <gtest/gtest.h>
@@ -88,30 +89,6 @@ protected:
         return extract(GetParam());
     }
 };
-
-// The configuration takes the first unit's place, then every unit follows but the
-// last, which waits for the header of a next one; the same however the PES are cut.
-TEST_P(AACFramingTest, ConfigurationFirstThenTheSameUnitsHoweverThePesAreCut) {
-    const Stream s = makeStream(GetParam(), 40);
-    const auto onePerPes = unitsOf(test::groupCuts(s.frames, 1, 9000, kTicksPerFrame48k));
-    ASSERT_EQ(s.units.size() - 1, onePerPes.size());
-    EXPECT_EQ(AACMediaExtractor::FLAG_CODEC_CONFIG, onePerPes[0].flags);
-    EXPECT_EQ(kLcStereo48kAsc, onePerPes[0].bytes);
-    for (size_t i = 1; i < onePerPes.size(); ++i) {
-        EXPECT_EQ(0, onePerPes[i].flags) << i;
-        EXPECT_EQ(s.units[i], onePerPes[i].bytes) << i;
-    }
-    // The unit after the configuration is the second of the first record's stream.
-    EXPECT_EQ(9000 + static_cast<long long>(kTicksPerFrame48k), onePerPes[1].pts);
-    EXPECT_EQ(1u, mTrace.count("getDecodableUnit: found aac codec config"));
-    EXPECT_EQ(0u, mRing->usedSpace()) << "every record consumed";
-
-    const auto bytes = test::bytesOf(onePerPes);
-    const auto es = test::joinEs(test::groupCuts(s.frames, 1, 0, 0));
-    for (size_t cut : {97, 13})
-        EXPECT_EQ(bytes, test::bytesOf(unitsOf(test::fixedCuts(es, cut, 0, 0)))) << cut;
-    EXPECT_EQ(bytes, test::bytesOf(unitsOf(test::groupCuts(s.frames, 3, 0, 0))));
-}
 
 // One line per unit (PTS, flags, size, hash) against a checked-in dump. Run with
 // TAVO_UPDATE_GOLDEN=1 to rewrite the dumps after an intended change.
@@ -219,57 +196,6 @@ TEST_F(AACExtractorTest, NoSwitchAfterTheFirstConfiguration) {
     EXPECT_EQ(AACMediaExtractor::TRANSPORT_LAYER_LOAS, mExtractor->transportLayer());
     EXPECT_EQ(3u, units.size());
     EXPECT_EQ(0u, mTrace.count("supect count"));
-}
-
-// ---- PTS ------------------------------------------------------------------------------
-
-TEST_F(AACExtractorTest, UnitEndingInTheNextRecordKeepsTheEarlierPts) {
-    // Record A: frames 0, 1 and half of 2; record B: the rest, at an unrelated PTS.
-    const Stream s = makeStream(kLoas, 5);
-    const size_t cut = s.frames[0].size() + s.frames[1].size() + s.frames[2].size() / 2;
-    constexpr long long kPtsA = 100000;
-    constexpr long long kPtsB = 777777;
-    writeChunks(
-        test::cutAt(test::joinEs(test::groupCuts(s.frames, 1, 0, 0)), {0, cut}, {kPtsA, kPtsB}));
-    const auto units = extract(kLoas);
-    ASSERT_EQ(4u, units.size());
-    EXPECT_EQ((std::vector<ExtractedUnit>{{s.units[1], kPtsA + kTicksPerFrame48k, 0},
-                                          {s.units[2], kPtsA + 2 * kTicksPerFrame48k, 0},
-                                          {s.units[3], kPtsB, 0}}),
-              std::vector<ExtractedUnit>(units.begin() + 1, units.end()));
-}
-
-// One frame per PES: each unit carries its own record's PTS although every frame is
-// handed out only when the next record shows the next header.
-TEST_F(AACExtractorTest, OneFramePerPesGivesEachUnitItsRecordsPts) {
-    const Stream s = makeStream(kAdts, 6);
-    writeRecords(s.frames, 4000, kTicksPerFrame48k + 7);  // a step unlike the duration
-    const auto units = extract(kAdts);
-    std::vector<ExtractedUnit> expected = {
-        {kLcStereo48kAsc, 4000, AACMediaExtractor::FLAG_CODEC_CONFIG}};
-    for (size_t i = 1; i < 5; ++i) {
-        expected.push_back(
-            {s.units[i], static_cast<long long>(4000 + i * (kTicksPerFrame48k + 7)), 0});
-    }
-    EXPECT_EQ(expected, units);
-}
-
-TEST_F(AACExtractorTest, FrameDurationFollowsTheReportedConfiguration) {
-    // HE-AAC, core 24 kHz: 1024 core samples last 3840 ticks.
-    const LoasOptions o{.asc = {.samplingFrequencyIndex = 6,
-                                .hierarchicalExtension = 5,
-                                .extensionSamplingFrequencyIndex = 3}};
-    std::vector<uint8_t> record;
-    for (uint32_t i = 0; i < 4; ++i) {
-        const auto f = loasFrame(o, {patternPayload(50, i)});
-        record.insert(record.end(), f.begin(), f.end());
-    }
-    ASSERT_TRUE(test::writePesRecord(*mRing, record, 5000, 0xC0));
-    const auto units = extract(kLoas);
-    ASSERT_EQ(3u, units.size());
-    EXPECT_EQ((std::vector<uint8_t>{0x2B, 0x11, 0x88, 0, 0, 0, 0, 0, 0, 0}), units[0].bytes);
-    EXPECT_EQ(5000 + 3840, units[1].pts);
-    EXPECT_EQ(5000 + 2 * 3840, units[2].pts);
 }
 
 // ---- a writer thread on the other side ----------------------------------------------

@@ -219,7 +219,9 @@ protected:
 class H264GolombTest : public H264Fixture {};
 
 // The codes read back as written; a code running off the buffer (24 zeros, no 1) stops
-// at the buffer's end.
+// at the buffer's end. Signed codes occur only in SPS fields whose values nothing
+// downstream reads (POC type 1, scaling lists), so no stream comparison sees a wrong
+// se(v) mapping: this does.
 TEST_F(H264GolombTest, UnsignedAndSignedCodesRoundTrip) {
     const uint64_t unsignedValues[] = {0, 1, 2, 3, 6, 7, 254, 255, 65535, 0x7FFFFFFE, 0xFFFFFFFE};
     const int64_t signedValues[] = {0, 1, -1, 2, -2, 100, -100, 32767, -32768};
@@ -476,8 +478,6 @@ class H264AccessUnitTest : public H264Fixture {};
 
 using Units = std::vector<ExtractedUnit>;
 constexpr unsigned char kIdrSps = H264MediaExtractor::kFlagIdr | H264MediaExtractor::kFlagSps;
-const SpsParams kInterlaced{
-    .heightMapUnits = 34, .frameMbsOnly = false, .cropBottom = 2, .picStructPresent = true};
 
 TEST_F(H264AccessUnitTest, DelimiterSplitsRecordIntoTwoUnits) {
     const Bytes first = concat(
@@ -529,17 +529,6 @@ TEST_F(H264AccessUnitTest, PicStructStreamWaitsForPictureTiming) {
     const Bytes third = concat({aud(), slice(0x41, 0)});
     EXPECT_EQ(run({{first, 0}, {concat({second, third}), 9000}}),
               (Units{{first, 0, kIdrSps}, {second, 9000, 0}, {third, 9000 + 1501, 0}}));
-}
-
-TEST_F(H264AccessUnitTest, InterlacedStreamOfFramePicturesIsStampedEvery1501Ticks) {
-    // 29.97 Hz, num_units_in_tick 1001, time_scale 60000, fixed rate, pic_struct 0:
-    // 1001 x 90000 / 60000 = 1501 ticks per unit (a tick is one field period).
-    const Bytes unit1 = concat({aud(), spsNal(kInterlaced), pps(), picTimingSei(0),
-                                slice(0x65, 0, true, 0), slice(0x65, 30, false, 0)});
-    const Bytes unit2 = concat({aud(), picTimingSei(0), slice(0x41, 0, true, 0)});
-    EXPECT_EQ(run({{concat({unit1, unit2, unit2}), 5000}}),
-              (Units{{unit1, 5000, kIdrSps}, {unit2, 5000 + 1501, 0}, {unit2, 5000 + 3002, 0}}));
-    EXPECT_EQ(mExtractor->getCroppedHeight(), 1080u);
 }
 
 TEST_F(H264AccessUnitTest, FieldPairsInOneRecordAreCutAtEveryFirstMbZero) {

@@ -324,24 +324,6 @@ protected:
     const std::vector<uint8_t> kBytes = {0xA5, 0x3C, 0xFF, 0x01, 0x80};
 };
 
-TEST_F(TransportBitReaderTest, ReadsFieldsMsbFirstAcrossBytes) {
-    struct Row {
-        unsigned int skip;
-        unsigned int count;
-        uint32_t value;
-    };
-    for (const Row& row :
-         {Row{0, 8, 0xA5}, Row{4, 8, 0x53}, Row{3, 13, 0x053C}, Row{0, 32, 0xA53CFF01},
-          Row{7, 32, 0x9E7F80C0}, Row{39, 1, 0}, Row{32, 1, 1}}) {
-        TransportBitReader r(kBytes.data(), static_cast<uint32_t>(kBytes.size()));
-        r.skipBits(row.skip);
-        EXPECT_EQ(row.value, r.peekBits(row.count)) << row.skip << "+" << row.count;
-        EXPECT_EQ(row.value, r.readBits(row.count)) << row.skip << "+" << row.count;
-        EXPECT_EQ(row.skip + row.count, r.bitPosition());
-        EXPECT_FALSE(r.overrun());
-    }
-}
-
 TEST_F(TransportBitReaderTest, ReadingPastTheEndLatchesOverrunWithoutMoving) {
     TransportBitReader r(kBytes.data(), static_cast<uint32_t>(kBytes.size()));
     r.skipBits(36);

@@ -7,7 +7,6 @@
 #include <vector>
 
 #include "AacFramer.h"
-#include "BitWriter.h"
 #include "CaptionWriter.h"
 #include "H264SpsEditor.h"
 #include "TsMuxer.h"
@@ -30,30 +29,6 @@ std::vector<uint8_t> bits(std::string text) {
     for (size_t i = 0; i < text.size(); ++i)
         out[i / 8] |= (text[i] == '1' ? 0x80 : 0) >> (i % 8);
     return out;
-}
-
-TEST(BitWriterTest, ExpGolombCodesMatchTheStandardTable) {
-    // ITU-T H.264, Table 9-2.
-    const struct {
-        uint32_t value;
-        std::string bits;
-    } kCases[] = {{0, "1"},     {1, "010"},     {2, "011"},      {3, "00100"},
-                  {6, "00111"}, {7, "0001000"}, {14, "0001111"}, {255, "00000000100000000"}};
-    for (const auto& c : kCases) {
-        BitWriter w;
-        w.putUe(c.value);
-        EXPECT_EQ(w.bitCount(), c.bits.size()) << "ue(" << c.value << ")";
-        w.alignZero();
-        EXPECT_EQ(w.bytes(), bits(c.bits)) << "ue(" << c.value << ")";
-        uint32_t back = 0;
-        BitReader r(w.bytes().data(), w.bytes().size());
-        EXPECT_TRUE(r.getUe(back) && back == c.value) << "read back " << back;
-    }
-    const uint8_t zeros[] = {0x00};  // eight zeros and no terminating one
-    BitReader r(zeros, sizeof zeros);
-    uint32_t v = 0;
-    EXPECT_FALSE(r.getUe(v));
-    EXPECT_EQ(r.bitsLeft(), 0u);
 }
 
 TEST(AacFramerTest, FramesMatchTheSyntaxTables) {

@@ -14,17 +14,6 @@ void BitWriter::putBits(uint32_t value, int count) {
     }
 }
 
-void BitWriter::putUe(uint32_t value) {
-    const uint64_t codeNum = static_cast<uint64_t>(value) + 1;
-    int bits = 0;
-    while ((codeNum >> bits) > 1) {
-        ++bits;
-    }
-    putBits(0, bits);
-    putBits(static_cast<uint32_t>(codeNum >> 32), bits + 1 > 32 ? bits + 1 - 32 : 0);
-    putBits(static_cast<uint32_t>(codeNum), bits + 1 > 32 ? 32 : bits + 1);
-}
-
 void BitWriter::alignZero() {
     while (mBitCount % 8 != 0) {
         putBits(0, 1);

@@ -12,8 +12,6 @@ class BitWriter {
 public:
     void putBits(uint32_t value, int count);
     void putBit(bool bit) { putBits(bit ? 1 : 0, 1); }
-    // ITU-T H.264, 9.1: unsigned Exp-Golomb code.
-    void putUe(uint32_t value);
     void alignZero();
     bool byteAligned() const { return mBitCount % 8 == 0; }
     size_t bitCount() const { return mBitCount; }

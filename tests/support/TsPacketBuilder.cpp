@@ -23,23 +23,16 @@ TsPacket TsPacketBuilder::build() const {
     packet.fill(0xFF);
 
     // Adaptation field body: flags byte and optional parts.
-    const bool anyField = mDiscontinuity || mRandomAccess || mPcr || mOpcr || mSplice || mPrivate;
+    const bool anyField = mDiscontinuity || mRandomAccess || mPcr || mOpcr;
     std::vector<uint8_t> field;
     if (anyField) {
         // ISO/IEC 13818-1, 2.4.3.4: the flags byte, then the parts in flag order.
         field.push_back(static_cast<uint8_t>(mDiscontinuity << 7 | mRandomAccess << 6 |
-                                             mPcr.has_value() << 4 | mOpcr.has_value() << 3 |
-                                             mSplice.has_value() << 2 | mPrivate.has_value() << 1));
+                                             mPcr.has_value() << 4 | mOpcr.has_value() << 3));
         if (mPcr)
             appendClock(&field, mPcr->first, mPcr->second);
         if (mOpcr)
             appendClock(&field, mOpcr->first, mOpcr->second);
-        if (mSplice)
-            field.push_back(*mSplice);
-        if (mPrivate) {
-            field.push_back(static_cast<uint8_t>(mPrivate->size()));
-            field.insert(field.end(), mPrivate->begin(), mPrivate->end());
-        }
     }
     const size_t payloadSize = mPayload ? mPayload->size() : 0;
     const bool hasField = anyField || (mPayload && payloadSize < 184) || !mPayload;
@@ -60,7 +53,7 @@ TsPacket TsPacketBuilder::build() const {
 
     packet[0] = mSync;
     packet[1] = static_cast<uint8_t>((mTransportError ? 0x80 : 0) | (mUnitStart ? 0x40 : 0) |
-                                     (mPriority ? 0x20 : 0) | ((mPid >> 8) & 0x1F));
+                                     ((mPid >> 8) & 0x1F));
     packet[2] = static_cast<uint8_t>(mPid);
     packet[3] = static_cast<uint8_t>((mScrambling << 6) | (control << 4) | mContinuity);
     if (mRaw) {

@@ -22,7 +22,6 @@ public:
     TsPacketBuilder& continuity(uint8_t v) { return set(mContinuity, uint8_t(v & 0x0F)); }
     TsPacketBuilder& scrambling(uint8_t v) { return set(mScrambling, uint8_t(v & 3)); }
     TsPacketBuilder& transportError(bool on = true) { return set(mTransportError, on); }
-    TsPacketBuilder& priority(bool on = true) { return set(mPriority, on); }
     TsPacketBuilder& syncByte(uint8_t v) { return set(mSync, v); }
     // Forces adaptation_field_control (else derived: 1 payload only, 2 field only,
     // 3 both).
@@ -33,8 +32,6 @@ public:
     TsPacketBuilder& randomAccess(bool on = true) { return set(mRandomAccess, on); }
     TsPacketBuilder& pcr(uint64_t base, uint16_t ext = 0) { return set(mPcr, Clock{base, ext}); }
     TsPacketBuilder& opcr(uint64_t base, uint16_t ext = 0) { return set(mOpcr, Clock{base, ext}); }
-    TsPacketBuilder& spliceCountdown(uint8_t v) { return set(mSplice, v); }
-    TsPacketBuilder& privateData(Bytes v) { return set(mPrivate, std::move(v)); }
     // Replaces everything after the header by these bytes (byte 4 onward), for
     // lengths and layouts the standard does not allow.
     TsPacketBuilder& rawAfterHeader(Bytes v) { return set(mRaw, std::move(v)); }
@@ -55,15 +52,12 @@ private:
     uint8_t mContinuity = 0;
     uint8_t mScrambling = 0;
     bool mTransportError = false;
-    bool mPriority = false;
     uint8_t mSync = 0x47;
     std::optional<uint8_t> mControl;
     bool mDiscontinuity = false;
     bool mRandomAccess = false;
     std::optional<Clock> mPcr;
     std::optional<Clock> mOpcr;
-    std::optional<uint8_t> mSplice;
-    std::optional<Bytes> mPrivate;
     std::optional<Bytes> mRaw;
     std::optional<Bytes> mPayload;
 };

@@ -12,6 +12,7 @@
 
 #include "service/BnCTavoPlayerClient.h"
 #include "support/ScopedEnv.h"
+#include "support/TsTestUtil.h"
 
 namespace TavoPlayer {
 namespace {
@@ -113,6 +114,27 @@ TEST(CTavoPlayerTest, CommandsInEachStateGiveTheirResultsCallbacksAndState) {
         EXPECT_EQ(player->getState(), c.state);
         player->close();
     }
+}
+
+// A viewer's lip-sync setting reaches the picture less its bias of 200 ms, whether
+// it was given before the broadcast was opened or while it is open.
+TEST(CTavoPlayerTest, AVSyncReachesThePicturesLessItsBias) {
+    const test::ScopedEnv video("TAVOPLAYER_PROP_tavoplayer_video_sink", "null");
+    const test::ScopedEnv audio("TAVOPLAYER_PROP_tavoplayer_audio_sink", "null");
+    android::sp<CTavoPlayer> player = new CTavoPlayer();
+    const auto offset = [&] {
+        const std::string dump = test::printed([&](FILE* out) {
+            player->controller()->dump(out, android::Vector<android::String16>(), 0);
+        });
+        const size_t at = dump.find("A/V offset: ");
+        return at == std::string::npos ? dump : dump.substr(at, dump.find('\n', at) - at);
+    };
+    player->setAVSync(330);
+    ASSERT_EQ(player->openUri(kLiveUri, 5), 0u);
+    EXPECT_EQ(offset(), "A/V offset: 130 ms");
+    player->setAVSync(150);
+    EXPECT_EQ(offset(), "A/V offset: -50 ms");
+    player->close();
 }
 
 TEST(CTavoPlayerTest, ANewClientReplacesTheOldAndTheSameOneTwiceChangesNothing) {

@@ -1,7 +1,6 @@
 #include "PesRecordTestUtil.h"
 
 #include <algorithm>
-#include <atomic>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
@@ -9,10 +8,10 @@
 #include <fstream>
 #include <functional>
 #include <new>
-#include <thread>
 
-#include "common/Synchronization.h"
 #include "common/data/PESData.h"
+#include "support/ParseTs.h"
+#include "support/PesBuilder.h"
 #include "tsparser/TSParser.h"
 
 extern "C" {
@@ -20,6 +19,18 @@ extern "C" {
 }
 
 namespace TavoPlayer::test {
+
+namespace {
+
+// FNV-1a 64 of the bytes, for golden dumps.
+uint64_t fnv1a64(const uint8_t* data, size_t size) {
+    uint64_t hash = 0xcbf29ce484222325ull;
+    for (size_t i = 0; i < size; ++i)
+        hash = (hash ^ data[i]) * 0x100000001b3ull;
+    return hash;
+}
+
+}  // namespace
 
 void BitSink::put(uint32_t value, unsigned int bits) {
     for (unsigned int i = bits; i-- > 0; ++mBits) {
@@ -49,45 +60,20 @@ bool writeRawRecord(RingBuffer& ring, uint32_t size, uint32_t offsetES, uint32_t
 }
 
 bool writePesRecord(RingBuffer& ring, const Bytes& es, uint64_t pts, uint8_t streamId) {
-    // PES header: prefix, stream_id, PES_packet_length, flags '10' 00 0 0 0 0,
-    // PTS_DTS_flags '10', header length 5, then the 5-byte PTS.
-    constexpr uint32_t kPesHeader = 14;
-    const auto pesSize = static_cast<uint32_t>(kPesHeader + es.size());
-    const uint32_t packetLength = pesSize > 6 + 0xFFFF ? 0 : pesSize - 6;
     const uint64_t p = pts & 0x1FFFFFFFFull;
-    // clang-format off
-    const Bytes header = {
-        0x00, 0x00, 0x01, streamId,
-        static_cast<uint8_t>(packetLength >> 8), static_cast<uint8_t>(packetLength),
-        0x80, 0x80, 0x05,
-        static_cast<uint8_t>(0x21 | ((p >> 29) & 0x0E)), static_cast<uint8_t>(p >> 22),
-        static_cast<uint8_t>(((p >> 14) & 0xFE) | 1), static_cast<uint8_t>(p >> 7),
-        static_cast<uint8_t>(((p << 1) & 0xFE) | 1)};
-    // clang-format on
-    return writeRawRecord(ring, PESData::kHeaderSize + pesSize, PESData::kHeaderSize + kPesHeader,
-                          static_cast<uint32_t>(es.size()), p, concat({header, es}));
-}
-
-std::vector<PesChunk> cutAt(const Bytes& es, const std::vector<size_t>& offsets,
-                            const std::vector<uint64_t>& ptsOf) {
-    std::vector<PesChunk> chunks;
-    for (size_t i = 0; i < offsets.size(); ++i) {
-        const size_t end = i + 1 < offsets.size() ? offsets[i + 1] : es.size();
-        chunks.push_back(
-            {Bytes(es.begin() + static_cast<long>(offsets[i]), es.begin() + static_cast<long>(end)),
-             ptsOf[i]});
-    }
-    return chunks;
+    const Bytes pes = PesBuilder(streamId).pts(p).payload(es).build();
+    return writeRawRecord(ring, PESData::kHeaderSize + static_cast<uint32_t>(pes.size()),
+                          PESData::kHeaderSize + 14, static_cast<uint32_t>(es.size()), p, pes);
 }
 
 std::vector<PesChunk> fixedCuts(const Bytes& es, size_t size, uint64_t firstPts, uint64_t ptsStep) {
-    std::vector<size_t> offsets;
-    std::vector<uint64_t> pts;
+    std::vector<PesChunk> chunks;
     for (size_t at = 0; at < es.size(); at += size) {
-        offsets.push_back(at);
-        pts.push_back(firstPts + pts.size() * ptsStep);
+        const auto end = es.begin() + static_cast<long>(std::min(at + size, es.size()));
+        chunks.push_back(
+            {Bytes(es.begin() + static_cast<long>(at), end), firstPts + chunks.size() * ptsStep});
     }
-    return cutAt(es, offsets, pts);
+    return chunks;
 }
 
 std::vector<PesChunk> groupCuts(const std::vector<Bytes>& units, size_t perPes, uint64_t firstPts,
@@ -150,20 +136,37 @@ unsigned int pullUnit(MediaExtractor& extractor, Bytes& out, std::vector<Extract
     return result;
 }
 
-std::vector<ExtractedUnit> runExtractor(MediaExtractor& extractor, RingBuffer& ring,
-                                        const std::vector<PesChunk>& chunks, size_t outputSize) {
+namespace {
+
+// Writes the records with `write`, pulling units whenever the ring has no room for the
+// next one (so one thread can do both sides), then pulls until no input is left.
+std::vector<ExtractedUnit> feedAndPull(MediaExtractor& extractor, RingBuffer& ring, size_t count,
+                                       const std::function<uint32_t(size_t)>& footprint,
+                                       const std::function<void(size_t)>& write,
+                                       size_t outputSize) {
     std::vector<ExtractedUnit> units;
     Bytes out(outputSize);
-    for (const PesChunk& chunk : chunks) {
-        const auto need = RingBuffer::roundUp4(PESData::kHeaderSize + 14 +
-                                               static_cast<uint32_t>(chunk.es.size()));
-        while (ring.freeSpace() < need && pullUnit(extractor, out, &units) == 0) {
+    for (size_t i = 0; i < count; ++i) {
+        while (ring.freeSpace() < footprint(i) && pullUnit(extractor, out, &units) == 0) {
         }
-        writePesRecord(ring, chunk.es, chunk.pts);
+        write(i);
     }
     while (pullUnit(extractor, out, &units) == MediaExtractor::RESULT_OK) {
     }
     return units;
+}
+
+}  // namespace
+
+std::vector<ExtractedUnit> runExtractor(MediaExtractor& extractor, RingBuffer& ring,
+                                        const std::vector<PesChunk>& chunks, size_t outputSize) {
+    return feedAndPull(
+        extractor, ring, chunks.size(),
+        [&](size_t i) {
+            return RingBuffer::roundUp4(PESData::kHeaderSize + 14 +
+                                        static_cast<uint32_t>(chunks[i].es.size()));
+        },
+        [&](size_t i) { writePesRecord(ring, chunks[i].es, chunks[i].pts); }, outputSize);
 }
 
 std::vector<ExtractedUnit> drain(MediaExtractor& extractor, size_t outputSize, int idleCalls) {
@@ -181,53 +184,31 @@ std::vector<ExtractedUnit> drain(MediaExtractor& extractor, size_t outputSize, i
 
 void feedPid(RingBuffer& input, const Bytes& ts, uint16_t pid,
              std::chrono::steady_clock::time_point deadline) {
-    for (size_t at = 0; at + 188 <= ts.size() && std::chrono::steady_clock::now() < deadline;) {
-        Bytes batch;
-        for (; at + 188 <= ts.size() && batch.size() < 64 * 188; at += 188) {
-            if ((((ts[at + 1] & 0x1F) << 8) | ts[at + 2]) == pid)
-                batch.insert(batch.end(), ts.begin() + static_cast<long>(at),
-                             ts.begin() + static_cast<long>(at + 188));
-        }
-        while (!batch.empty() && std::chrono::steady_clock::now() < deadline) {
-            if (input.waitForSpace(static_cast<uint32_t>(batch.size()))) {
-                std::memcpy(input.writePointer(), batch.data(), batch.size());
-                input.commitWrite(static_cast<uint32_t>(batch.size()));
-                batch.clear();
-            }
+    const Bytes packets = bytesOfPid(ts, pid);
+    for (size_t at = 0; at < packets.size() && std::chrono::steady_clock::now() < deadline;) {
+        const auto size = static_cast<uint32_t>(std::min<size_t>(64 * 188, packets.size() - at));
+        if (input.waitForSpace(size)) {
+            std::memcpy(input.writePointer(), packets.data() + at, size);
+            input.commitWrite(size);
+            at += size;
         }
     }
 }
 
-std::vector<ExtractedUnit> runThroughTsParser(MediaExtractor& extractor,
-                                              const android::sp<RingBuffer>& output,
+std::vector<ExtractedUnit> runThroughTsParser(MediaExtractor& extractor, RingBuffer& ring,
                                               const Bytes& ts, uint16_t pid, int kind) {
-    const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(60);
-    android::sp<RingBuffer> input = makeRing("TestTS", 1u << 20);
-    android::sp<Synchronization> clock = new Synchronization();
-    android::sp<TSParser> parser = new TSParser(kind);
-    parser->setInput(input);
-    parser->addOutput(output, nullptr);
-    parser->configure(clock);
-    std::vector<ExtractedUnit> units;
-    if (parser->start() != 0)
-        return units;
-    std::atomic<bool> fed{false};
-    std::thread feeder([&] {
-        feedPid(*input, ts, pid, deadline);
-        fed = true;
-    });
-    Bytes out(4u << 20);
-    // Done once everything is fed and parsed and three waits in a row found nothing.
-    for (int idle = 0; idle < 3 && std::chrono::steady_clock::now() < deadline;) {
-        const bool empty = pullUnit(extractor, out, &units) == MediaExtractor::RESULT_NO_INPUT;
-        idle = empty && fed && input->usedSpace() == 0 ? idle + 1 : 0;
-    }
-    feeder.join();
-    parser->stop();
-    return units;
+    const std::vector<PesRecord> records = parseTs(bytesOfPid(ts, pid), kind);
+    return feedAndPull(
+        extractor, ring, records.size(),
+        [&](size_t i) { return RingBuffer::roundUp4(records[i].size); },
+        [&](size_t i) {
+            const PesRecord& r = records[i];
+            writeRawRecord(ring, r.size, r.offsetES, r.sizeES, r.pts, r.pes);
+        },
+        4u << 20);
 }
 
-std::vector<PesChunk> pesFromTs(const Bytes& ts, uint16_t pid, size_t packetSize) {
+std::vector<PesChunk> pesFromTs(const Bytes& ts, uint16_t pid) {
     std::vector<PesChunk> chunks;
     Bytes pes;
     uint64_t lastPts = 0;
@@ -250,7 +231,7 @@ std::vector<PesChunk> pesFromTs(const Bytes& ts, uint16_t pid, size_t packetSize
         }
         pes.clear();
     };
-    for (size_t at = 0; at + packetSize <= ts.size(); at += packetSize) {
+    for (size_t at = 0; at + 188 <= ts.size(); at += 188) {
         const uint8_t* packet = &ts[at];
         if (packet[0] != 0x47 || (((packet[1] & 0x1F) << 8) | packet[2]) != pid)
             continue;
@@ -341,13 +322,6 @@ Bytes runTsgen(const std::string& arguments) {
     (void)arguments;
     return {};
 #endif
-}
-
-uint64_t fnv1a64(const uint8_t* data, size_t size) {
-    uint64_t hash = 0xcbf29ce484222325ull;
-    for (size_t i = 0; i < size; ++i)
-        hash = (hash ^ data[i]) * 0x100000001b3ull;
-    return hash;
 }
 
 }  // namespace TavoPlayer::test

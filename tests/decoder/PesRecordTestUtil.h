@@ -14,21 +14,12 @@
 
 #include "common/RingBuffer.h"
 #include "decoder/MediaExtractor.h"
+#include "support/NamedRow.h"
 #include "support/TsTestUtil.h"
 
 namespace TavoPlayer::test {
 
 using Bytes = std::vector<uint8_t>;
-
-// Test parameters print as their case name, so that test names stay readable; a test
-// file brings this in with `using test::PrintTo;`.
-template <typename T>
-requires requires(const T& t) {
-    *static_cast<std::ostream*>(nullptr) << t.name;
-}
-void PrintTo(const T& param, std::ostream* os) {
-    *os << param.name;
-}
 
 // MSB-first writer of fields up to 32 bits into a growing byte vector.
 class BitSink {
@@ -61,10 +52,6 @@ bool writePesRecord(RingBuffer& ring, const Bytes& es, uint64_t pts, uint8_t str
 bool writeRawRecord(RingBuffer& ring, uint32_t size, uint32_t offsetES, uint32_t sizeES,
                     uint64_t pts, const Bytes& bytes);
 
-// Cuts `es` into chunks at the given offsets (ascending, each inside es), giving the
-// chunk that starts at offsets[i] the PTS ptsOf[i].
-std::vector<PesChunk> cutAt(const Bytes& es, const std::vector<size_t>& offsets,
-                            const std::vector<uint64_t>& ptsOf);
 // Chunks of `size` bytes; chunk i carries the PTS `firstPts` + i x `ptsStep`.
 std::vector<PesChunk> fixedCuts(const Bytes& es, size_t size, uint64_t firstPts, uint64_t ptsStep);
 // `perPes` units in each chunk; a chunk's PTS is `firstPts` + (index of its first unit)
@@ -109,18 +96,16 @@ std::vector<ExtractedUnit> drain(MediaExtractor& extractor, size_t outputSize = 
 void feedPid(RingBuffer& input, const Bytes& ts, uint16_t pid,
              std::chrono::steady_clock::time_point deadline);
 
-// Feeds the TS packets of `pid` through the system's TS parser module of `kind` into
-// `output`, on a feeder thread, while `extractor` reads from `output` on this thread;
-// returns the units once the parser has taken every packet and no more records come.
-// The parser emits a PES only when the next one starts, so the last PES is never seen.
-std::vector<ExtractedUnit> runThroughTsParser(MediaExtractor& extractor,
-                                              const android::sp<RingBuffer>& output,
+// The records the system's TS parser module of `kind` writes for the packets of `pid`,
+// copied as they are into `ring` for `extractor`. The parser emits a PES only when the
+// next one starts, so the last PES is never seen.
+std::vector<ExtractedUnit> runThroughTsParser(MediaExtractor& extractor, RingBuffer& ring,
                                               const Bytes& ts, uint16_t pid, int kind);
 
 // The PES packets of `pid` in a transport stream (ISO/IEC 13818-1, 2.4.3.2 and
 // 2.4.3.6), each as its ES payload (bounded by PES_packet_length when given) with its
 // PTS (the last PTS seen when a packet has none). A small, independent splitter.
-std::vector<PesChunk> pesFromTs(const Bytes& ts, uint16_t pid, size_t packetSize = 188);
+std::vector<PesChunk> pesFromTs(const Bytes& ts, uint16_t pid);
 
 // libavcodec's parser for `codecId` (an AVCodecID) over a whole elementary stream.
 struct ParsedUnit {
@@ -146,8 +131,5 @@ bool succeeds(const std::string& command);
 // Runs the project's stream generator with `arguments` and returns the stream it wrote;
 // empty when the generator is not built or fails.
 Bytes runTsgen(const std::string& arguments);
-
-// FNV-1a 64 of the bytes, for golden dumps.
-uint64_t fnv1a64(const uint8_t* data, size_t size);
 
 }  // namespace TavoPlayer::test

@@ -85,30 +85,5 @@ TEST_P(ASCParserBytesTest, WritesTheConfigurationInTenBytes) {
 INSTANTIATE_TEST_SUITE_P(Configurations, ASCParserBytesTest, ::testing::ValuesIn(ascCases()),
                          [](const auto& info) { return info.param.name; });
 
-class ASCParserContractTest : public ::testing::Test {};
-
-TEST_F(ASCParserContractTest, NullOutputIsRefused) {
-    ASCParser parser;
-    unsigned int size = 99;
-    EXPECT_EQ(1u, parser.createASC(nullptr, &size));
-    EXPECT_EQ(99u, size);
-}
-
-TEST_F(ASCParserContractTest, WriteAotUsesEscapeFrom32) {
-    struct Row {
-        unsigned char aot;
-        std::vector<uint8_t> bytes;
-    };
-    for (const Row& row : {Row{2, {0x10}}, Row{31, {0xF8}}, Row{32, {0xF8, 0x00}},
-                           Row{33, {0xF8, 0x20}}, Row{95, {0xFF, 0xE0}}}) {
-        uint8_t buffer[2] = {0xAA, 0xAA};
-        WriteBitInterface writer(buffer, sizeof(buffer));
-        ASCParser().writeAOT(&writer, row.aot);
-        writer.byteAlign(nullptr);
-        EXPECT_EQ(row.bytes, std::vector<uint8_t>(buffer, buffer + row.bytes.size()))
-            << "type " << static_cast<int>(row.aot);
-    }
-}
-
 }  // namespace
 }  // namespace TavoPlayer

@@ -120,20 +120,5 @@ TEST_P(ClosedCaptionDecodeTest, DecodesOnePacket) {
 INSTANTIATE_TEST_SUITE_P(Units, ClosedCaptionDecodeTest, testing::ValuesIn(decodeCases()),
                          [](const auto& info) { return std::string(info.param.name); });
 
-TEST(ClosedCaptionDecoderModuleTest, GetCcCopiesOnlyWhenItFits) {
-    android::sp<RingBuffer> output = test::makeRing("CCRaw", 1 << 16);
-    android::sp<ClosedCaptionDecoder> decoder = new ClosedCaptionDecoder();
-    decoder->addOutput(output, nullptr);
-    OwnedPesRecord record(captionEs(bytesOf("Hi")), 0);
-    ASSERT_EQ(decoder->processPacket(record.get()), 1u);
-    ASSERT_EQ(decoder->getCCSize(), 12u);
-    std::vector<unsigned char> small(11, 0xEE), exact(12, 0xEE);
-    decoder->getCC(small.data(), 11);
-    EXPECT_EQ(small, std::vector<unsigned char>(11, 0xEE));
-    decoder->getCC(exact.data(), 12);
-    EXPECT_EQ(toU32(exact.data(), 12), U"Hi\n");
-    decoder->getCC(nullptr, 100);  // ignored
-}
-
 }  // namespace
 }  // namespace TavoPlayer

@@ -3,7 +3,6 @@
 #include <gtest/gtest.h>
 
 #include <condition_variable>
-#include <functional>
 #include <mutex>
 
 extern "C" {
@@ -128,53 +127,43 @@ TEST_F(MediaCodecDecoderCaptureTest, OneCaptureAtATime) {
     EXPECT_TRUE(test::waitUntil([&] { return mListener.calls() == 2; }));
 }
 
-struct FailureCase {
-    std::string name;
-    std::function<void(MediaCodecDecoderCaptureTest&)> setUp;
-    bool started;
-    std::string message;
-};
-
-class CaptureFailureTest : public MediaCodecDecoderCaptureTest {
-public:
-    void TestBody() override {}
-};
-
-TEST(MediaCodecDecoderCaptureFailures, LogAndNeverCallTheListener) {
-    const std::vector<FailureCase> cases = {
-        {"NoSurface", [](auto&) {}, false, "captureFrame: m_pSurface is null fail to capture"},
-        {"DequeueFails",
-         [](auto& t) {
-             t.mSurface->dequeueStatus = -19;
-             t.setSurface();
-         },
-         false, "Surface::dequeueBuffer returned error -19"},
-        {"LockFails",
-         [](auto& t) {
-             t.mSurface->lockStatus = -22;
-             t.setSurface();
-         },
-         false, "mapper.lockYCbCr error -22"},
-        {"UnsupportedFormat",
-         [](auto& t) {
-             t.mFrame.mColorFormat = 19;
-             t.setSurface();
-         },
-         true, "threadLoop: Error converting frame"},
+// Each failure is logged, and the listener is never called.
+TEST_F(MediaCodecDecoderCaptureTest, FailuresLogAndNeverCallTheListener) {
+    struct Row {
+        const char* name;
+        bool surface;
+        int dequeueStatus;
+        int lockStatus;
+        int32_t colorFormat;
+        bool started;
+        const char* message;
     };
-    for (const FailureCase& c : cases) {
-        CaptureFailureTest t;
-        t.SetUp();
-        t.mSurface->setLastPicture(std::vector<uint8_t>(320 * 240 * 3 / 2, 16), 320, 240);
-        c.setUp(t);
-        EXPECT_EQ(c.started, t.mDecoder->captureFrame(t.mFrame, &t.mListener)) << c.name;
-        EXPECT_TRUE(test::waitUntil([&] { return t.mTrace.contains(c.message); }))
-            << c.name << "\n"
-            << t.mTrace.all();
-        if (c.name == "LockFails") {
-            EXPECT_EQ(1, t.mSurface->queuedBack) << "a dequeued buffer always goes back";
+    for (const Row& row : {
+             Row{"NoSurface", false, 0, 0, 261, false, "captureFrame: m_pSurface is null"},
+             Row{"DequeueFails", true, -19, 0, 261, false, "dequeueBuffer returned error -19"},
+             Row{"LockFails", true, 0, -22, 261, false, "mapper.lockYCbCr error -22"},
+             Row{"UnsupportedFormat", true, 0, 0, 19, true, "threadLoop: Error converting frame"},
+         }) {
+        test::TraceCapture trace;
+        android::sp<MediaCodecDecoder> decoder = new MediaCodecDecoder();
+        decoder->configure(Decoder::CODING_H264);
+        android::sp<test::RecordingSurface> recording = new test::RecordingSurface();
+        recording->setLastPicture(std::vector<uint8_t>(320 * 240 * 3 / 2, 16), 320, 240);
+        recording->dequeueStatus = row.dequeueStatus;
+        recording->lockStatus = row.lockStatus;
+        android::sp<android::Surface> surface = recording;
+        if (row.surface)
+            decoder->setSurface(surface);
+        mFrame.mColorFormat = row.colorFormat;
+        Listener listener;
+        EXPECT_EQ(row.started, decoder->captureFrame(mFrame, &listener)) << row.name;
+        EXPECT_TRUE(test::waitUntil([&] { return trace.contains(row.message); }))
+            << row.name << "\n"
+            << trace.all();
+        if (row.lockStatus != 0) {
+            EXPECT_EQ(1, recording->queuedBack) << "a dequeued buffer always goes back";
         }
-        EXPECT_EQ(0, t.mListener.calls()) << c.name;
+        EXPECT_EQ(0, listener.calls()) << row.name;
     }
 }
 

@@ -42,24 +42,11 @@ protected:
 
 TEST_F(MediaCodecDecoderTest, StatesAndConfigureTable) {
     EXPECT_EQ(1u, mDecoder->start());
-    EXPECT_TRUE(mTrace.contains("start: Called in wrong state: 0")) << mTrace.all();
     EXPECT_EQ(1u, mDecoder->stop());
-
     EXPECT_EQ(200705u, mDecoder->configure(static_cast<Decoder::codingType_t>(4)));
-    EXPECT_TRUE(mTrace.contains("configure: Unsupported type: 4"));
     EXPECT_EQ(0u, mDecoder->getStateForTest());
-
-    int width = 0, height = 0;
-    EXPECT_EQ(200712u, mDecoder->getResolution(&width, &height));
-    EXPECT_EQ(200712u, mDecoder->setAudioOnlyMode(1));
-    EXPECT_EQ(200712u, mDecoder->setCropRect(0, 0, 16, 16, 0));
-
     EXPECT_EQ(0u, mDecoder->configure(Decoder::CODING_AAC_ADTS));
     EXPECT_EQ(1u, mDecoder->getStateForTest());
-    android::AString name;
-    ASSERT_NE(nullptr, mDecoder->getCodecForTest());
-    mDecoder->getCodecForTest()->getName(&name);
-    EXPECT_STREQ("OMX.KOV.aac.dec", name.c_str());
     EXPECT_EQ(1u, mDecoder->configure(Decoder::CODING_H264));
     EXPECT_EQ(1u, mDecoder->getStateForTest());
 }
@@ -86,17 +73,6 @@ TEST_F(MediaCodecDecoderTest, EmptyInputQueuesEmptyBuffers) {
     EXPECT_EQ(1u, mDecoder->stop());
     // Restartable, and the input ring was left free for its next reader.
     EXPECT_EQ(0u, mDecoder->start());
-}
-
-TEST_F(MediaCodecDecoderTest, SameSurfaceTwiceOnlyLogs) {
-    ASSERT_EQ(0u, mDecoder->configure(Decoder::CODING_H264));
-    android::sp<android::Surface> surface = new test::RecordingSurface();
-    EXPECT_EQ(0u, mDecoder->setSurface(surface));
-    const auto codec = mDecoder->getCodecForTest();
-    EXPECT_EQ(0u, mDecoder->setSurface(surface));
-    EXPECT_EQ(1u, mTrace.count(TRACE_INFO, "setSurface: same surface skip setSurface"));
-    EXPECT_EQ(codec, mDecoder->getCodecForTest());
-    EXPECT_EQ(surface, mDecoder->getSurface());
 }
 
 // A new surface while started: the codec is replaced and restarted and the frames
@@ -176,14 +152,6 @@ TEST_P(MediaCodecDecoderBadInputTest, CarriesOn) {
 INSTANTIATE_TEST_SUITE_P(
     Streams, MediaCodecDecoderBadInputTest,
     ::testing::Values(
-        BadInputCase{"ContinuityErrors",
-                     {"-d 2 --audio none --size 320x240 --cc-error 0x111:30:4"},
-                     Decoder::CODING_H264,
-                     {320}},
-        BadInputCase{"DroppedPackets",
-                     {"-d 2 --audio none --size 320x240 --drop 0x111:40:25"},
-                     Decoder::CODING_H264,
-                     {320}},
         BadInputCase{"CutPes",
                      {"-d 2 --audio none --size 320x240 --video-pes-bytes 700 --drop 0x111:20:3"},
                      Decoder::CODING_H264,
@@ -193,10 +161,6 @@ INSTANTIATE_TEST_SUITE_P(
                       "-d 1 --audio none --size 176x144 --start-pts 400000"},
                      Decoder::CODING_H264,
                      {320, 176}},
-        BadInputCase{"AdtsDroppedPackets",
-                     {"-d 2 --size 64x64 --audio adts --drop 0x112:15:4"},
-                     Decoder::CODING_AAC_ADTS,
-                     {48000}},
         BadInputCase{"Mp2SampleRateChange",
                      {"-d 1 --size 64x64 --audio mp2",
                       "-d 1 --size 64x64 --audio mp2 --audio-rate 32000 --start-pts 400000"},

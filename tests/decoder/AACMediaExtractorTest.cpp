@@ -1,5 +1,5 @@
 // The AAC extractor over PES records in a ring: configuration again after reset, the
-// switch between LOAS and ADTS, golden dumps, a writer thread, and records that lie
+// switch between LOAS and ADTS, a writer thread, and records that lie
 // about their sizes. Units, re-segmentation and time stamps against FFmpeg's are in
 // AACReferenceTest.cpp.
 #include "decoder/AACMediaExtractor.h"
@@ -59,13 +59,10 @@ class AACExtractorTest : public ::testing::Test {
 protected:
     void SetUp() override { mRing = test::makeRing("AudioPES", 1u << 20); }
 
-    void writeChunks(const std::vector<PesChunk>& records) {
-        for (const auto& record : records)
-            ASSERT_TRUE(test::writePesRecord(*mRing, record.es, record.pts, 0xC0));
-    }
     void writeRecords(const std::vector<std::vector<uint8_t>>& records, uint64_t firstPts,
                       uint64_t step) {
-        writeChunks(test::groupCuts(records, 1, firstPts, step));
+        for (const auto& record : test::groupCuts(records, 1, firstPts, step))
+            ASSERT_TRUE(test::writePesRecord(*mRing, record.es, record.pts, 0xC0));
     }
 
     // Drains a new extractor opened as `layer` over the ring.
@@ -81,14 +78,7 @@ protected:
 
 // ---- configuration first ----------------------------------------------------------
 
-class AACFramingTest : public AACExtractorTest, public ::testing::WithParamInterface<Framing> {
-protected:
-    std::vector<ExtractedUnit> unitsOf(const std::vector<PesChunk>& records) {
-        mRing->reset();
-        writeChunks(records);
-        return extract(GetParam());
-    }
-};
+class AACFramingTest : public AACExtractorTest, public ::testing::WithParamInterface<Framing> {};
 
 TEST_P(AACFramingTest, ResetSendsTheConfigurationAgainBeforeAudio) {
     const Stream s = makeStream(GetParam(), 10);

@@ -2,6 +2,9 @@
 
 namespace TavoPlayer::test {
 
+namespace {
+
+// AudioSpecificConfig with a GASpecificConfig for channel configurations 1..7.
 void writeAsc(BitSink& sink, const AscFields& asc) {
     if (asc.hierarchicalExtension != 0) {
         sink.put(asc.hierarchicalExtension, 5);
@@ -28,8 +31,6 @@ void writeAsc(BitSink& sink, const AscFields& asc) {
         }
     }
 }
-
-namespace {
 
 void latmValue(BitSink& sink, uint32_t value) {
     uint32_t bytes = value > 0xFFFFFF ? 3 : value > 0xFFFF ? 2 : value > 0xFF ? 1 : 0;

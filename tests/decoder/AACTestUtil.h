@@ -25,9 +25,6 @@ struct AscFields {
     uint32_t frameLengthFlag = 0;
 };
 
-// AudioSpecificConfig with a GASpecificConfig for channel configurations 1..7.
-void writeAsc(BitSink& sink, const AscFields& asc);
-
 struct LoasOptions {
     uint32_t audioMuxVersion = 0;
     bool useSameStreamMux = false;

@@ -260,10 +260,6 @@ TEST_F(H264AccessUnitTest, ResetGivesTheRecordBackAndDecodesTheSpsAgain) {
 
 // --- real encoder output against libavcodec's H.264 parser --------------------------
 
-std::vector<test::ParsedUnit> ffmpegAccessUnits(const Bytes& es) {
-    return test::ffmpegParse(es, AV_CODEC_ID_H264);
-}
-
 Bytes encode(const std::string& x264Params, const std::string& extra, int frames) {
     const std::string path = std::string(TAVO_BINARY_DIR) + "/h264test_" +
                              std::to_string(std::hash<std::string>()(x264Params + extra)) + ".h264";
@@ -291,7 +287,7 @@ TEST_P(H264RealStreamTest, SameAccessUnitsAsFfmpegParser) {
     if (es.empty()) {
         GTEST_SKIP() << "ffmpeg with libx264 not available";
     }
-    const auto reference = ffmpegAccessUnits(es);
+    const auto reference = test::ffmpegParse(es, AV_CODEC_ID_H264);
     ASSERT_EQ(reference.size(), 45u);
     std::vector<Bytes> referenceBytes;
     for (const auto& unit : reference)
@@ -350,7 +346,7 @@ protected:
         if (ts.empty())
             return false;
         mChunks = test::pesFromTs(ts, 0x111);
-        mReference = ffmpegAccessUnits(test::joinEs(mChunks));
+        mReference = test::ffmpegParse(test::joinEs(mChunks), AV_CODEC_ID_H264);
         return true;
     }
     std::vector<PesChunk> mChunks;
@@ -439,7 +435,7 @@ TEST_P(H264GoldenTest, UnitsMatchTheDumpFfmpegAndTheTsParserPath) {
     // Independent check: every unit is one that libavcodec's parser cuts from the same
     // elementary stream (these muxers start each PES with an access unit).
     std::map<Bytes, int> reference;
-    for (const auto& unit : ffmpegAccessUnits(test::joinEs(chunks)))
+    for (const auto& unit : test::ffmpegParse(test::joinEs(chunks), AV_CODEC_ID_H264))
         ++reference[unit.bytes];
     for (size_t i = 0; i < units.size(); ++i) {
         EXPECT_GT(reference[units[i].bytes]--, 0)

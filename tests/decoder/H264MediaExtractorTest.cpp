@@ -178,6 +178,22 @@ TEST_F(H264SpsSeiTest, PicTimingWithHrdDelaysAndClockTimestamp) {
     EXPECT_EQ(mExtractor->getPicStruct(), 3);
 }
 
+// se(v) feeds only the scaling lists' delta_scale, whose sum decides where the list ends
+// (ITU-T H.264, 7.3.2.1.1.1): a wrong sign mapping misreads every later SPS field of a
+// stream with explicit lists, and no stream here has them.
+TEST_F(H264SpsSeiTest, ExpGolombCodesReadBackAsWritten) {
+    const int64_t values[] = {0, 1, -1, 2, -2, 100, -32768};
+    Rbsp r;
+    r.ue(0xFFFFFFFE);
+    for (int64_t v : values)
+        r.ue(v > 0 ? 2 * v - 1 : -2 * v);
+    Bytes bytes = r.bytes();
+    ReadBitInterface reader(bytes.data(), bytes.size());
+    EXPECT_EQ(mExtractor->parseUEGolomb(&reader), 0xFFFFFFFEu);
+    for (int64_t v : values)
+        EXPECT_EQ(mExtractor->parseSEGolomb(&reader), v);
+}
+
 // --- access units -----------------------------------------------------------------
 
 class H264AccessUnitTest : public H264Fixture {};

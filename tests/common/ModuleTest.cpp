@@ -2,10 +2,7 @@
 
 #include <gtest/gtest.h>
 
-#include <cstdio>
 #include <vector>
-
-#include "support/TsTestUtil.h"
 
 namespace TavoPlayer {
 namespace {
@@ -15,8 +12,6 @@ public:
     explicit TestModule(const std::string& name) : Module(name) {}
     unsigned int start() override { return 0; }
     unsigned int stop() override { return 0; }
-    size_t outputCount() const { return mOutputs.size(); }
-    const OutputList& outputs() const { return mOutputs; }
 };
 
 struct Call {
@@ -58,28 +53,6 @@ TEST_F(ModuleTest, OnErrorReachesListenersInOrderWithTheModule) {
         EXPECT_EQ(0x21003u, call.code);
         EXPECT_EQ(module.get(), call.module);
     }
-}
-
-TEST_F(ModuleTest, RemoveOutputKeepsOrderAndAdvancesIterator) {
-    android::sp<RingBuffer> a = new RingBuffer, b = new RingBuffer, c = new RingBuffer;
-    Module::OutputList::iterator whereB;
-    EXPECT_EQ(0u, module->addOutput(a, nullptr));
-    EXPECT_EQ(0u, module->addOutput(b, &whereB));
-    EXPECT_EQ(0u, module->addOutput(c, nullptr));
-    module->removeOutput(&whereB);
-    ASSERT_EQ(2u, module->outputCount());
-    EXPECT_EQ(a, module->outputs().front());
-    EXPECT_EQ(c, module->outputs().back());
-    EXPECT_EQ(c, *whereB);
-    // The module held the only other reference to b besides this test.
-    EXPECT_EQ(1, b->getStrongCount());
-}
-
-TEST_F(ModuleTest, DumpWritesIndentedName) {
-    EXPECT_EQ(0u, module->dump(nullptr, 2));
-    EXPECT_EQ("\t\t - Module Name: TS Parser\n",
-              test::printed([&](FILE* f) { module->dump(f, 2); }));
-    EXPECT_EQ(" - Module Name: TS Parser\n", test::printed([&](FILE* f) { module->dump(f, 0); }));
 }
 
 }  // namespace

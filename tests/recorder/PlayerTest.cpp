@@ -83,17 +83,6 @@ TEST_F(PlayerTimeTest, ReportsEachNewWholeSecondOnceFromTheAnchor) {
     }
 }
 
-TEST_F(PlayerTimeTest, AnchorTakesTheElapsedProductIn32Bits) {
-    const uint64_t p = 5'000'000'000;
-    player->updateCurTime(p);
-    player->updateCurTime(p + 47722 * kSecond);
-    ASSERT_EQ(listener.times, std::vector<int>{47722});
-    player->updateCurTime(p - 1);  // back: drop the anchor
-    player->updateCurTime(p + 1);
-    // 47722 x 90000 = 4,294,980,000 wraps to 12,704 in 32 bits.
-    EXPECT_EQ(player->getStartPTS(), p + 1 - 12704);
-}
-
 TEST_F(PlayerTimeTest, StopFreezesReportsAndStartClearsIt) {
     player->updateCurTime(kSecond);
     player->stop();

@@ -83,9 +83,8 @@ struct StreamPlan {
     std::vector<uint16_t> pids;
     size_t rounds = 10;
     int pcrPid = -1;              // this PID's packets carry a PCR
-    uint32_t pcrIntervalMs = 40;  // the PCR advances this much per round
+    uint32_t pcrIntervalMs = 40;  // the PCR advances this much per round, from 10 s
     uint32_t firstSequence = 0;
-    uint64_t firstPcrBase = 900000;  // 90 kHz units
 };
 std::vector<uint8_t> buildStream(const StreamPlan& plan);
 

@@ -54,12 +54,6 @@ struct PesRecordHeader {
 static_assert(sizeof(PesRecordHeader) == 40);
 struct PesRecord : PesRecordHeader {
     std::vector<uint8_t> pes;  // bytes 40 .. size
-
-    std::vector<uint8_t> es() const {
-        if (offsetES < 40 || offsetES > size)
-            return {};
-        return std::vector<uint8_t>(pes.begin() + (offsetES - 40), pes.end());
-    }
 };
 // Reads and consumes the record at the read position, waiting up to `deadline`.
 std::optional<PesRecord> readRecord(RingBuffer& ring,

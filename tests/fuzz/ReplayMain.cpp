@@ -29,28 +29,25 @@ void runFile(const std::filesystem::path& path) {
 int main(int argc, char** argv) {
     if (LLVMFuzzerInitialize != nullptr)
         LLVMFuzzerInitialize(&argc, &argv);
-    size_t runs = 0;
+    std::vector<std::filesystem::path> files;
     for (int i = 1; i < argc; ++i) {
         const std::filesystem::path path(argv[i]);
         if (std::filesystem::is_directory(path)) {
-            std::vector<std::filesystem::path> files;
             for (const auto& entry : std::filesystem::directory_iterator(path)) {
                 if (entry.is_regular_file())
                     files.push_back(entry.path());
             }
-            std::sort(files.begin(), files.end());
-            for (const auto& file : files) {
-                runFile(file);
-                ++runs;
-            }
         } else if (std::filesystem::is_regular_file(path)) {
-            runFile(path);
-            ++runs;
+            files.push_back(path);
         } else {
             fprintf(stderr, "replay: no such file or directory: %s\n", argv[i]);
             return 1;
         }
     }
-    printf("replay: %zu inputs\n", runs);
-    return runs == 0 ? 1 : 0;
+    // In name order, so that a failing run is repeated input for input.
+    std::sort(files.begin(), files.end());
+    for (const auto& file : files)
+        runFile(file);
+    printf("replay: %zu inputs\n", files.size());
+    return files.empty() ? 1 : 0;
 }

@@ -20,7 +20,7 @@ std::vector<uint8_t> PesBuilder::build() const {
     std::vector<uint8_t> pes{0x00, 0x00, 0x01, mStreamId, 0x00, 0x00};
     if (mOptionalHeader) {
         std::vector<uint8_t> fields;
-        uint8_t flags7 = mExtraFlags;
+        uint8_t flags7 = 0;
         if (mPts) {
             flags7 |= mDts ? 0xC0 : 0x80;
             uint8_t stamp[5];
@@ -31,7 +31,6 @@ std::vector<uint8_t> PesBuilder::build() const {
                 fields.insert(fields.end(), stamp, stamp + 5);
             }
         }
-        fields.insert(fields.end(), mExtraFields.begin(), mExtraFields.end());
         fields.insert(fields.end(), mStuffing, 0xFF);
         pes.push_back(mByte6);
         pes.push_back(flags7);

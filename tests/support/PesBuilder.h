@@ -15,12 +15,6 @@ public:
 
     PesBuilder& pts(uint64_t v) { return set(mPts, v); }
     PesBuilder& dts(uint64_t v) { return set(mDts, v); }
-    // Extra optional fields after PTS/DTS (ESCR, ES rate, ...): flag bits for
-    // byte 7 and their bytes, in order.
-    PesBuilder& optionalFields(uint8_t flags7, std::vector<uint8_t> bytes) {
-        mExtraFlags = flags7;
-        return set(mExtraFields, std::move(bytes));
-    }
     PesBuilder& stuffing(uint8_t v) { return set(mStuffing, v); }
     // Overrides byte 6 (default 0x80: start bits '10', nothing else set).
     PesBuilder& byte6(uint8_t v) { return set(mByte6, v); }
@@ -41,8 +35,6 @@ private:
     uint8_t mStreamId;
     std::optional<uint64_t> mPts;
     std::optional<uint64_t> mDts;
-    uint8_t mExtraFlags = 0;
-    std::vector<uint8_t> mExtraFields;
     uint8_t mStuffing = 0;
     uint8_t mByte6 = 0x80;
     std::optional<uint8_t> mHeaderDataLength;

@@ -19,20 +19,15 @@ std::vector<TraceCapture::Line> TraceCapture::lines() const {
 }
 
 size_t TraceCapture::count(const std::string& fragment) const {
-    std::lock_guard<std::mutex> lock(mMutex);
-    size_t n = 0;
-    for (const Line& line : mLines) {
-        if (line.text.find(fragment) != std::string::npos)
-            ++n;
-    }
-    return n;
+    return count(kAnySeverity, fragment);
 }
 
 size_t TraceCapture::count(uint32_t severity, const std::string& fragment) const {
     std::lock_guard<std::mutex> lock(mMutex);
     size_t n = 0;
     for (const Line& line : mLines) {
-        if (line.severity == severity && line.text.find(fragment) != std::string::npos)
+        if ((severity == kAnySeverity || line.severity == severity) &&
+            line.text.find(fragment) != std::string::npos)
             ++n;
     }
     return n;

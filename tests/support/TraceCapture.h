@@ -33,6 +33,7 @@ public:
     std::string all() const;
 
 private:
+    static constexpr uint32_t kAnySeverity = ~0u;
     mutable std::mutex mMutex;
     std::vector<Line> mLines;
     TraceSink mPrevious;

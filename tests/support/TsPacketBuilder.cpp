@@ -6,7 +6,7 @@
 namespace TavoPlayer::test {
 namespace {
 
-// PCR and OPCR: 33-bit base, 6 reserved bits, 9-bit extension (ISO/IEC 13818-1, 2.4.3.5).
+// PCR: 33-bit base, 6 reserved bits, 9-bit extension (ISO/IEC 13818-1, 2.4.3.5).
 void appendClock(std::vector<uint8_t>* out, uint64_t base, uint16_t extension) {
     out->push_back(static_cast<uint8_t>(base >> 25));
     out->push_back(static_cast<uint8_t>(base >> 17));
@@ -23,16 +23,14 @@ TsPacket TsPacketBuilder::build() const {
     packet.fill(0xFF);
 
     // Adaptation field body: flags byte and optional parts.
-    const bool anyField = mDiscontinuity || mRandomAccess || mPcr || mOpcr;
+    const bool anyField = mDiscontinuity || mRandomAccess || mPcr;
     std::vector<uint8_t> field;
     if (anyField) {
         // ISO/IEC 13818-1, 2.4.3.4: the flags byte, then the parts in flag order.
-        field.push_back(static_cast<uint8_t>(mDiscontinuity << 7 | mRandomAccess << 6 |
-                                             mPcr.has_value() << 4 | mOpcr.has_value() << 3));
+        field.push_back(
+            static_cast<uint8_t>(mDiscontinuity << 7 | mRandomAccess << 6 | mPcr.has_value() << 4));
         if (mPcr)
             appendClock(&field, mPcr->first, mPcr->second);
-        if (mOpcr)
-            appendClock(&field, mOpcr->first, mOpcr->second);
     }
     const size_t payloadSize = mPayload ? mPayload->size() : 0;
     const bool hasField = anyField || (mPayload && payloadSize < 184) || !mPayload;

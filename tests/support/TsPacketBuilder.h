@@ -31,7 +31,6 @@ public:
     TsPacketBuilder& discontinuity(bool on = true) { return set(mDiscontinuity, on); }
     TsPacketBuilder& randomAccess(bool on = true) { return set(mRandomAccess, on); }
     TsPacketBuilder& pcr(uint64_t base, uint16_t ext = 0) { return set(mPcr, Clock{base, ext}); }
-    TsPacketBuilder& opcr(uint64_t base, uint16_t ext = 0) { return set(mOpcr, Clock{base, ext}); }
     // Replaces everything after the header by these bytes (byte 4 onward), for
     // lengths and layouts the standard does not allow.
     TsPacketBuilder& rawAfterHeader(Bytes v) { return set(mRaw, std::move(v)); }
@@ -57,7 +56,6 @@ private:
     bool mDiscontinuity = false;
     bool mRandomAccess = false;
     std::optional<Clock> mPcr;
-    std::optional<Clock> mOpcr;
     std::optional<Bytes> mRaw;
     std::optional<Bytes> mPayload;
 };

@@ -144,7 +144,7 @@ std::vector<uint8_t> buildStream(const StreamPlan& plan) {
             builder.pid(pid).continuity(static_cast<uint8_t>(seq & 0xF));
             size_t room = 184;
             if (plan.pcrPid == pid) {
-                builder.pcr(plan.firstPcrBase + round * plan.pcrIntervalMs * 90ull, 0);
+                builder.pcr(900000 + round * plan.pcrIntervalMs * 90ull, 0);
                 room = 184 - 8;
             }
             // The pattern keeps some 0x47 bytes inside payloads, as real streams have.

@@ -54,12 +54,6 @@ struct PesRecordHeader {
 static_assert(sizeof(PesRecordHeader) == 40);
 struct PesRecord : PesRecordHeader {
     std::vector<uint8_t> pes;  // bytes 40 .. size
-
-    std::vector<uint8_t> es() const {
-        if (offsetES < 40 || offsetES > size)
-            return {};
-        return std::vector<uint8_t>(pes.begin() + (offsetES - 40), pes.end());
-    }
 };
 // Reads and consumes the record at the read position, waiting up to `deadline`.
 std::optional<PesRecord> readRecord(RingBuffer& ring,
@@ -83,9 +77,8 @@ struct StreamPlan {
     std::vector<uint16_t> pids;
     size_t rounds = 10;
     int pcrPid = -1;              // this PID's packets carry a PCR
-    uint32_t pcrIntervalMs = 40;  // the PCR advances this much per round
+    uint32_t pcrIntervalMs = 40;  // the PCR advances this much per round, from 10 s
     uint32_t firstSequence = 0;
-    uint64_t firstPcrBase = 900000;  // 90 kHz units
 };
 std::vector<uint8_t> buildStream(const StreamPlan& plan);
 

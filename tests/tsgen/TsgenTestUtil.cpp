@@ -77,7 +77,6 @@ TsFile::TsFile(const std::vector<uint8_t>& bytes, size_t packetSize) {
         valid = p[0] == 0x47 && length <= 183;
         if (valid && length > 0) {
             t.discontinuity = (p[5] & 0x80) != 0;
-            t.randomAccess = (p[5] & 0x40) != 0;
             t.hasPcr = (p[5] & 0x10) != 0;
             const uint64_t base = (uint64_t{p[6]} << 25) | (uint64_t{p[7]} << 17) |
                                   (uint64_t{p[8]} << 9) | (uint64_t{p[9]} << 1) | (p[10] >> 7);
@@ -104,16 +103,15 @@ int64_t readTimestamp(const uint8_t* q) {
            (int64_t{q[3]} << 7) | (q[4] >> 1);
 }
 
-// ISO/IEC 13818-1, 2.4.3.6: the PES header, its PTS/DTS and the bytes that
+// ISO/IEC 13818-1, 2.4.3.6: the PES header, its PTS and the bytes that
 // PES_packet_length bounds (0: all that follow).
 void finishPes(const std::vector<uint8_t>& b, uint64_t first, std::vector<Pes>& out) {
     if (b.size() < 9 || b[0] != 0 || b[1] != 0 || b[2] != 1 || 9u + b[8] > b.size())
         return;
     const size_t length = (b[4] << 8) | b[5];
     const size_t end = (length != 0 && 6 + length <= b.size()) ? 6 + length : b.size();
-    const bool hasPts = (b[7] & 0x80) != 0, hasDts = (b[7] >> 6) == 3;
-    out.push_back({first, b[3], hasPts, hasDts, hasPts ? readTimestamp(&b[9]) : 0,
-                   hasDts ? readTimestamp(&b[14]) : 0,
+    const bool hasPts = (b[7] & 0x80) != 0;
+    out.push_back({first, hasPts, hasPts ? readTimestamp(&b[9]) : 0,
                    std::vector<uint8_t>(b.begin() + 9 + b[8], b.begin() + int64_t(end))});
 }
 

@@ -28,16 +28,15 @@ struct TsPacket {
     uint64_t position = 0;  // packet number in the file
     uint16_t pid = 0;
     uint8_t scrambling = 0, adaptationControl = 0, cc = 0;
-    bool tei = false, pusi = false, hasPcr = false, randomAccess = false, discontinuity = false;
+    bool tei = false, pusi = false, hasPcr = false, discontinuity = false;
     int64_t pcr27 = 0;  // base * 300 + extension
     std::vector<uint8_t> payload;
 };
 
 struct Pes {
     uint64_t firstPacket = 0;  // position of the packet that started it
-    uint8_t streamId = 0;
-    bool hasPts = false, hasDts = false;
-    int64_t pts = 0, dts = 0;
+    bool hasPts = false;
+    int64_t pts = 0;
     std::vector<uint8_t> payload;  // elementary stream bytes
 };
 

@@ -13,6 +13,8 @@
 namespace TavoPlayer::test {
 namespace {
 
+using test::PrintTo;
+
 constexpr int64_t kMuxRate = 2000000;
 const std::string kBase = "-d 2 --size 320x240 --seed 3 --mux-rate 2000000 ";
 

@@ -1,4 +1,2 @@
-# The tests run the tsgen program (TAVO_TSGEN_PATH) and also exercise its
-# pieces directly through the tavo_tsgen library.
+# The tests run the tsgen program (TAVO_TSGEN_PATH).
 add_dependencies(${TEST_TARGET} tsgen)
-target_link_libraries(${TEST_TARGET} PRIVATE tavo_tsgen)

@@ -4,7 +4,6 @@
 // damaged run must give exactly the intact run's records less the broken ones.
 #include <gtest/gtest.h>
 
-#include <algorithm>
 #include <set>
 #include <string>
 #include <vector>
@@ -24,17 +23,6 @@ struct GapCase {
     int kind;
 };
 
-bool unitStart(const std::vector<uint8_t>& packets, size_t index) {
-    return (packets[index * 188 + 1] & 0x40) != 0;
-}
-// A packet without payload (a PCR alone) does not advance the continuity counter
-// (ISO/IEC 13818-1, 2.4.3.3): losing one is not a gap.
-bool hasPayload(const std::vector<uint8_t>& packets, size_t index) {
-    return (packets[index * 188 + 3] & 0x10) != 0;
-}
-
-using test::parseTs;
-
 class TSParserContinuityGapTest : public ::testing::TestWithParam<GapCase> {};
 
 TEST_P(TSParserContinuityGapTest, OnlyThePesWithALostPacketIsMissing) {
@@ -45,6 +33,10 @@ TEST_P(TSParserContinuityGapTest, OnlyThePesWithALostPacketIsMissing) {
     ASSERT_TRUE(ok) << "tsgen failed";
     const std::vector<uint8_t> intact = test::bytesOfPid(test::fileBytes(out.path()), c.pid);
     const size_t count = intact.size() / 188;
+    auto unitStart = [&](size_t i) { return (intact[i * 188 + 1] & 0x40) != 0; };
+    // A packet without payload (a PCR alone) does not advance the continuity
+    // counter (ISO/IEC 13818-1, 2.4.3.3): losing one is not a gap.
+    auto hasPayload = [&](size_t i) { return (intact[i * 188 + 3] & 0x10) != 0; };
 
     // PES m spans the packets from its unit start up to the next one. Cut the packet
     // just before every third unit start (when it carries payload and is not a unit
@@ -52,27 +44,24 @@ TEST_P(TSParserContinuityGapTest, OnlyThePesWithALostPacketIsMissing) {
     // survive.
     std::vector<size_t> starts;
     for (size_t i = 0; i < count; ++i)
-        if (unitStart(intact, i))
+        if (unitStart(i))
             starts.push_back(i);
-    ASSERT_GT(starts.size(), 12u);
-    std::set<size_t> broken;
-    std::vector<uint8_t> damaged;
-    std::set<size_t> cut;
+    std::set<size_t> broken, cut;
     for (size_t m = 2; m + 1 < starts.size(); m += 3) {
-        const size_t before = starts[m + 1] - 1;
-        if (!unitStart(intact, before) && hasPayload(intact, before)) {
-            cut.insert(before);
+        if (!unitStart(starts[m + 1] - 1) && hasPayload(starts[m + 1] - 1)) {
+            cut.insert(starts[m + 1] - 1);
             broken.insert(m);
         }
     }
     ASSERT_GE(broken.size(), 3u);
+    std::vector<uint8_t> damaged;
     for (size_t i = 0; i < count; ++i)
         if (!cut.count(i))
             damaged.insert(damaged.end(), intact.begin() + i * 188, intact.begin() + (i + 1) * 188);
 
-    const auto reference = parseTs(intact, c.kind);
+    const auto reference = test::parseTs(intact, c.kind);
     test::TraceCapture trace;
-    const auto records = parseTs(damaged, c.kind);
+    const auto records = test::parseTs(damaged, c.kind);
 
     // The last PES has no later unit start to close it, in either run.
     ASSERT_EQ(reference.size(), starts.size() - 1);

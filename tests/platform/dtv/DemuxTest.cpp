@@ -44,10 +44,6 @@ protected:
             handles.push_back(handle);
         return handle;
     }
-    void stop(int handle) {
-        std::erase(handles, handle);
-        EXPECT_EQ(DemuxBinder_StopFiltering(handle), 0);
-    }
     std::vector<int> handles;
 };
 
@@ -184,25 +180,6 @@ TEST_F(DemuxTest, UnpacedFileWaitsForASlowReaderInsteadOfDropping) {
     Demux::FilterStats stats;
     ASSERT_TRUE(Demux::instance().filterStats(handle, &stats));
     EXPECT_EQ(stats.dropped, 0u);
-}
-
-// A looping file starts again at its end; once its last filter stops, a new
-// source is read.
-TEST_F(DemuxTest, LoopingFileThenANewSourceAfterTheLastFilterStops) {
-    const auto a = buildStream({.pids = {0x100}, .rounds = 10});
-    const auto b = buildStream({.pids = {0x100}, .rounds = 5, .firstSequence = 1000});
-    TempFile fileB(b);
-    FileSource source(a, "?pace=none&loop=1");
-    int handle = start(0x100);
-    const std::vector<TsPacket> got = readFilter(handle, 35);
-    ASSERT_GE(got.size(), 35u);
-    const std::vector<TsPacket> once = toPackets(a);
-    for (size_t i = 0; i < got.size(); ++i)
-        EXPECT_EQ(summary({got[i]}), summary({once[i % 10]})) << i;
-    stop(handle);
-    EXPECT_FALSE(Demux::instance().sourceStats().open);
-    source.source.set("file:" + fileB.path() + "?pace=none");
-    EXPECT_EQ(summary(readFilter(start(0x100), 5)), summary(toPackets(b)));
 }
 
 // --- pacing: the behaviour under test is the release time itself -----------------

@@ -2,8 +2,6 @@
 
 #include <gtest/gtest.h>
 
-#include <random>
-
 #include "support/NamedRow.h"
 #include "support/TsTestUtil.h"
 
@@ -120,27 +118,6 @@ TEST(PacketAlignerTest, PacketsOf204BytesLoseTheirTrailer) {
         EXPECT_EQ(align(aligner, rs, piece), clean) << "piece " << piece;
         EXPECT_EQ(aligner.bytesSkipped(), 0u);
     }
-}
-
-TEST(PacketAlignerTest, BytesThatAreNoTransportStreamGiveNoPackets) {
-    std::mt19937 random(7);
-    std::vector<uint8_t> noise(64 * 1024);
-    for (auto& b : noise)
-        b = static_cast<uint8_t>(random() % 0x47);  // no sync byte at all
-    PacketAligner aligner;
-    EXPECT_TRUE(align(aligner, noise, 4096).empty());
-    EXPECT_EQ(aligner.bytesSkipped(), noise.size());
-    EXPECT_EQ(aligner.packetsOut(), 0u);
-}
-
-TEST(PacketAlignerTest, HoldsTheLastPacketUntilTheNextSyncByteIsSeen) {
-    const std::vector<uint8_t> clean = cleanStream(1);  // 3 packets
-    PacketAligner aligner;
-    std::vector<uint8_t> out;
-    aligner.push(clean.data(), clean.size(), out);
-    EXPECT_EQ(out.size(), 2u * 188);  // the third waits for the byte after it
-    aligner.push(clean.data(), 1, out);
-    EXPECT_EQ(out.size(), 3u * 188);
 }
 
 }  // namespace

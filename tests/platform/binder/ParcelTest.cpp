@@ -80,10 +80,6 @@ const auto readI32 = [](const Parcel& p) {
     const status_t err = p.readInt32(&v);
     return err == OK || v == 7 ? err : UNKNOWN_ERROR;  // a failed read leaves v alone
 };
-const auto readI64 = [](const Parcel& p) {
-    int64_t v;
-    return p.readInt64(&v);
-};
 const auto readS16 = [](const Parcel& p) {
     String16 s;
     return p.readString16(&s);
@@ -108,9 +104,7 @@ const auto token = [](const Parcel& p) {
 INSTANTIATE_TEST_SUITE_P(
     Reads, ParcelShortReadTest,
     ::testing::Values(
-        ShortReadCase{"int32_of_empty", {}, readI32, NOT_ENOUGH_DATA},
         ShortReadCase{"int32_of_3_bytes", {1, 2, 3}, readI32, NOT_ENOUGH_DATA},
-        ShortReadCase{"int64_of_4_bytes", {1, 2, 3, 4}, readI64, NOT_ENOUGH_DATA},
         ShortReadCase{"string16_units_missing", {5, 0, 0, 0, 'a', 0}, readS16, NOT_ENOUGH_DATA},
         ShortReadCase{"string16_length_huge",
                       {0xff, 0xff, 0xff, 0x7f, 'a', 0, 0, 0},

@@ -38,10 +38,11 @@ TEST(DemuxSourceConfigTest, AcceptsEverySourceForm) {
         {"dvb:2.1", "dvb 2.1 queue 8192 drop"},
     };
     for (const auto& c : cases) {
+        SCOPED_TRACE(c.text);
         DemuxSourceConfig config;
         std::string error;
-        ASSERT_TRUE(DemuxSourceConfig::parse(c.text, &config, &error)) << c.text << ": " << error;
-        EXPECT_EQ(describe(config), c.parsed) << c.text;
+        ASSERT_TRUE(DemuxSourceConfig::parse(c.text, &config, &error)) << error;
+        EXPECT_EQ(describe(config), c.parsed);
     }
 }
 

@@ -34,10 +34,6 @@ struct Note {
     std::string thread;
 };
 
-bool matches(const Note& note, int msg, int ext1) {
-    return note.msg == msg && (ext1 == -1 || note.ext1 == ext1);
-}
-
 class RecordingListener : public android::MediaPlayerListener {
 public:
     void notify(int msg, int ext1, int ext2, const android::Parcel*) override {
@@ -50,23 +46,25 @@ public:
         std::lock_guard<std::mutex> lock(mMutex);
         return mNotes;
     }
-    // Index of the first note `msg` (and `ext1` unless -1), waiting for it when `wait`;
-    // -1 if none.
-    int waitFor(int msg, int ext1 = -1, bool wait = true) {
+    // Index of the first note `msg` (and `ext1` unless -1) so far; -1 if none.
+    int find(int msg, int ext1 = -1) {
+        const std::vector<Note> all = notes();
+        for (size_t i = 0; i < all.size(); ++i) {
+            if (all[i].msg == msg && (ext1 == -1 || all[i].ext1 == ext1))
+                return static_cast<int>(i);
+        }
+        return -1;
+    }
+    // The same, once it has come.
+    int waitFor(int msg) {
         int found = -1;
-        auto look = [&] {
-            const std::vector<Note> all = notes();
-            for (size_t i = 0; i < all.size() && found < 0; ++i)
-                found = matches(all[i], msg, ext1) ? static_cast<int>(i) : -1;
-            return found >= 0;
-        };
-        wait ? waitUntil(look) : look();
+        waitUntil([&] { return (found = find(msg)) >= 0; });
         return found;
     }
     int count(int msg, int ext1 = -1) {
         int n = 0;
         for (const Note& note : notes())
-            n += matches(note, msg, ext1);
+            n += note.msg == msg && (ext1 == -1 || note.ext1 == ext1);
         return n;
     }
 
@@ -135,8 +133,7 @@ TEST_P(MediaPlayerPlaybackTest, PreparesPlaysToTheEndAndNotifiesInOrder) {
     ASSERT_GE(complete, 0);
     EXPECT_FALSE(mPlayer->isPlaying());
     // Delivered in order: a first frame shown is reported before the end is.
-    const int rendering =
-        mListener->waitFor(android::MEDIA_INFO, android::MEDIA_INFO_RENDERING_START, {});
+    const int rendering = mListener->find(android::MEDIA_INFO, android::MEDIA_INFO_RENDERING_START);
     if (c.width > 0) {
         EXPECT_GT(rendering, size);
         EXPECT_LT(rendering, complete);

@@ -104,21 +104,5 @@ INSTANTIATE_TEST_SUITE_P(
         Fault{"LostSyncByte", 188 * 30, 1, {0}, 59}),
     [](const ::testing::TestParamInfo<Fault>& info) { return std::string(info.param.name); });
 
-TEST(PacketAlignerTest, PacketsOf204BytesLoseTheirTrailer) {
-    const std::vector<uint8_t> clean = cleanStream();
-    std::vector<uint8_t> rs;
-    for (size_t i = 0; i < clean.size(); i += 188) {
-        rs.insert(rs.end(), clean.begin() + i, clean.begin() + i + 188);
-        // An ISDB-T information trailer may well hold 0x47 bytes.
-        for (int k = 0; k < 16; ++k)
-            rs.push_back(k == 3 ? 0x47 : static_cast<uint8_t>(k));
-    }
-    for (size_t piece : {size_t{1}, size_t{204}, size_t{0}}) {
-        PacketAligner aligner;
-        EXPECT_EQ(align(aligner, rs, piece), clean) << "piece " << piece;
-        EXPECT_EQ(aligner.bytesSkipped(), 0u);
-    }
-}
-
 }  // namespace
 }  // namespace TavoPlayer

@@ -22,7 +22,6 @@
 
 #include <sqlite3.h>
 #include <functional>
-#include <map>
 #include "DemuxTestUtil.h"
 #include "support/ScopedEnv.h"
 #include "support/TsTestUtil.h"

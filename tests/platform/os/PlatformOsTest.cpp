@@ -7,7 +7,6 @@
 #include "platform/os/Properties.h"
 #include "platform/os/Trace.h"
 #include "support/ScopedEnv.h"
-#include "support/TraceCapture.h"
 #include "support/TsTestUtil.h"
 
 namespace TavoPlayer {
@@ -49,15 +48,7 @@ TEST_F(PropertiesTest, AMissingFileGivesTheDefault) {
 }
 
 // ---------------------------------------------------------------------------------
-// Trace: formatting and the level filter.
-
-TEST(TraceTest, LongMessagesAreFormattedWhole) {
-    test::TraceCapture capture;
-    const std::string big(3000, 'x');
-    TAVO_LOGI("%s: %s\n", "op", big.c_str());
-    ASSERT_EQ(1u, capture.lines().size());
-    EXPECT_EQ("op: " + big + "\n", capture.lines()[0].text);
-}
+// Trace: the level filter.
 
 TEST(TraceTest, LevelFiltersWhatReachesStderr) {
     setTraceLevel(TRACE_WARNING);

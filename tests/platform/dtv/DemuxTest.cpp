@@ -10,7 +10,6 @@
 #include <cstring>
 #include <filesystem>
 #include <fstream>
-#include <set>
 #include <thread>
 
 #include "DemuxTestUtil.h"
@@ -63,24 +62,6 @@ TEST(DemuxHandleSetTest, IsAValueOf132BytesWithOneBitPerHandle) {
     EXPECT_EQ(std::memcmp(&copy, &set, sizeof set), 0);
     for (int h : {-1, 1, 1056})
         EXPECT_FALSE(DemuxBinder_HandleISSET(h, &set)) << h;
-}
-
-TEST_F(DemuxTest, FiltersGetEveryPacketOfTheirPidInOrderAndNoOther) {
-    const auto stream =
-        buildStream({.pids = {0x0, 0x100, 0x101, 0x130, 0x1FFF}, .rounds = 500, .pcrPid = 0x100});
-    FileSource source(stream);
-    auto expected = packetsByPid(stream);
-    const int video = start(0x100, kDemuxFilterVideo);
-    const int audio = start(0x101);
-    const int captions = start(0x130);
-    const int videoAgain = start(0x100, kDemuxFilterPcr);  // two filters on one PID
-    EXPECT_EQ(std::set<int>({video, audio, captions, videoAgain}).size(), 4u);
-    EXPECT_EQ(summary(readFilter(video, 500)), summary(expected[0x100]));
-    EXPECT_EQ(summary(readFilter(audio, 500)), summary(expected[0x101]));
-    EXPECT_EQ(summary(readFilter(captions, 500)), summary(expected[0x130]));
-    EXPECT_EQ(summary(readFilter(videoAgain, 500)), summary(expected[0x100]));
-    // Nothing more, and nothing of PIDs that no filter asked for.
-    EXPECT_TRUE(readFilter(video, 1, 200ms).empty());
 }
 
 TEST_F(DemuxTest, SelectReportsOnlyReadyHandlesAndTimesOutWithZero) {

@@ -282,11 +282,11 @@ int64_t firstPcrMs(int handle, uint64_t clipFirstPcr) {
     return -1;
 }
 
-// A 40-second recording, played back.
-class ClipPlaybackTest : public RecordingServiceTest {
-protected:
-    void SetUp() override {
-        RecordingServiceTest::SetUp();
+// A 40-second recording, played back. Pausing is run end to end by the service's
+// tests; here, where each reposition lands.
+TEST_F(RecordingServiceTest, AClipRepositionsWhileFilteringOrStoppedAndReportsItsEnd) {
+    int number = 0;
+    {
         ScopedDemuxSource demux("file:" + tsgenStream(40) + "?pace=none");
         EventLog recorder;
         number = record(recorder);
@@ -294,15 +294,17 @@ protected:
         ASSERT_TRUE(recorder.waitFor(kRecEventDemuxLost));
         ASSERT_EQ(RecPlayerBinder_StopTSRecorder(), 1);
         ASSERT_EQ(RecPlayerBinder_DeleteTSRecorder(), 1);
-        video = packetsOf(fileBytes(file(number)), kVideo);
-        for (const TsPacket& p : video) {
-            bool discontinuity = false;
-            if (PcrPacer::readPcr(p.data(), &firstPcr, &discontinuity))
-                break;
-        }
-        ASSERT_EQ(RecPlayerBinder_IsTSPlayerActive(EventLog::callback, &events), 1);
     }
-    int open() {
+    const std::vector<TsPacket> video = packetsOf(fileBytes(file(number)), kVideo);
+    uint64_t firstPcr = 0;
+    bool discontinuity = false;
+    for (const TsPacket& p : video) {
+        if (PcrPacer::readPcr(p.data(), &firstPcr, &discontinuity))
+            break;
+    }
+    EventLog events;
+    ASSERT_EQ(RecPlayerBinder_IsTSPlayerActive(EventLog::callback, &events), 1);
+    auto open = [&] {
         // As the URI parser leaves a FILE path: without its last character.
         RecDetails* d = RecPlayerBinder_GetRecClipDetails(
             (dir + "/" + std::to_string(number) + ".t").c_str(), 1);
@@ -314,15 +316,7 @@ protected:
         }
         freeDetails(d);
         return duration;
-    }
-    int number = 0;
-    std::vector<TsPacket> video;
-    uint64_t firstPcr = 0;
-    EventLog events;
-};
-
-// Pausing is run end to end by the service's tests; here, where each reposition lands.
-TEST_F(ClipPlaybackTest, RepositionsWhileFilteringOrStoppedReportsItsEndThenLiveComesBack) {
+    };
     EXPECT_NEAR(open(), 40000, 1000);
     EXPECT_EQ(RecPlayerBinder_IsPossibleSeek(), 1);
     int handle = DemuxBinder_StartFiltering(kVideo, kDemuxFilterVideo);

@@ -162,12 +162,9 @@ TEST_F(RecordingServiceTest, RecordsTheLivePacketsOfItsPidsUnchangedInOrderInAPl
 
     EXPECT_NE(probe(path).find("h264\naac_latm\narib_caption\n"), std::string::npos) << probe(path);
 
-    const RecordingCatalog::Entry e = row(number);
-    EXPECT_EQ(e.prgName, "News");
-    EXPECT_EQ(e.captionPid, kCaptions);
-    EXPECT_EQ(e.state, RecordingCatalog::kComplete);
-    EXPECT_EQ(e.sizeBytes, recorded.size());
-    EXPECT_NEAR(e.playbackDuration, 20000, 1000);
+    // The names, state, size and duration are checked where a clip is opened, killed or
+    // cut short; the caption PID is what the clip's playback takes from here.
+    EXPECT_EQ(row(number).captionPid, kCaptions);
     RecordingCatalog catalog(dir);
     ASSERT_EQ(catalog.open(), RecordingCatalog::Status::kOk);
     const auto index = catalog.loadIndex(number);
@@ -313,6 +310,7 @@ TEST_F(RecordingServiceTest, AClipRepositionsWhileFilteringOrStoppedAndReportsIt
         if (d != nullptr) {
             EXPECT_EQ(d->fileNumName, number);
             EXPECT_STREQ(d->stationName, "TV Tavo");
+            EXPECT_STREQ(d->prgName, "News");
         }
         freeDetails(d);
         return duration;

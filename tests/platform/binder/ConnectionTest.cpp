@@ -20,16 +20,8 @@ namespace {
 // An object that echoes what it is sent and remembers who called it.
 class Echo : public BBinder {
 public:
-    enum : uint32_t { ECHO = 1, CALL_BACK = 2, RECORD = 3 };
+    enum : uint32_t { ECHO = 1, CALL_BACK = 2 };
 
-    std::vector<int32_t> records() {
-        std::lock_guard<std::mutex> lock(mLock);
-        return mRecords;
-    }
-    bool waitRecords(size_t n) {
-        std::unique_lock<std::mutex> lock(mLock);
-        return mCv.wait_for(lock, std::chrono::seconds(10), [&] { return mRecords.size() >= n; });
-    }
     pid_t callerPid = 0;
     uid_t callerUid = 0;
 
@@ -58,21 +50,10 @@ protected:
                 reply->writeInt32(err == OK ? out.readInt32() : err);
                 return OK;
             }
-            case RECORD: {
-                std::lock_guard<std::mutex> lock(mLock);
-                mRecords.push_back(data.readInt32());
-                mCv.notify_all();
-                return OK;
-            }
             default:
                 return BBinder::onTransact(code, data, reply, flags);
         }
     }
-
-private:
-    std::mutex mLock;
-    std::condition_variable mCv;
-    std::vector<int32_t> mRecords;
 };
 
 // Two connections joined by a socket pair: `server` serves `service` as its root.
@@ -127,23 +108,6 @@ TEST_F(ConnectionTest, NestedCallBackWhileTheCallerWaits) {
     data.writeStrongBinder(mine);
     ASSERT_EQ(OK, proxy->transact(Echo::CALL_BACK, data, &reply));
     EXPECT_EQ(42, reply.readInt32());
-}
-
-TEST_F(ConnectionTest, OnewayCallsRunInOrderAndUnknownCodesGetTheDefault) {
-    constexpr int kCalls = 200;
-    for (int i = 0; i < kCalls; ++i) {
-        Parcel data;
-        data.writeInt32(i);
-        ASSERT_EQ(OK, proxy->transact(Echo::RECORD, data, nullptr, IBinder::FLAG_ONEWAY));
-    }
-    ASSERT_TRUE(service->waitRecords(kCalls));
-    const std::vector<int32_t> records = service->records();
-    for (int i = 0; i < kCalls; ++i)
-        ASSERT_EQ(i, records[i]);
-
-    Parcel data, reply;
-    EXPECT_EQ(UNKNOWN_TRANSACTION, proxy->transact(77, data, &reply));
-    EXPECT_EQ(OK, proxy->pingBinder());
 }
 
 TEST_F(ConnectionTest, HangUpFailsCallsAndTellsDeathRecipients) {

@@ -5,61 +5,44 @@
 namespace TavoPlayer {
 namespace {
 
-using Kind = DemuxSourceConfig::Kind;
-using Overflow = DemuxSourceConfig::Overflow;
-
-struct Good {
-    const char* text;
-    Kind kind;
-    const char* pathOrHost;
-    int portOrAdapter;
-    int demux;
-    bool loop;
-    bool paced;
-    size_t queue;
-    Overflow overflow;
-};
+// Every field that applies to the source's kind, on one line.
+std::string describe(const DemuxSourceConfig& c) {
+    using Kind = DemuxSourceConfig::Kind;
+    const char* kinds[] = {"none", "file", "udp", "stdin", "dvb"};
+    std::string text = kinds[static_cast<int>(c.kind)];
+    if (c.kind == Kind::kFile)
+        text += " " + c.path + (c.loop ? " loop" : "") + (c.paced ? " paced" : " unpaced");
+    if (c.kind == Kind::kUdp)
+        text += " " + c.host + ":" + std::to_string(c.port) + " " + c.iface;
+    if (c.kind == Kind::kDvb)
+        text += " " + std::to_string(c.adapter) + "." + std::to_string(c.demux);
+    text += " queue " + std::to_string(c.queuePackets);
+    return text + (c.overflow == DemuxSourceConfig::Overflow::kDrop ? " drop" : " wait");
+}
 
 TEST(DemuxSourceConfigTest, AcceptsEverySourceForm) {
-    const Good cases[] = {
-        {"file:/a/b.ts", Kind::kFile, "/a/b.ts", 0, 0, false, true, 8192, Overflow::kDrop},
-        {"file:/a/b.ts?loop=1", Kind::kFile, "/a/b.ts", 0, 0, true, true, 8192, Overflow::kDrop},
+    const struct {
+        const char* text;
+        const char* parsed;
+    } cases[] = {
+        {"file:/a/b.ts", "file /a/b.ts paced queue 8192 drop"},
         // Unpaced files wait for a slow reader unless told otherwise.
-        {"file:x.ts?pace=none&loop=1", Kind::kFile, "x.ts", 0, 0, true, false, 8192,
-         Overflow::kWait},
-        {"file:x.ts?pace=none&overflow=drop", Kind::kFile, "x.ts", 0, 0, false, false, 8192,
-         Overflow::kDrop},
-        {"file:x.ts?queue=16&pace=pcr", Kind::kFile, "x.ts", 0, 0, false, true, 16,
-         Overflow::kDrop},
-        {"udp://239.1.2.3:1234", Kind::kUdp, "239.1.2.3", 1234, 0, false, true, 8192,
-         Overflow::kDrop},
-        {"udp://:5000?queue=100", Kind::kUdp, "", 5000, 0, false, true, 100, Overflow::kDrop},
-        {"udp://[::1]:5000", Kind::kUdp, "::1", 5000, 0, false, true, 8192, Overflow::kDrop},
-        {"stdin", Kind::kStdin, "", 0, 0, false, true, 8192, Overflow::kDrop},
-        {"stdin?overflow=wait", Kind::kStdin, "", 0, 0, false, true, 8192, Overflow::kWait},
-        {"dvb:0", Kind::kDvb, "", 0, 0, false, true, 8192, Overflow::kDrop},
-        {"dvb:2.1", Kind::kDvb, "", 2, 1, false, true, 8192, Overflow::kDrop},
+        {"file:x.ts?pace=none&loop=1", "file x.ts loop unpaced queue 8192 wait"},
+        {"file:x.ts?pace=none&overflow=drop", "file x.ts unpaced queue 8192 drop"},
+        {"file:x.ts?queue=16&pace=pcr", "file x.ts paced queue 16 drop"},
+        {"udp://239.1.2.3:1234?iface=10.0.0.2", "udp 239.1.2.3:1234 10.0.0.2 queue 8192 drop"},
+        {"udp://:5000?queue=100", "udp :5000  queue 100 drop"},
+        {"udp://[::1]:5000", "udp ::1:5000  queue 8192 drop"},
+        {"stdin?overflow=wait", "stdin queue 8192 wait"},
+        {"dvb:0", "dvb 0.0 queue 8192 drop"},
+        {"dvb:2.1", "dvb 2.1 queue 8192 drop"},
     };
-    for (const Good& c : cases) {
+    for (const auto& c : cases) {
+        SCOPED_TRACE(c.text);
         DemuxSourceConfig config;
         std::string error;
-        ASSERT_TRUE(DemuxSourceConfig::parse(c.text, &config, &error)) << c.text << ": " << error;
-        EXPECT_EQ(config.kind, c.kind) << c.text;
-        if (c.kind == Kind::kFile) {
-            EXPECT_EQ(config.path, c.pathOrHost) << c.text;
-        }
-        if (c.kind == Kind::kUdp) {
-            EXPECT_EQ(config.host, c.pathOrHost) << c.text;
-            EXPECT_EQ(config.port, c.portOrAdapter) << c.text;
-        }
-        if (c.kind == Kind::kDvb) {
-            EXPECT_EQ(config.adapter, c.portOrAdapter) << c.text;
-            EXPECT_EQ(config.demux, c.demux) << c.text;
-        }
-        EXPECT_EQ(config.loop, c.loop) << c.text;
-        EXPECT_EQ(config.paced, c.paced) << c.text;
-        EXPECT_EQ(config.queuePackets, c.queue) << c.text;
-        EXPECT_EQ(config.overflow, c.overflow) << c.text;
+        ASSERT_TRUE(DemuxSourceConfig::parse(c.text, &config, &error)) << error;
+        EXPECT_EQ(describe(config), c.parsed);
     }
 }
 
@@ -82,8 +65,6 @@ TEST(DemuxSourceConfigTest, RefusesMalformedSourcesAndSaysWhy) {
         {"udp://239.1.2.3:70000", "port must be"},
         {"udp://239.1.2.3:12ab", "port must be"},
         {"dvb:", "ADAPTER"},
-        {"dvb:a", "ADAPTER"},
-        {"dvb:0.", "ADAPTER"},
         {"dvb:0.x", "ADAPTER"},
         {"dvb:-1", "ADAPTER"},
         {"stdin?overflow=maybe", "overflow must be"},

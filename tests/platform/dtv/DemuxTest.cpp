@@ -10,7 +10,6 @@
 #include <cstring>
 #include <filesystem>
 #include <fstream>
-#include <set>
 #include <thread>
 
 #include "DemuxTestUtil.h"
@@ -44,10 +43,6 @@ protected:
             handles.push_back(handle);
         return handle;
     }
-    void stop(int handle) {
-        std::erase(handles, handle);
-        EXPECT_EQ(DemuxBinder_StopFiltering(handle), 0);
-    }
     std::vector<int> handles;
 };
 
@@ -67,24 +62,6 @@ TEST(DemuxHandleSetTest, IsAValueOf132BytesWithOneBitPerHandle) {
     EXPECT_EQ(std::memcmp(&copy, &set, sizeof set), 0);
     for (int h : {-1, 1, 1056})
         EXPECT_FALSE(DemuxBinder_HandleISSET(h, &set)) << h;
-}
-
-TEST_F(DemuxTest, FiltersGetEveryPacketOfTheirPidInOrderAndNoOther) {
-    const auto stream =
-        buildStream({.pids = {0x0, 0x100, 0x101, 0x130, 0x1FFF}, .rounds = 500, .pcrPid = 0x100});
-    FileSource source(stream);
-    auto expected = packetsByPid(stream);
-    const int video = start(0x100, kDemuxFilterVideo);
-    const int audio = start(0x101);
-    const int captions = start(0x130);
-    const int videoAgain = start(0x100, kDemuxFilterPcr);  // two filters on one PID
-    EXPECT_EQ(std::set<int>({video, audio, captions, videoAgain}).size(), 4u);
-    EXPECT_EQ(summary(readFilter(video, 500)), summary(expected[0x100]));
-    EXPECT_EQ(summary(readFilter(audio, 500)), summary(expected[0x101]));
-    EXPECT_EQ(summary(readFilter(captions, 500)), summary(expected[0x130]));
-    EXPECT_EQ(summary(readFilter(videoAgain, 500)), summary(expected[0x100]));
-    // Nothing more, and nothing of PIDs that no filter asked for.
-    EXPECT_TRUE(readFilter(video, 1, 200ms).empty());
 }
 
 TEST_F(DemuxTest, SelectReportsOnlyReadyHandlesAndTimesOutWithZero) {
@@ -184,25 +161,6 @@ TEST_F(DemuxTest, UnpacedFileWaitsForASlowReaderInsteadOfDropping) {
     Demux::FilterStats stats;
     ASSERT_TRUE(Demux::instance().filterStats(handle, &stats));
     EXPECT_EQ(stats.dropped, 0u);
-}
-
-// A looping file starts again at its end; once its last filter stops, a new
-// source is read.
-TEST_F(DemuxTest, LoopingFileThenANewSourceAfterTheLastFilterStops) {
-    const auto a = buildStream({.pids = {0x100}, .rounds = 10});
-    const auto b = buildStream({.pids = {0x100}, .rounds = 5, .firstSequence = 1000});
-    TempFile fileB(b);
-    FileSource source(a, "?pace=none&loop=1");
-    int handle = start(0x100);
-    const std::vector<TsPacket> got = readFilter(handle, 35);
-    ASSERT_GE(got.size(), 35u);
-    const std::vector<TsPacket> once = toPackets(a);
-    for (size_t i = 0; i < got.size(); ++i)
-        EXPECT_EQ(summary({got[i]}), summary({once[i % 10]})) << i;
-    stop(handle);
-    EXPECT_FALSE(Demux::instance().sourceStats().open);
-    source.source.set("file:" + fileB.path() + "?pace=none");
-    EXPECT_EQ(summary(readFilter(start(0x100), 5)), summary(toPackets(b)));
 }
 
 // --- pacing: the behaviour under test is the release time itself -----------------

@@ -2,8 +2,6 @@
 
 #include <gtest/gtest.h>
 
-#include <random>
-
 #include "support/NamedRow.h"
 #include "support/TsTestUtil.h"
 
@@ -105,43 +103,6 @@ INSTANTIATE_TEST_SUITE_P(
         Fault{"TruncatedLastPacket", 188 * 60 - 50, 50, {}, 59, 138},
         Fault{"LostSyncByte", 188 * 30, 1, {0}, 59}),
     [](const ::testing::TestParamInfo<Fault>& info) { return std::string(info.param.name); });
-
-TEST(PacketAlignerTest, PacketsOf204BytesLoseTheirTrailer) {
-    const std::vector<uint8_t> clean = cleanStream();
-    std::vector<uint8_t> rs;
-    for (size_t i = 0; i < clean.size(); i += 188) {
-        rs.insert(rs.end(), clean.begin() + i, clean.begin() + i + 188);
-        // An ISDB-T information trailer may well hold 0x47 bytes.
-        for (int k = 0; k < 16; ++k)
-            rs.push_back(k == 3 ? 0x47 : static_cast<uint8_t>(k));
-    }
-    for (size_t piece : {size_t{1}, size_t{204}, size_t{0}}) {
-        PacketAligner aligner;
-        EXPECT_EQ(align(aligner, rs, piece), clean) << "piece " << piece;
-        EXPECT_EQ(aligner.bytesSkipped(), 0u);
-    }
-}
-
-TEST(PacketAlignerTest, BytesThatAreNoTransportStreamGiveNoPackets) {
-    std::mt19937 random(7);
-    std::vector<uint8_t> noise(64 * 1024);
-    for (auto& b : noise)
-        b = static_cast<uint8_t>(random() % 0x47);  // no sync byte at all
-    PacketAligner aligner;
-    EXPECT_TRUE(align(aligner, noise, 4096).empty());
-    EXPECT_EQ(aligner.bytesSkipped(), noise.size());
-    EXPECT_EQ(aligner.packetsOut(), 0u);
-}
-
-TEST(PacketAlignerTest, HoldsTheLastPacketUntilTheNextSyncByteIsSeen) {
-    const std::vector<uint8_t> clean = cleanStream(1);  // 3 packets
-    PacketAligner aligner;
-    std::vector<uint8_t> out;
-    aligner.push(clean.data(), clean.size(), out);
-    EXPECT_EQ(out.size(), 2u * 188);  // the third waits for the byte after it
-    aligner.push(clean.data(), 1, out);
-    EXPECT_EQ(out.size(), 3u * 188);
-}
 
 }  // namespace
 }  // namespace TavoPlayer

@@ -1,14 +1,13 @@
 #include <signal.h>
-#include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <gtest/gtest.h>
 
 #include <algorithm>
-#include <condition_variable>
 #include <cstdlib>
 #include <filesystem>
+#include <fstream>
 #include <mutex>
 #include <string>
 #include <thread>
@@ -23,10 +22,8 @@
 
 #include <sqlite3.h>
 #include <functional>
-#include <map>
 #include "DemuxTestUtil.h"
 #include "support/ScopedEnv.h"
-#include "support/TraceCapture.h"
 #include "support/TsTestUtil.h"
 
 namespace TavoPlayer {
@@ -51,20 +48,15 @@ struct EventLog {
         auto* self = static_cast<EventLog*>(userData);
         std::lock_guard<std::mutex> lock(self->lock);
         self->events.push_back(event);
-        self->changed.notify_all();
     }
     bool waitFor(int event, std::chrono::milliseconds deadline = kDeadline) {
-        std::unique_lock<std::mutex> lock(this->lock);
-        return changed.wait_for(lock, deadline, [&] {
-            return std::find(events.begin(), events.end(), event) != events.end();
-        });
+        return waitUntil([&] { return std::ranges::count(all(), event) > 0; }, deadline);
     }
     std::vector<int> all() {
         std::lock_guard<std::mutex> l(lock);
         return events;
     }
     std::mutex lock;
-    std::condition_variable changed;
     std::vector<int> events;
 };
 
@@ -72,20 +64,13 @@ std::vector<TsPacket> packetsOf(const std::vector<uint8_t>& ts, uint16_t pid) {
     return toPackets(bytesOfPid(ts, pid));
 }
 
-std::string probe(const std::string& path) {
+// What ffprobe reads of a file (its codec names unless told), or why it failed.
+std::string probe(const std::string& path, const char* entries = "stream=codec_name") {
     bool ok = false;
     const std::string out = runCommand(
-        "ffprobe -v error -show_entries format=duration:stream=codec_name -of compact=nk=1 " +
-            path + " 2>&1",
+        std::string("ffprobe -v error -show_entries ") + entries + " -of csv=p=0 " + path + " 2>&1",
         &ok);
     return ok ? out : "ffprobe failed: " + out;
-}
-
-double probedDuration(const std::string& path) {
-    bool ok = false;
-    const std::string out = runCommand(
-        "ffprobe -v error -show_entries format=duration -of default=nw=1:nk=1 " + path, &ok);
-    return ok ? std::atof(out.c_str()) : -1.0;
 }
 
 void freeDetails(RecDetails* d) {
@@ -106,8 +91,7 @@ protected:
         EXPECT_FALSE(Demux::instance().sourceStats().open);
     }
     // Creates and starts a recording of the tsgen PIDs; returns its number.
-    int record(EventLog& events, const std::string& station = "TV Tavo",
-               const std::string& programme = "News") {
+    int record(EventLog& events) {
         EXPECT_EQ(
             RecPlayerBinder_CreateTSRecorder(0, 2, kVideo, kAudio, 1, EventLog::callback, &events),
             1);
@@ -118,21 +102,18 @@ protected:
         if (d == nullptr)
             return 0;
         // As the recorder fills it in.
+        char station[] = "TV Tavo", programme[] = "News";
         RecDetails copy = *d;
-        copy.stationName = strdup(station.c_str());
-        copy.stationNameLength = static_cast<uint32_t>(station.size());
-        copy.prgName = strdup(programme.c_str());
-        copy.prgNameLength = static_cast<uint32_t>(programme.size());
-        copy.recMode = 0;
-        copy.recLocation = 2;
-        copy.bCanPlay = 1;
+        copy.stationName = station;
+        copy.stationNameLength = sizeof station - 1;
+        copy.prgName = programme;
+        copy.prgNameLength = sizeof programme - 1;
         EXPECT_EQ(RecPlayerBinder_SetCurrTSRecDetails(&copy), 1);
-        free(copy.stationName);
-        free(copy.prgName);
         const int number = d->fileNumName;
         freeDetails(d);
         return number;
     }
+    std::string file(int number) const { return dir + "/" + std::to_string(number) + ".ts"; }
     RecordingCatalog::Entry row(int number) {
         RecordingCatalog catalog(dir);
         EXPECT_EQ(catalog.open(), RecordingCatalog::Status::kOk);
@@ -155,7 +136,7 @@ TEST_F(RecordingServiceTest, RecordsTheLivePacketsOfItsPidsUnchangedInOrderInAPl
     EXPECT_EQ(RecPlayerBinder_StopTSRecorder(), 1);
     EXPECT_EQ(RecPlayerBinder_DeleteTSRecorder(), 1);
 
-    const std::string path = dir + "/" + std::to_string(number) + ".ts";
+    const std::string path = file(number);
     const std::vector<uint8_t> live = fileBytes(source);
     const std::vector<uint8_t> recorded = fileBytes(path);
     ASSERT_EQ(recorded.size() % 188, 0u);
@@ -179,28 +160,11 @@ TEST_F(RecordingServiceTest, RecordsTheLivePacketsOfItsPidsUnchangedInOrderInAPl
     }
     EXPECT_EQ(pidOf(recorded.data()), 0) << "the file starts with its PAT";
 
-    const std::string streams = probe(path);
-    EXPECT_NE(streams.find("h264"), std::string::npos) << streams;
-    EXPECT_NE(streams.find("aac_latm"), std::string::npos) << streams;
-    EXPECT_NE(streams.find("arib_caption"), std::string::npos) << streams;
-    EXPECT_NEAR(probedDuration(path), probedDuration(source), 1.0);
+    EXPECT_NE(probe(path).find("h264\naac_latm\narib_caption\n"), std::string::npos) << probe(path);
 
-    const RecordingCatalog::Entry e = row(number);
-    EXPECT_EQ(e.stationName, "TV Tavo");
-    EXPECT_EQ(e.prgName, "News");
-    EXPECT_EQ(e.recLocation, 2);
-    EXPECT_EQ(e.bCanPlay, 1u);
-    EXPECT_EQ(e.videoPid, kVideo);
-    EXPECT_EQ(e.audioPid, kAudio);
-    EXPECT_EQ(e.captionPid, kCaptions);
-    EXPECT_EQ(e.isLATM, 1);
-    EXPECT_EQ(e.state, RecordingCatalog::kComplete);
-    EXPECT_EQ(e.sizeBytes, recorded.size());
-    EXPECT_EQ(e.sizeOfRec, recorded.size() / 1024);
-    EXPECT_NEAR(e.playbackDuration, 20000, 1000);
-    EXPECT_EQ(e.durationOfRec, e.playbackDuration / 1000);
-    EXPECT_GT(e.recEndTime, 0u);
-    EXPECT_GE(e.recEndTime, e.recStartTime);
+    // The names, state, size and duration are checked where a clip is opened, killed or
+    // cut short; the caption PID is what the clip's playback takes from here.
+    EXPECT_EQ(row(number).captionPid, kCaptions);
     RecordingCatalog catalog(dir);
     ASSERT_EQ(catalog.open(), RecordingCatalog::Status::kOk);
     const auto index = catalog.loadIndex(number);
@@ -220,36 +184,13 @@ TEST_F(RecordingServiceTest, CancelLeavesNoFileAndNoRow) {
     EventLog events;
     const int number = record(events);
     ASSERT_GT(number, 0);
-    const std::string path = dir + "/" + std::to_string(number) + ".ts";
-    ASSERT_TRUE(waitUntil([&] { return fs::exists(path) && fs::file_size(path) > 0; }));
+    ASSERT_TRUE(waitUntil([&] { return fs::exists(file(number)) && fs::file_size(file(number)); }));
     EXPECT_EQ(RecPlayerBinder_CancelTSRecorder(), 1);
     EXPECT_EQ(RecPlayerBinder_DeleteTSRecorder(), 1);
-    EXPECT_FALSE(fs::exists(path));
+    EXPECT_FALSE(fs::exists(file(number)));
     RecordingCatalog catalog(dir);
     ASSERT_EQ(catalog.open(), RecordingCatalog::Status::kOk);
     EXPECT_FALSE(catalog.get(number).has_value());
-    EXPECT_TRUE(catalog.loadIndex(number).empty());
-}
-
-TEST_F(RecordingServiceTest, ASecondRecordingIsRefusedAndTheFirstGoesOn) {
-    ScopedDemuxSource demux("file:" + tsgenStream(20) + "?pace=pcr");
-    EventLog first, second;
-    const int number = record(first);
-    ASSERT_GT(number, 0);
-    EXPECT_EQ(
-        RecPlayerBinder_CreateTSRecorder(0, 0, kVideo, kAudio, 1, EventLog::callback, &second), 0);
-    EXPECT_EQ(RecPlayerBinder_AnyMoreRecordings(), 0);
-    EXPECT_EQ(RecPlayerBinder_StartTSRecorder(), 0);
-    EXPECT_EQ(RecPlayerBinder_GetCurrTSRecDetails(), nullptr);
-    EXPECT_TRUE(second.waitFor(kRecEventTooManyRecordings));
-    // The refused recorder's stop reaches nothing; the first recording goes on.
-    EXPECT_EQ(RecPlayerBinder_StopTSRecorder(), 0);
-    const std::string path = dir + "/" + std::to_string(number) + ".ts";
-    const auto size = fs::file_size(path);
-    EXPECT_TRUE(waitUntil([&] { return fs::file_size(path) > size; }));
-    EXPECT_EQ(RecPlayerBinder_StopTSRecorder(), 1);
-    EXPECT_EQ(row(number).state, RecordingCatalog::kComplete);
-    EXPECT_TRUE(first.all().empty() || first.all() == std::vector<int>{kRecEventDemuxLost});
 }
 
 // A recording in a child process of its own, started from a demux source. The shell
@@ -289,22 +230,17 @@ TEST_F(RecordingServiceTest, AKilledRecordingLeavesAPlayableFileMarkedIncomplete
     ChildRecording child("kill", dir, "file:" + tsgenStream(20) + "?pace=pcr");
     const int number = std::atoi(child.line().c_str());
     ASSERT_GT(number, 0);
-    const std::string path = dir + "/" + std::to_string(number) + ".ts";
+    const std::string path = file(number);
     // A few seconds in: past the first catalog updates.
     ASSERT_TRUE(waitUntil([&] { return fs::exists(path) && fs::file_size(path) > 300'000; }));
     child.killNow();
 
-    RecordingCatalog catalog(dir);  // as the next start of the service opens it
-    ASSERT_EQ(catalog.open(), RecordingCatalog::Status::kOk);
-    const auto e = catalog.get(number);
-    ASSERT_TRUE(e.has_value());
-    EXPECT_EQ(e->state, RecordingCatalog::kIncomplete);
-    EXPECT_EQ(e->sizeBytes, fs::file_size(path));
+    const auto e = row(number);  // as the next start of the service opens the catalog
+    EXPECT_EQ(e.state, RecordingCatalog::kIncomplete);
+    EXPECT_EQ(e.sizeBytes, fs::file_size(path));
     EXPECT_EQ(fs::file_size(path) % 188, 0u);
-    EXPECT_GT(e->playbackDuration, 1000u);
-    const std::string streams = probe(path);
-    EXPECT_NE(streams.find("h264"), std::string::npos) << streams;
-    EXPECT_NEAR(probedDuration(path) * 1000, e->playbackDuration, 1000);
+    EXPECT_GT(e.playbackDuration, 1000u);
+    EXPECT_NEAR(std::atof(probe(path, "format=duration").c_str()) * 1000, e.playbackDuration, 1000);
 }
 
 TEST_F(RecordingServiceTest, AFullDiskStopsTheRecordingCleanlyWithItsEvent) {
@@ -315,12 +251,11 @@ TEST_F(RecordingServiceTest, AFullDiskStopsTheRecordingCleanlyWithItsEvent) {
     ASSERT_GT(number, 0);
     EXPECT_EQ(child.line(), "event " + std::to_string(kRecEventDiskFull) + "\n");
     EXPECT_EQ(WEXITSTATUS(child.wait()), 0) << "the stop after the event succeeds";
-    const std::string path = dir + "/" + std::to_string(number) + ".ts";
+    const std::string path = file(number);
     EXPECT_LE(fs::file_size(path), kLimit);
     EXPECT_EQ(fs::file_size(path) % 188, 0u);
     const auto e = row(number);
     EXPECT_EQ(e.state, RecordingCatalog::kComplete);
-    EXPECT_EQ(e.endReason, "disk full");
     EXPECT_EQ(e.sizeBytes, fs::file_size(path));
     EXPECT_NE(probe(path).find("h264"), std::string::npos);
 }
@@ -344,11 +279,11 @@ int64_t firstPcrMs(int handle, uint64_t clipFirstPcr) {
     return -1;
 }
 
-// A 40-second recording, played back.
-class ClipPlaybackTest : public RecordingServiceTest {
-protected:
-    void SetUp() override {
-        RecordingServiceTest::SetUp();
+// A 40-second recording, played back. Pausing is run end to end by the service's
+// tests; here, where each reposition lands.
+TEST_F(RecordingServiceTest, AClipRepositionsWhileFilteringOrStoppedAndReportsItsEnd) {
+    int number = 0;
+    {
         ScopedDemuxSource demux("file:" + tsgenStream(40) + "?pace=none");
         EventLog recorder;
         number = record(recorder);
@@ -356,76 +291,50 @@ protected:
         ASSERT_TRUE(recorder.waitFor(kRecEventDemuxLost));
         ASSERT_EQ(RecPlayerBinder_StopTSRecorder(), 1);
         ASSERT_EQ(RecPlayerBinder_DeleteTSRecorder(), 1);
-        path = dir + "/" + std::to_string(number) + ".ts";
-        clip = fileBytes(path);
-        video = packetsOf(clip, kVideo);
-        for (const TsPacket& p : video) {
-            bool discontinuity = false;
-            if (PcrPacer::readPcr(p.data(), &firstPcr, &discontinuity))
-                break;
-        }
-        // As the URI parser leaves a FILE path: without its last character.
-        clipArgument = path.substr(0, path.size() - 1);
-        ASSERT_EQ(RecPlayerBinder_IsTSPlayerActive(EventLog::callback, &events), 1);
     }
-    int open() {
-        RecDetails* d = RecPlayerBinder_GetRecClipDetails(clipArgument.c_str(), 1);
+    const std::vector<TsPacket> video = packetsOf(fileBytes(file(number)), kVideo);
+    uint64_t firstPcr = 0;
+    bool discontinuity = false;
+    for (const TsPacket& p : video) {
+        if (PcrPacer::readPcr(p.data(), &firstPcr, &discontinuity))
+            break;
+    }
+    EventLog events;
+    ASSERT_EQ(RecPlayerBinder_IsTSPlayerActive(EventLog::callback, &events), 1);
+    auto open = [&] {
+        // As the URI parser leaves a FILE path: without its last character.
+        RecDetails* d = RecPlayerBinder_GetRecClipDetails(
+            (dir + "/" + std::to_string(number) + ".t").c_str(), 1);
         EXPECT_NE(d, nullptr);
         const int duration = d != nullptr ? static_cast<int>(d->playbackDuration) : 0;
         if (d != nullptr) {
             EXPECT_EQ(d->fileNumName, number);
             EXPECT_STREQ(d->stationName, "TV Tavo");
+            EXPECT_STREQ(d->prgName, "News");
         }
         freeDetails(d);
         return duration;
-    }
-    int number = 0;
-    std::string path, clipArgument;
-    std::vector<uint8_t> clip;
-    std::vector<TsPacket> video;
-    uint64_t firstPcr = 0;
-    EventLog events;
-};
-
-TEST_F(ClipPlaybackTest, FeedsTheClipPausesResumesRepositionsAndReportsItsEnd) {
+    };
     EXPECT_NEAR(open(), 40000, 1000);
     EXPECT_EQ(RecPlayerBinder_IsPossibleSeek(), 1);
-    const int handle = DemuxBinder_StartFiltering(kVideo, kDemuxFilterVideo);
-    ASSERT_GE(handle, 0);
-    auto before = readFor(handle, 500ms);
-    ASSERT_FALSE(before.empty());
-    EXPECT_EQ(summary({before.front()}), summary({video.front()})) << "from the clip's start";
-
-    EXPECT_EQ(RecPlayerBinder_PauseTSPlayer(), 1);
-    const auto queued = readFor(handle, 50ms);
-    before.insert(before.end(), queued.begin(), queued.end());
-    EXPECT_TRUE(readFor(handle, 2000ms).empty()) << "no packet flows while paused";
-    EXPECT_EQ(RecPlayerBinder_ResumeTSPlayer(), 1);
-    const auto after = readFor(handle, 300ms);
-    ASSERT_FALSE(after.empty());
-    ASSERT_LT(before.size(), video.size());
-    EXPECT_EQ(summary({after.front()}), summary({video[before.size()]})) << "on from the pause";
-
+    int handle = DemuxBinder_StartFiltering(kVideo, kDemuxFilterVideo);
+    const auto first = readFor(handle, 200ms);
+    ASSERT_FALSE(first.empty());
+    EXPECT_EQ(summary({first.front()}), summary({video.front()})) << "from the clip's start";
+    std::this_thread::sleep_for(300ms);  // packets queue up: the reposition drops them
     EXPECT_EQ(RecPlayerBinder_RepositioningTSPlayer(0, 30000), 1);
     // Within a GOP (15 pictures at 29.97 Hz) of the position.
     EXPECT_NEAR(firstPcrMs(handle, firstPcr), 30000, 500);
-    EXPECT_TRUE(events.all().empty());
-
-    EXPECT_EQ(RecPlayerBinder_RepositioningTSPlayer(30, 39000), 1);
-    EXPECT_TRUE(events.waitFor(kClipEventEnd));
-    EXPECT_EQ(RecPlayerBinder_RepositioningTSPlayer(39, 60000), 0) << "beyond the clip";
-    DemuxBinder_StopFiltering(handle);
-}
-
-TEST_F(ClipPlaybackTest, ASeekWhileThePipelineIsStoppedStartsThereAndLiveComesBackAfter) {
-    open();
-    int handle = DemuxBinder_StartFiltering(kVideo, kDemuxFilterVideo);
-    ASSERT_FALSE(readFor(handle, 200ms).empty());
     DemuxBinder_StopFiltering(handle);  // the controller stops around a seek
-    EXPECT_EQ(RecPlayerBinder_RepositioningTSPlayer(0, 20000), 1);
+
+    EXPECT_EQ(RecPlayerBinder_RepositioningTSPlayer(30, 20000), 1);
     open();  // the clip player starts again
     handle = DemuxBinder_StartFiltering(kVideo, kDemuxFilterVideo);
     EXPECT_NEAR(firstPcrMs(handle, firstPcr), 20000, 500);
+    EXPECT_TRUE(events.all().empty());
+    EXPECT_EQ(RecPlayerBinder_RepositioningTSPlayer(20, 39000), 1);
+    EXPECT_TRUE(events.waitFor(kClipEventEnd));
+    EXPECT_EQ(RecPlayerBinder_RepositioningTSPlayer(39, 60000), 0) << "beyond the clip";
     DemuxBinder_StopFiltering(handle);
 
     // Closed without a seek: the next opening is the live source again.
@@ -435,17 +344,14 @@ TEST_F(ClipPlaybackTest, ASeekWhileThePipelineIsStoppedStartsThereAndLiveComesBa
     DemuxBinder_StopFiltering(handle);
 }
 
-// Bad input: each row a clear log line and the designed result, nothing lost.
+// Bad input: each row the designed result and event, nothing lost.
 class BadInputTest : public RecordingServiceTest {};
 
-TEST_F(BadInputTest, GivesTheDesignedFailureWithAClearLogLine) {
+TEST_F(BadInputTest, GivesTheDesignedFailure) {
     const std::vector<uint8_t> small =
         buildStream({.pids = {kVideo}, .rounds = 200, .pcrPid = kVideo});
     auto write = [](const std::string& file, const std::vector<uint8_t>& bytes) {
-        FILE* f = fopen(file.c_str(), "wb");
-        ASSERT_NE(f, nullptr);
-        fwrite(bytes.data(), 1, bytes.size(), f);
-        fclose(f);
+        std::ofstream(file).write(reinterpret_cast<const char*>(bytes.data()), bytes.size());
     };
     auto create = [](EventLog& events) {
         return RecPlayerBinder_CreateTSRecorder(0, 0, kVideo, kAudio, 1, EventLog::callback,
@@ -463,7 +369,6 @@ TEST_F(BadInputTest, GivesTheDesignedFailureWithAClearLogLine) {
         std::function<int(const std::string& dir, EventLog&)> act;
         int result;
         int event;  // -1: none
-        const char* log;
     };
     const Row rows[] = {
         {"folder that cannot be created",
@@ -472,18 +377,7 @@ TEST_F(BadInputTest, GivesTheDesignedFailureWithAClearLogLine) {
              ScopedEnv env("TAVOPLAYER_PROP_tavoplayer_recordings_dir", d + "/file/recordings");
              return create(e);
          },
-         0, kRecEventFileError, "cannot create the recordings folder"},
-        {"read-only folder",
-         [&](const std::string& d, EventLog& e) {
-             // Permission bits do not stop root; sysfs refuses new files to anyone.
-             const std::string ro = geteuid() == 0 ? "/sys/kernel" : d + "/ro";
-             if (geteuid() != 0) {
-                 mkdir(ro.c_str(), 0555);
-             }
-             ScopedEnv env("TAVOPLAYER_PROP_tavoplayer_recordings_dir", ro);
-             return create(e);
-         },
-         0, kRecEventFileError, "recordings"},
+         0, kRecEventFileError},
         {"damaged catalog: set aside, rebuilt from the files",
          [&](const std::string& d, EventLog&) {
              write(d + "/4.ts", small);
@@ -495,7 +389,7 @@ TEST_F(BadInputTest, GivesTheDesignedFailureWithAClearLogLine) {
                              f.path().filename().string().find(".damaged-") != std::string::npos;
              return ok == 1 && asideKept && fs::file_size(d + "/4.ts") == small.size() ? 1 : 0;
          },
-         1, -1, "is damaged"},
+         1, -1},
         {"catalog locked by another process",
          [&](const std::string& d, EventLog& e) {
              {
@@ -514,23 +408,22 @@ TEST_F(BadInputTest, GivesTheDesignedFailureWithAClearLogLine) {
                  noFile = noFile && f.path().extension() != ".ts";
              return created == 1 && noFile ? started : -1;
          },
-         0, -1, "locked"},
+         0, -1},
         {"clip path matching nothing",
-         [&](const std::string& d, EventLog&) { return getClip(d + "/7.t"); }, 0, -1,
-         "no recording in"},
+         [&](const std::string& d, EventLog&) { return getClip(d + "/7.t"); }, 0, -1},
         {"clip path matching several",
          [&](const std::string& d, EventLog&) {
              write(d + "/1.ts", small);
              write(d + "/10.ts", small);
              return getClip(d + "/1");
          },
-         0, -1, "matches 2 recordings"},
+         0, -1},
         {"clip that is not a TS",
          [&](const std::string& d, EventLog&) {
              write(d + "/5.ts", std::vector<uint8_t>(4000, 'a'));
              return getClip(d + "/5.t");
          },
-         0, -1, "is not a transport stream"},
+         0, -1},
         {"truncated clip plays to where it ends",
          [&](const std::string& d, EventLog& e) {
              std::vector<uint8_t> cut(small.begin(), small.begin() + 100 * 188 + 77);
@@ -547,14 +440,13 @@ TEST_F(BadInputTest, GivesTheDesignedFailureWithAClearLogLine) {
              // 100 whole packets, 40 ms of PCR each.
              return got == 100 && duration == 99 * 40 ? 1 : 0;
          },
-         1, kClipEventEnd, "end of the clip"},
+         1, kClipEventEnd},
     };
     for (const Row& row : rows) {
         SCOPED_TRACE(row.name);
         const std::string sub = dir + "/" + std::to_string(&row - rows);
         fs::create_directories(sub);
         ScopedEnv env("TAVOPLAYER_PROP_tavoplayer_recordings_dir", sub);
-        TraceCapture trace;
         EventLog events;
         EXPECT_EQ(row.act(sub, events), row.result);
         RecPlayerBinder_DeleteTSRecorder();
@@ -564,7 +456,6 @@ TEST_F(BadInputTest, GivesTheDesignedFailureWithAClearLogLine) {
         } else {
             EXPECT_TRUE(events.all().empty());
         }
-        EXPECT_TRUE(trace.contains(row.log)) << trace.all();
     }
 }
 

@@ -1,18 +1,18 @@
-// The window sink on a virtual X display: the window appears at the picture's
-// size, in the picture's colours, and interlaced pictures go through the
-// deinterlacer (which runs one picture behind). Skipped without Xvfb.
+// The window sink on a virtual X display. Skipped without Xvfb.
 #include <signal.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <chrono>
+#include <memory>
 #include <thread>
 
 #include <gtest/gtest.h>
 
 #include "SurfaceTestUtil.h"
 #include "platform/gui/SinkSurface.h"
+#include "support/TsTestUtil.h"
 
 namespace android::test {
 namespace {
@@ -24,42 +24,33 @@ constexpr int kScreenHeight = 480;
 class VirtualDisplay {
 public:
     VirtualDisplay() {
-        for (int n = 50 + getpid() % 400; n < 1000 && mPid <= 0; n += 7) {
-            if (access(("/tmp/.X" + std::to_string(n) + "-lock").c_str(), F_OK) == 0)
-                continue;
-            mName = ":" + std::to_string(n);
-            const std::string socket = "/tmp/.X11-unix/X" + std::to_string(n);
-            mPid = fork();
-            if (mPid == 0) {
-                const std::string screen =
-                    std::to_string(kScreenWidth) + "x" + std::to_string(kScreenHeight) + "x24";
-                execlp("Xvfb", "Xvfb", mName.c_str(), "-screen", "0", screen.c_str(), "-nolisten",
-                       "tcp", static_cast<char*>(nullptr));
-                _exit(127);
-            }
-            for (int i = 0; i < 200 && access(socket.c_str(), F_OK) != 0; ++i)
-                std::this_thread::sleep_for(std::chrono::milliseconds(50));
-            if (access(socket.c_str(), F_OK) != 0)
-                stop();
+        int n = 50 + getpid() % 400;
+        while (access(("/tmp/.X" + std::to_string(n) + "-lock").c_str(), F_OK) == 0)
+            n += 7;
+        mName = ":" + std::to_string(n);
+        const std::string screen =
+            std::to_string(kScreenWidth) + "x" + std::to_string(kScreenHeight) + "x24";
+        mPid = fork();
+        if (mPid == 0) {
+            execlp("Xvfb", "Xvfb", mName.c_str(), "-screen", "0", screen.c_str(), "-nolisten",
+                   "tcp", static_cast<char*>(nullptr));
+            _exit(127);
         }
-        if (mPid > 0)
-            setenv("DISPLAY", mName.c_str(), 1);
+        const std::string socket = "/tmp/.X11-unix/X" + std::to_string(n);
+        running = TavoPlayer::test::waitUntil([&] { return access(socket.c_str(), F_OK) == 0; });
+        setenv("DISPLAY", mName.c_str(), 1);
     }
     ~VirtualDisplay() {
         unsetenv("DISPLAY");
-        stop();
-    }
-    bool running() const { return mPid > 0; }
-    const std::string& name() const { return mName; }
-
-private:
-    void stop() {
         if (mPid > 0) {
             kill(mPid, SIGTERM);
             waitpid(mPid, nullptr, 0);
         }
-        mPid = -1;
     }
+    const std::string& name() const { return mName; }
+    bool running = false;
+
+private:
     pid_t mPid = -1;
     std::string mName;
 };
@@ -81,10 +72,11 @@ protected:
     void SetUp() override {
         if (access("/usr/bin/Xvfb", X_OK) != 0)
             GTEST_SKIP() << "Xvfb is not installed: the window sink is not tested here";
-        ASSERT_TRUE(mDisplay.running()) << "Xvfb did not start";
+        mDisplay = std::make_unique<VirtualDisplay>();
+        ASSERT_TRUE(mDisplay->running) << "Xvfb did not start";
         ScopedSinkProperties properties("sdl");
         sp<Surface> surface = Surface::create();
-        ASSERT_NE(surface, nullptr) << "no SDL window on " << mDisplay.name();
+        ASSERT_NE(surface, nullptr) << "no SDL window on " << mDisplay->name();
         mSurface = static_cast<SinkSurface*>(surface.get());
         EXPECT_STREQ(mSurface->sinkName(), "sdl");
     }
@@ -105,7 +97,7 @@ protected:
         for (int attempt = 0; attempt < 20; ++attempt) {
             screen = runCommand("ffmpeg -v error -f x11grab -video_size " +
                                 std::to_string(kScreenWidth) + "x" + std::to_string(kScreenHeight) +
-                                " -draw_mouse 0 -i " + mDisplay.name() +
+                                " -draw_mouse 0 -i " + mDisplay->name() +
                                 " -frames:v 1 -f rawvideo -pix_fmt rgb24 -");
             if (screen.find_first_not_of('\0') != std::string::npos)
                 break;
@@ -142,21 +134,16 @@ protected:
         EXPECT_NEAR(sum[2] / n, expected.b, 6.0);
     }
 
-    VirtualDisplay mDisplay;
+    std::unique_ptr<VirtualDisplay> mDisplay;
     sp<SinkSurface> mSurface;
 };
 
-TEST_F(SdlSinkTest, AWindowShowsThePictureAtItsSizeInItsColours) {
-    // A picture larger than what is shown: the crop decides the window's size.
-    TestPicture picture(336, 256, 120, 160, 100);
+// A window at the size of the picture's crop, in its colours; interlaced pictures go
+// through the deinterlacer, which runs one picture behind.
+TEST_F(SdlSinkTest, AWindowShowsTheCropInItsColoursDeinterlacedOnePictureBehind) {
+    TestPicture picture(336, 256, 60, 100, 200);
     const android_native_rect_t crop{0, 0, 320, 240};
     ASSERT_EQ(native_window_set_crop(mSurface.get(), &crop), 0);
-    showAndWait(picture.picture());
-    expectWindow(grab(), 320, 240, bt601(120, 160, 100));
-}
-
-TEST_F(SdlSinkTest, InterlacedPicturesAreDeinterlacedOnePictureBehind) {
-    TestPicture picture(320, 240, 60, 100, 200);
     SurfacePicture interlaced = picture.picture();
     interlaced.interlaced = true;
     for (int i = 0; i < 3; ++i) {

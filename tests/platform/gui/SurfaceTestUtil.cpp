@@ -1,7 +1,5 @@
 #include "SurfaceTestUtil.h"
 
-#include <cstdlib>
-
 #include "support/TsTestUtil.h"
 
 namespace android::test {
@@ -28,18 +26,6 @@ TestPicture::TestPicture(int32_t w, int32_t h, uint8_t luma, uint8_t cb, uint8_t
 
 SurfacePicture TestPicture::picture() const {
     return SurfacePicture{y.data(), stride, uv.data(), stride, width, height, ptsUs, false, true};
-}
-
-ScopedSinkProperties::ScopedSinkProperties(const std::string& sink, const std::string& logPath) {
-    setenv("TAVOPLAYER_PROPERTIES", "/dev/null", 1);
-    setenv("TAVOPLAYER_PROP_tavoplayer_video_sink", sink.c_str(), 1);
-    setenv("TAVOPLAYER_PROP_tavoplayer_video_log", logPath.c_str(), 1);
-}
-
-ScopedSinkProperties::~ScopedSinkProperties() {
-    unsetenv("TAVOPLAYER_PROPERTIES");
-    unsetenv("TAVOPLAYER_PROP_tavoplayer_video_sink");
-    unsetenv("TAVOPLAYER_PROP_tavoplayer_video_log");
 }
 
 std::string readFile(const std::string& path) {

@@ -6,6 +6,7 @@
 #include <vector>
 
 #include "platform/gui/Surface.h"
+#include "support/ScopedEnv.h"
 
 namespace android::test {
 
@@ -28,11 +29,13 @@ struct TestPicture {
     std::vector<uint8_t> uv;
 };
 
-// Sets the sink properties through the environment for the fixture's lifetime.
-class ScopedSinkProperties {
-public:
-    explicit ScopedSinkProperties(const std::string& sink, const std::string& logPath = "");
-    ~ScopedSinkProperties();
+// The sink properties, set through the environment while it lives.
+struct ScopedSinkProperties {
+    explicit ScopedSinkProperties(const std::string& sink, const std::string& logPath = "")
+        : propertyFile("TAVOPLAYER_PROPERTIES", "/dev/null"),
+          videoSink("TAVOPLAYER_PROP_tavoplayer_video_sink", sink),
+          videoLog("TAVOPLAYER_PROP_tavoplayer_video_log", logPath) {}
+    TavoPlayer::test::ScopedEnv propertyFile, videoSink, videoLog;
 };
 
 std::string readFile(const std::string& path);

@@ -41,17 +41,11 @@ MediaTestFiles::MediaTestFiles() {
             return;
         }
     }
-    std::vector<uint8_t> bytes = fileBytes(mp4());
-    auto write = [](const std::string& path, const uint8_t* data, size_t size) {
-        std::ofstream(path, std::ios::binary).write(reinterpret_cast<const char*>(data), size);
-    };
-    write(truncated(), bytes.data(), bytes.size() * 6 / 10);
-    // With faststart the movie box follows the 32-byte file-type box: overwrite both.
-    for (size_t i = 0; i < 256 && i < bytes.size(); ++i)
-        bytes[i] = static_cast<uint8_t>(0xA5 ^ i);
-    write(brokenHeader(), bytes.data(), bytes.size());
-    const std::string text = "This is not a media file.\n";
-    write(notMedia(), reinterpret_cast<const uint8_t*>(text.data()), text.size());
+    const std::vector<uint8_t> bytes = fileBytes(mp4());
+    std::ofstream(truncated(), std::ios::binary)
+        .write(reinterpret_cast<const char*>(bytes.data()),
+               static_cast<std::streamsize>(bytes.size() * 6 / 10));
+    std::ofstream(notMedia()) << "This is not a media file.\n";
 }
 
 MediaTestFiles::~MediaTestFiles() {

@@ -23,11 +23,9 @@ public:
 
     std::string mp4() const { return mDir + "/av.mp4"; }               // H.264 320x240 + AAC
     std::string audioOnly() const { return mDir + "/audio.m4a"; }      // AAC
-    std::string brokenHeader() const { return mDir + "/broken.mp4"; }  // moov overwritten
     std::string truncated() const { return mDir + "/truncated.mp4"; }  // first 60 %
     std::string notMedia() const { return mDir + "/text.mp4"; }        // plain text
     std::string missing() const { return mDir + "/missing.mp4"; }
-    std::string dir() const { return mDir; }
 
 private:
     std::string mDir;

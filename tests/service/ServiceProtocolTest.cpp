@@ -178,7 +178,7 @@ TEST_F(ServiceProtocolTest, EveryCodeReadsItsArgumentsInOrderAndReplies) {
         {8, {}, "close()", 0, NONE, 0},
         {9, {S("sf"), S(""), I(3), U(0xffffffffu), B(false)}, "setSurface(null)", 0, INT32, 109},
         {9, {S("sf"), S("x"), I(0), U(0), B(true)}, "setSurface(surface)", 0, INT32, 109},
-        {10, {I(0), I(0)}, "getFrame(0,0)", 0, NONE, 0},
+        {10, {I(320), I(240)}, "getFrame(320,240)", 0, NONE, 0},
         {11, {I(2), I(-5)}, "setSoundEffect(2,-5)", 0, INT32, 111},
         {12, {I(1)}, nullptr, unknown, NONE, 0},
         {13, {S("MTV://rec")}, "startRecorder(MTV://rec)", 0, INT32, 113},

@@ -9,10 +9,15 @@
 #include <chrono>
 #include <cstdio>
 #include <filesystem>
+#include <fstream>
+#include <iterator>
 #include <set>
+#include <sstream>
 #include <string>
 #include <thread>
 #include <vector>
+
+#include "support/RunCommand.h"
 
 namespace {
 
@@ -30,24 +35,15 @@ void PrintTo(const Screen& s, std::ostream* os) {
 
 class TavoplayWindow : public testing::TestWithParam<Screen> {};
 
-// The size and place of the TavoPlayer window, "WxH+X+Y", as the X server has it.
+// The size and place of the TavoPlayer window, "WxH+X+Y", as the X server has it in
+// a line of the window tree: ...: ("tavoplayerd" "tavoplayerd")  1024x576+0+96  +0+96
 std::string windowGeometry(const std::string& display) {
-    FILE* tree = popen(("xwininfo -display " + display + " -root -tree 2>/dev/null").c_str(), "r");
-    if (tree == nullptr)
-        return "";
+    std::string line;
+    TavoPlayer::test::runCommand(
+        "xwininfo -display " + display + " -root -tree 2>/dev/null | grep '\"TavoPlayer\"'", &line);
+    std::istringstream after(line.substr(line.find(')') + 1));
     std::string geometry;
-    char line[512];
-    while (fgets(line, sizeof line, tree) != nullptr) {
-        const std::string text = line;
-        if (text.find("\"TavoPlayer\"") == std::string::npos)
-            continue;
-        // ...: ("tavoplayerd" "tavoplayerd")  1024x576+0+96  +0+96
-        const size_t close = text.rfind(')');
-        char g[64] = {};
-        if (close != std::string::npos && sscanf(text.c_str() + close + 1, "%63s", g) == 1)
-            geometry = g;
-    }
-    pclose(tree);
+    after >> geometry;
     return geometry;
 }
 
@@ -108,11 +104,8 @@ TEST_P(TavoplayWindow, ShowsTheTestPatternFittedAndPrintsCaptions) {
     EXPECT_GT(lit, rgb.size() / 3 / 2) << "the window is mostly black";
     EXPECT_GE(colours.size(), 5u) << "the window does not show the colour bars";
     EXPECT_STREQ(status, "0\n");
-    FILE* text = fopen(out.c_str(), "r");
-    ASSERT_NE(text, nullptr);
-    std::string printed(1 << 16, '\0');
-    printed.resize(fread(printed.data(), 1, printed.size(), text));
-    fclose(text);
+    std::ifstream text(out);
+    const std::string printed(std::istreambuf_iterator<char>(text), {});
     EXPECT_NE(printed.find("caption: Olá"), std::string::npos) << printed;
     fs::remove_all(dir);
 }

@@ -4,12 +4,12 @@
 #include <unistd.h>
 
 #include <functional>
-#include <ostream>
 #include <vector>
 
 #include "platform/binder/BBinder.h"
 #include "platform/binder/Parcel.h"
 #include "service/BpCTavoPlayerClient.h"
+#include "support/NamedRow.h"
 
 namespace TavoPlayer {
 namespace {
@@ -61,10 +61,7 @@ struct CallbackCase {
     uint32_t code;
     std::vector<int32_t> ints;
 };
-
-void PrintTo(const CallbackCase& c, std::ostream* os) {
-    *os << c.name;
-}
+using test::PrintTo;
 
 class ClientCallbackTest : public ::testing::TestWithParam<CallbackCase> {
 protected:

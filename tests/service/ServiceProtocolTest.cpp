@@ -1,34 +1,23 @@
-// The service protocol between two processes over the real socket transport.
-// This test binary re-executes itself as the service process
-// (ServiceProcess.Serve), which serves a recording fake of the service and
-// prints one line per call
-// ("CALL ...") and per log message ("LOG ...") on its standard output.
-#include <fcntl.h>
+// The service protocol: what the service's stub reads from each request and
+// writes back, and its one-way callbacks to a client that stops reading, over
+// the socket transport.
 #include <gtest/gtest.h>
 #include <sys/socket.h>
 #include <sys/un.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <chrono>
 #include <condition_variable>
-#include <cstdarg>
 #include <cstring>
 #include <filesystem>
-#include <fstream>
 #include <mutex>
 #include <string>
-#include <thread>
 #include <vector>
 
 #include "platform/binder/BBinder.h"
 #include "platform/binder/IServiceManager.h"
 #include "platform/binder/Parcel.h"
-#include "platform/binder/ProcessState.h"
-#include "platform/os/Trace.h"
 #include "service/BnCTavoPlayer.h"
-
-extern char** environ;
 
 namespace TavoPlayer {
 namespace {
@@ -39,31 +28,17 @@ using android::sp;
 using android::String16;
 using namespace std::chrono_literals;
 
-constexpr const char* kChildEnv = "TAVO_BINDER_TEST_CHILD";
 // setCaptionLanguage with a value from here up makes the fake send that many
 // one-way callbacks at once and report how many the transport took.
 constexpr int32_t kFloodTrigger = 1000;
 
-// ---- the service process
-// --------------------------------------------------------
-
-void emit(const char* format, ...) __attribute__((format(printf, 1, 2)));
-void emit(const char* format, ...) {
-    static std::mutex lock;
-    std::lock_guard<std::mutex> guard(lock);
-    va_list args;
-    va_start(args, format);
-    vprintf(format, args);
-    va_end(args);
-    fflush(stdout);
-}
-
+// Records each call as a line of text; the binder threads of the socket
+// transport call it too.
 class RecordingService : public BnCTavoPlayer {
 public:
     uint32_t registerClient(const sp<ICTavoPlayerClient>& client) override {
         mClient = client;
-        emit("CALL registerClient(%s)\n", client != nullptr ? "client" : "null");
-        return 0;
+        return call("registerClient(%s)", 0, client != nullptr ? "client" : "null");
     }
     uint32_t start() override { return call("start()", 0); }
     uint32_t stop() override { return call("stop()", 0); }
@@ -72,22 +47,17 @@ public:
     uint32_t resume() override { return call("resume()", 0); }
     uint32_t seek(int32_t ms) override { return call("seek(%d)", 0, ms); }
     uint32_t openUri(const char* uri, int32_t type) override {
-        emit("CALL openUri(%s,%d)\n", uri, type);
-        return 0;
+        return call("openUri(%s,%d)", 0, uri, type);
     }
     uint32_t close() override { return call("close()", 0); }
     uint32_t setSurface(const sp<android::Surface>& surface) override {
-        emit("CALL setSurface(%s)\n", surface != nullptr ? "surface" : "null");
-        return 109;
+        return call("setSurface(%s)", 109, surface != nullptr ? "surface" : "null");
     }
     uint32_t getFrame(int32_t w, int32_t h) override { return call("getFrame(%d,%d)", 0, w, h); }
     uint32_t setSoundEffect(int32_t e, int32_t o) override {
         return call("setSoundEffect(%d,%d)", 111, e, o);
     }
-    uint32_t startRecorder(const char* uri) override {
-        emit("CALL startRecorder(%s)\n", uri);
-        return 113;
-    }
+    uint32_t startRecorder(const char* uri) override { return call("startRecorder(%s)", 113, uri); }
     uint32_t stopRecorder(int32_t flag) override { return call("stopRecorder(%d)", 114, flag); }
     uint32_t setAVSync(int32_t v) override { return call("setAVSync(%d)", 117, v); }
     uint32_t setCaptionSync(int32_t v) override { return call("setCaptionSync(%d)", 118, v); }
@@ -108,8 +78,16 @@ public:
     }
     uint32_t setAudioOnlyMode(int32_t on) override { return call("setAudioOnlyMode(%d)", 127, on); }
     int64_t getPCRValue() override {
-        emit("CALL getPCRValue()\n");
+        call("getPCRValue()", 0);
         return 0x123456789ABLL;
+    }
+
+    // The next call not taken yet, or "" when none comes within the deadline.
+    std::string next() {
+        std::unique_lock<std::mutex> lock(mLock);
+        if (!mCalled.wait_for(lock, 30s, [&] { return mTaken < mCalls.size(); }))
+            return "";
+        return mCalls[mTaken++];
     }
 
 private:
@@ -117,7 +95,9 @@ private:
     uint32_t call(const char* format, uint32_t result, Args... args) {
         char text[128];
         snprintf(text, sizeof text, format, args...);
-        emit("CALL %s\n", text);
+        std::lock_guard<std::mutex> lock(mLock);
+        mCalls.push_back(text);
+        mCalled.notify_all();
         return result;
     }
     uint32_t flood(int32_t count) {
@@ -132,123 +112,34 @@ private:
                                               IBinder::FLAG_ONEWAY);
             (err == android::OK ? sent : dropped)++;
         }
-        emit("CALL flood sent=%d dropped=%d\n", sent, dropped);
-        return 0;
+        return call("flood sent=%d dropped=%d", 0, sent, dropped);
     }
     sp<ICTavoPlayerClient> mClient;
+    std::mutex mLock;
+    std::condition_variable mCalled;
+    std::vector<std::string> mCalls;
+    size_t mTaken = 0;
 };
 
-TEST(ServiceProcess, Serve) {
-    if (getenv(kChildEnv) == nullptr)
-        GTEST_SKIP() << "runs only as the service process of the protocol tests";
-    setTraceSink([](const TraceRecord& record) { emit("LOG %s", record.text.c_str()); });
-    sp<RecordingService> service = new RecordingService();
-    if (android::defaultServiceManager()->addService(String16("TavoPlayer"), service) != 0)
-        _exit(3);
-    emit("READY\n");
-    char byte;
-    while (read(0, &byte, 1) > 0) {
-    }
-    _exit(0);  // the parent closed our input: done, without gtest's own output
-}
-
-// ---- the test process
-// -----------------------------------------------------------
-
-// The service process, its output written to a file in `dir`.
-class ServiceChild {
-public:
-    explicit ServiceChild(const std::string& dir) : mOutput(dir + "/service.out") {
-        // The environment is built before the fork: the child only execs.
-        std::vector<std::string> env;
-        for (char** e = environ; *e != nullptr; ++e)
-            env.emplace_back(*e);
-        env.push_back(std::string(kChildEnv) + "=1");
-        env.push_back("TAVOPLAYER_SERVICE_DIR=" + dir);
-        env.push_back("TAVOPLAYER_PROP_tavoplayer_video_sink=null");
-        std::vector<char*> envp;
-        for (std::string& s : env)
-            envp.push_back(s.data());
-        envp.push_back(nullptr);
-        char arg0[] = "service";
-        char arg1[] = "--gtest_filter=ServiceProcess.Serve";
-        char* argv[] = {arg0, arg1, nullptr};
-        int in[2];
-        const int out = open(mOutput.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0600);
-        if (out < 0 || pipe2(in, O_CLOEXEC) != 0)
-            return;
-        mPid = fork();
-        if (mPid == 0) {
-            dup2(in[0], 0);
-            dup2(out, 1);
-            execve("/proc/self/exe", argv, envp.data());
-            _exit(127);
-        }
-        ::close(in[0]);
-        ::close(out);
-        mInput = in[1];
-    }
-    ~ServiceChild() {
-        if (mInput >= 0)
-            ::close(mInput);
-        if (mPid > 0) {
-            int status;
-            for (int i = 0; i < 100 && waitpid(mPid, &status, WNOHANG) == 0; ++i)
-                std::this_thread::sleep_for(50ms);
-            if (kill(mPid, SIGKILL) == 0)
-                waitpid(mPid, &status, 0);
-        }
-    }
-    pid_t pid() const { return mPid; }
-
-    // The next whole line starting with `prefix` (others are skipped), or "" at the
-    // deadline.
-    std::string next(const std::string& prefix) {
-        const auto deadline = std::chrono::steady_clock::now() + 30s;
-        do {
-            std::ifstream in(mOutput);
-            in.seekg(static_cast<std::streamoff>(mRead));
-            std::string line;
-            // A line without its end is still being written: read it next time.
-            while (std::getline(in, line) && !in.eof()) {
-                mRead += line.size() + 1;
-                if (line.rfind(prefix, 0) == 0)
-                    return line.substr(prefix.size());
-            }
-            std::this_thread::sleep_for(10ms);
-        } while (std::chrono::steady_clock::now() < deadline);
-        return "";
-    }
-
-private:
-    const std::string mOutput;
-    size_t mRead = 0;
-    pid_t mPid = -1;
-    int mInput = -1;
-};
-
+// One service for the whole program, served on a socket in a folder of its own.
 class ServiceProtocolTest : public ::testing::Test {
 protected:
-    void SetUp() override {
+    static void SetUpTestSuite() {
         char dir[] = "/tmp/tavo-binder-XXXXXX";
         ASSERT_NE(nullptr, mkdtemp(dir));
-        mDir = dir;
+        sDir = dir;
         setenv("TAVOPLAYER_SERVICE_DIR", dir, 1);
-        child = std::make_unique<ServiceChild>(mDir);
-        ASSERT_EQ("", child->next("READY"));
-        service = android::defaultServiceManager()->checkService(String16("TavoPlayer"));
-        ASSERT_NE(nullptr, service);
+        sService = new RecordingService();
+        ASSERT_EQ(0,
+                  android::defaultServiceManager()->addService(String16("TavoPlayer"), sService));
     }
-    void TearDown() override {
-        service.clear();
-        child.reset();
-        std::filesystem::remove_all(mDir);
-    }
+    static void TearDownTestSuite() { std::filesystem::remove_all(sDir); }
 
-    std::string mDir;
-    std::unique_ptr<ServiceChild> child;
-    sp<IBinder> service;
+    static std::string sDir;
+    static sp<RecordingService> sService;
 };
+std::string ServiceProtocolTest::sDir;
+sp<RecordingService> ServiceProtocolTest::sService;
 
 // One request: arguments after the token, the call the service saw, the reply.
 struct Arg {
@@ -287,7 +178,7 @@ TEST_F(ServiceProtocolTest, EveryCodeReadsItsArgumentsInOrderAndReplies) {
         {8, {}, "close()", 0, NONE, 0},
         {9, {S("sf"), S(""), I(3), U(0xffffffffu), B(false)}, "setSurface(null)", 0, INT32, 109},
         {9, {S("sf"), S("x"), I(0), U(0), B(true)}, "setSurface(surface)", 0, INT32, 109},
-        {10, {I(0), I(0)}, "getFrame(0,0)", 0, NONE, 0},
+        {10, {I(320), I(240)}, "getFrame(320,240)", 0, NONE, 0},
         {11, {I(2), I(-5)}, "setSoundEffect(2,-5)", 0, INT32, 111},
         {12, {I(1)}, nullptr, unknown, NONE, 0},
         {13, {S("MTV://rec")}, "startRecorder(MTV://rec)", 0, INT32, 113},
@@ -327,9 +218,9 @@ TEST_F(ServiceProtocolTest, EveryCodeReadsItsArgumentsInOrderAndReplies) {
             else
                 data.writeStrongBinder(arg.value != 0 ? token : nullptr);
         }
-        EXPECT_EQ(row.status, service->transact(row.code, data, &reply));
+        EXPECT_EQ(row.status, sService->transact(row.code, data, &reply));
         if (row.call != nullptr) {
-            EXPECT_EQ(row.call, child->next("CALL "));
+            EXPECT_EQ(row.call, sService->next());
         }
         const size_t replyBytes = row.reply == NONE ? 0 : row.reply == INT32 ? 4 : 8;
         EXPECT_EQ(replyBytes, reply.dataSize());
@@ -348,7 +239,7 @@ TEST_F(ServiceProtocolTest, ClientThatNeverReadsDoesNotBlockTheService) {
     const int fd = socket(AF_UNIX, SOCK_SEQPACKET | SOCK_CLOEXEC, 0);
     sockaddr_un addr{};
     addr.sun_family = AF_UNIX;
-    snprintf(addr.sun_path, sizeof addr.sun_path, "%s/TavoPlayer", mDir.c_str());
+    snprintf(addr.sun_path, sizeof addr.sun_path, "%s/TavoPlayer", sDir.c_str());
     ASSERT_EQ(0, connect(fd, reinterpret_cast<sockaddr*>(&addr), sizeof addr));
     auto frame = [](uint32_t code, uint64_t tid, const Parcel& body, bool withBinder) {
         // The frame layout of docs/protocol.md, built without the library.
@@ -378,40 +269,19 @@ TEST_F(ServiceProtocolTest, ClientThatNeverReadsDoesNotBlockTheService) {
     reg.write(std::vector<uint8_t>(24, 0).data(), 24);
     const std::vector<uint8_t> f1 = frame(1, 1, reg, true);
     ASSERT_EQ(static_cast<ssize_t>(f1.size()), send(fd, f1.data(), f1.size(), 0));
-    EXPECT_EQ("registerClient(client)", child->next("CALL "));
+    EXPECT_EQ("registerClient(client)", sService->next());
     Parcel flood;
     flood.writeInterfaceToken(String16("TavoPlayer"));
     flood.writeInt32(5000);
     const std::vector<uint8_t> f2 = frame(19, 2, flood, false);
     ASSERT_EQ(static_cast<ssize_t>(f2.size()), send(fd, f2.data(), f2.size(), 0));
-    const std::string result = child->next("CALL flood ");
+    const std::string result = sService->next();
     int sent = -1, dropped = -1;
-    ASSERT_EQ(2, sscanf(result.c_str(), "sent=%d dropped=%d", &sent, &dropped)) << result;
+    ASSERT_EQ(2, sscanf(result.c_str(), "flood sent=%d dropped=%d", &sent, &dropped)) << result;
     EXPECT_EQ(5000, sent + dropped);
     EXPECT_GT(dropped, 0);
     EXPECT_GE(sent, 256);  // at least the queue's worth was taken
     ::close(fd);
-}
-
-TEST_F(ServiceProtocolTest, KilledServiceIsReportedDead) {
-    struct Recipient : IBinder::DeathRecipient {
-        void binderDied(const android::wp<IBinder>&) override {
-            std::lock_guard<std::mutex> lock(mLock);
-            died = true;
-            mCv.notify_all();
-        }
-        std::mutex mLock;
-        std::condition_variable mCv;
-        bool died = false;
-    };
-    sp<Recipient> recipient = new Recipient();
-    ASSERT_EQ(android::OK, service->linkToDeath(recipient));
-    ASSERT_EQ(0, kill(child->pid(), SIGKILL));
-    std::unique_lock<std::mutex> lock(recipient->mLock);
-    EXPECT_TRUE(recipient->mCv.wait_for(lock, 30s, [&] { return recipient->died; }));
-    Parcel data, reply;
-    data.writeInterfaceToken(String16("TavoPlayer"));
-    EXPECT_EQ(android::DEAD_OBJECT, service->transact(ICTavoPlayer::START, data, &reply));
 }
 
 }  // namespace

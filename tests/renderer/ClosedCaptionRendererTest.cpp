@@ -9,12 +9,14 @@
 
 #include "support/CaptionBuilder.h"
 #include "support/CaptionTestDoubles.h"
+#include "support/NamedRow.h"
 #include "support/TsTestUtil.h"
 
 namespace TavoPlayer {
 namespace {
 
 using namespace test;
+using test::PrintTo;
 
 constexpr uint64_t kClockPcr = 900'000;
 

@@ -23,8 +23,9 @@
 #include "platform/binder/IServiceManager.h"
 #include "platform/binder/Parcel.h"
 #include "service/ICTavoPlayer.h"
-#include "support/NullPlayerClient.h"
+#include "support/RecordingPlayerClient.h"
 #include "support/RunCommand.h"
+#include "support/ScopedEnv.h"
 
 namespace {
 
@@ -153,7 +154,7 @@ TEST_F(ServiceSession, AClientThatDiesMidPlaybackLeavesTheServiceReadyForTheNext
     EXPECT_NE(next.find("state 1 Closed"), std::string::npos) << next;
 }
 
-using SilentClient = TavoPlayer::test::NullPlayerClient;
+using SilentClient = TavoPlayer::test::RecordingPlayerClient;
 
 TEST_F(ServiceSession, AClientThatDiesDuringOpenLeavesTheServiceClosedAndReady) {
     // The client sends its open and is gone before the service can answer: the
@@ -274,8 +275,8 @@ TEST_F(ServiceOnANonTsSource, ReportsTheSignalLostAndLogsTheLostSync) {
 }
 
 TEST(TavoplayerdDirectory, ADirectoryThatCannotBeMadeIsOneLineAndStatus1) {
-    const fs::path dir = fs::temp_directory_path() / ("tavo-svcdir-" + std::to_string(getpid()));
-    fs::create_directories(dir);
+    const TavoPlayer::test::TempDir made("tavo-svcdir");
+    const fs::path dir = made.path();
     std::ofstream(dir / "file") << "x";
     const struct {
         std::string serviceDir;
@@ -294,7 +295,6 @@ TEST(TavoplayerdDirectory, ADirectoryThatCannotBeMadeIsOneLineAndStatus1) {
         EXPECT_EQ(out, "tavoplayerd: cannot create the service directory " + c.serviceDir + ": " +
                            c.reason + "\n");
     }
-    fs::remove_all(dir);
 }
 
 TEST_F(ServiceSession, CommandsThatFailGiveANonZeroExit) {

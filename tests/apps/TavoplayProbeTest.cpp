@@ -16,6 +16,7 @@ namespace {
 
 namespace fs = std::filesystem;
 using TavoPlayer::test::runCommand;
+using TavoPlayer::test::TempDir;
 
 std::string lastLine(const std::string& text) {
     const size_t end = text.find_last_not_of('\n');
@@ -57,10 +58,9 @@ TEST(TavoplayProbe, FindsEachProgrammesPidsAndTrustsTheAudioPayload) {
 // its reason on the last line and the documented status, within a bound.
 TEST(TavoplayBadSource, EachGivesItsReasonAndStatus) {
     const std::string streams = TAVO_SHARED_STREAMS_DIR;
-    const fs::path dir = fs::temp_directory_path() / ("tavo-badsrc-" + std::to_string(getpid()));
-    fs::create_directories(dir);
-    const std::string channels = (dir / "channels.conf").string();
-    const std::string garbled = (dir / "garbled.conf").string();
+    const TempDir dir("tavo-badsrc");
+    const std::string channels = dir / "channels.conf";
+    const std::string garbled = dir / "garbled.conf";
     // As dvbv5-scan writes an ISDB-T service.
     std::ofstream(channels) << "[TV EXEMPLO HD]\n\tSERVICE_ID = 23584\n\tFREQUENCY = 563142857\n"
                                "\tBANDWIDTH_HZ = 6000000\n\tISDBT_LAYER_ENABLED = 7\n"
@@ -93,12 +93,12 @@ TEST(TavoplayBadSource, EachGivesItsReasonAndStatus) {
              " & p=$!; sleep 5; kill -KILL $(cat /proc/$p/task/*/children); wait $p'",
          1, "tavoplay: the service died (killed by signal 9"},
         // A running service played through --service is killed.
-        {"timeout 60 sh -c 'TAVOPLAYER_SERVICE_DIR=" + dir.string() +
+        {"timeout 60 sh -c 'TAVOPLAYER_SERVICE_DIR=" + dir.path() +
              "/svc TAVOPLAYER_PROP_tavoplayer_demux_source=file:" + live +
              " TAVOPLAYER_PROP_tavoplayer_video_sink=null " TAVO_BINARY_DIR
              "/apps/tavoplayerd/tavoplayerd 2>/dev/null & d=$!; sleep 1; (sleep 5; kill -KILL $d) "
              "& " +
-             tavoplay + "--service " + dir.string() + "/svc " + live + "'",
+             tavoplay + "--service " + dir.path() + "/svc " + live + "'",
          1, "tavoplay: the service died (its connection closed)"},
     };
     for (const auto& c : cases) {
@@ -116,7 +116,6 @@ TEST(TavoplayBadSource, EachGivesItsReasonAndStatus) {
             fs::remove_all(
                 fs::path(out.substr(log + 11, out.find(')', log) - log - 11)).parent_path());
     }
-    fs::remove_all(dir);
 }
 
 TEST(TavoplayProbe, ARealIsdbTbCaptureIn204BytePackets) {
@@ -135,11 +134,10 @@ TEST(TavoplayProbe, ARealIsdbTbCaptureIn204BytePackets) {
 // With --service, tavoplay plays through a tavoplayerd that is already serving (as the
 // system one does on its tuner) and leaves it serving when the stream ends.
 TEST(TavoplayRunningService, PlaysThroughItAndLeavesItServing) {
-    const fs::path dir = fs::temp_directory_path() / ("tavo-running-" + std::to_string(getpid()));
-    fs::create_directories(dir);
+    const TempDir dir("tavo-running");
     const std::string& ts = TavoPlayer::test::tsgenStream(8, "--caption '1:Olá'");
     ASSERT_FALSE(ts.empty());
-    const std::string svc = (dir / "svc").string();
+    const std::string svc = dir / "svc";
     const std::string script =
         "TAVOPLAYER_SERVICE_DIR=" + svc + " TAVOPLAYER_PROP_tavoplayer_demux_source=file:" + ts +
         " TAVOPLAYER_PROP_tavoplayer_video_sink=null TAVOPLAYER_PROP_tavoplayer_audio_sink=null " +
@@ -151,24 +149,20 @@ TEST(TavoplayRunningService, PlaysThroughItAndLeavesItServing) {
     EXPECT_NE(out.find("caption: Olá"), std::string::npos) << out;
     EXPECT_NE(out.find("end of stream"), std::string::npos) << out;
     EXPECT_NE(out.find("still serving"), std::string::npos) << out;
-    fs::remove_all(dir);
 }
 
 // Keys from a terminal (script(1) gives tavoplay one): space pauses and resumes, c
 // saves the shown picture as a PNG, q quits before the stream's end with status 0.
 TEST(TavoplayKeys, PauseCaptureAndQuit) {
-    const fs::path dir = fs::temp_directory_path() / ("tavo-keys-" + std::to_string(getpid()));
-    fs::create_directories(dir);
+    const TempDir dir("tavo-keys");
     std::string out;
     ASSERT_EQ(
-        runCommand(std::string(TAVO_TSGEN_PATH) + " -o " + (dir / "live.ts").string() + " -d 30",
-                   &out),
-        0)
+        runCommand(std::string(TAVO_TSGEN_PATH) + " -o " + (dir / "live.ts") + " -d 30", &out), 0)
         << out;
     const std::string keys =
         "(sleep 7; printf \" \"; sleep 1; printf \" \"; sleep 1; printf c; "
         "sleep 2; printf q)";
-    EXPECT_EQ(runCommand("cd " + dir.string() + " && " + keys +
+    EXPECT_EQ(runCommand("cd " + dir.path() + " && " + keys +
                              " | timeout 60 script -qfec '" TAVO_BINARY_DIR
                              "/apps/tavoplay/tavoplay --headless live.ts' /dev/null",
                          &out),
@@ -178,7 +172,6 @@ TEST(TavoplayKeys, PauseCaptureAndQuit) {
     EXPECT_NE(out.find("captured a 1920x1080 frame to capture-1.png"), std::string::npos) << out;
     EXPECT_GT(fs::file_size(dir / "capture-1.png"), 10000u);
     EXPECT_EQ(out.find("end of stream"), std::string::npos) << out;
-    fs::remove_all(dir);
 }
 
 }  // namespace

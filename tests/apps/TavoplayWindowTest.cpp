@@ -18,6 +18,7 @@
 #include <vector>
 
 #include "support/RunCommand.h"
+#include "support/ScopedEnv.h"
 
 namespace {
 
@@ -53,9 +54,8 @@ TEST_P(TavoplayWindow, ShowsTheTestPatternFittedAndPrintsCaptions) {
     if (system("command -v Xvfb >/dev/null && command -v ffmpeg >/dev/null && "
                "command -v xwininfo >/dev/null") != 0)
         GTEST_SKIP() << "Xvfb, ffmpeg or xwininfo is not installed";
-    const fs::path dir = fs::temp_directory_path() / ("tavo-window-" + std::to_string(getpid()));
-    fs::create_directories(dir);
-    const std::string ts = (dir / "s.ts").string();
+    const TavoPlayer::test::TempDir dir("tavo-window");
+    const std::string ts = dir / "s.ts";
     ASSERT_EQ(system((std::string(TAVO_TSGEN_PATH) + " -o " + ts +
                       " -d 8 --caption '2:Olá' >/dev/null 2>&1")
                          .c_str()),
@@ -69,7 +69,7 @@ TEST_P(TavoplayWindow, ShowsTheTestPatternFittedAndPrintsCaptions) {
     }
     std::this_thread::sleep_for(std::chrono::seconds(2));
     const std::string env = "DISPLAY=" + display + " ";
-    const std::string out = (dir / "out.txt").string();
+    const std::string out = dir / "out.txt";
     FILE* player = popen((env + TAVO_BINARY_DIR "/apps/tavoplay/tavoplay " + ts + " >" + out +
                           " 2>&1 </dev/null; echo $?")
                              .c_str(),
@@ -104,10 +104,8 @@ TEST_P(TavoplayWindow, ShowsTheTestPatternFittedAndPrintsCaptions) {
     EXPECT_GT(lit, rgb.size() / 3 / 2) << "the window is mostly black";
     EXPECT_GE(colours.size(), 5u) << "the window does not show the colour bars";
     EXPECT_STREQ(status, "0\n");
-    std::ifstream text(out);
-    const std::string printed(std::istreambuf_iterator<char>(text), {});
+    const std::string printed = TavoPlayer::test::fileText(out);
     EXPECT_NE(printed.find("caption: Olá"), std::string::npos) << printed;
-    fs::remove_all(dir);
 }
 
 INSTANTIATE_TEST_SUITE_P(Screens, TavoplayWindow,

@@ -85,12 +85,12 @@ TEST(ClosedCaptionChainTest, TsgenCaptionsReachTheListenerOnTime) {
     ASSERT_EQ(parser->start(), 0u);
 
     ASSERT_TRUE(writeAll(*ccts, bytesOfPid(ts, kCaptionPid)));
-    EXPECT_TRUE(waitUntil([&] { return listener.deliveries().size() >= kCaptions.size(); }));
+    EXPECT_TRUE(waitUntil([&] { return listener.snapshot().size() >= kCaptions.size(); }));
     parser->stop();
     decoder->stop();
     renderer->stop();
 
-    const auto deliveries = listener.deliveries();
+    const auto deliveries = listener.snapshot();
     ASSERT_EQ(deliveries.size(), kCaptions.size());
     for (size_t i = 0; i < kCaptions.size(); ++i) {
         SCOPED_TRACE(kCaptions[i].argument);

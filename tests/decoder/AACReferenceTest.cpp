@@ -288,9 +288,11 @@ TEST_P(AACTsgenTest, UnitsAndTimesMatchFfmpeg) {
 #else
     const TsgenCase& c = GetParam();
     const std::string path = (mDir / (c.name + ".ts")).string();
-    ASSERT_TRUE(test::succeeds(std::string(TAVO_TSGEN_PATH) + " -o " + path +
+    ASSERT_EQ(test::runCommand(std::string(TAVO_TSGEN_PATH) + " -o " + path +
                                " -d 2 --size 160x120 --audio " + (c.adts ? "adts " : "latm ") +
-                               c.args + " 2>&1"));
+                               c.args + " 2>&1")
+                  .exitCode,
+              0);
     const Demuxed ref = demux(path, nullptr, c.adts);
     ASSERT_TRUE(ref.ok);
     ASSERT_GT(ref.packets.size(), 50u);

@@ -32,25 +32,8 @@ std::string md5Hex(const uint8_t* data, size_t size) {
     return text;
 }
 
-std::string capture(const std::string& command) {
-    bool ok = false;
-    return runCommand(command, &ok);
-}
-
-class ResolutionListener : public Decoder::DecoderInfoListener {
-public:
-    void onVideoResolution(int width, int height) override {
-        std::lock_guard<std::mutex> lock(mMutex);
-        mSizes.emplace_back(width, height);
-    }
-    std::vector<std::pair<int, int>> sizes() {
-        std::lock_guard<std::mutex> lock(mMutex);
-        return mSizes;
-    }
-
-private:
-    std::mutex mMutex;
-    std::vector<std::pair<int, int>> mSizes;
+struct ResolutionListener : Decoder::DecoderInfoListener, Recorded<std::pair<int, int>> {
+    void onVideoResolution(int width, int height) override { push({width, height}); }
 };
 
 }  // namespace
@@ -203,7 +186,7 @@ DecodedRun runDecoder(const std::vector<uint8_t>& ts, uint16_t pid, Decoder::cod
         output->consume(record->mSize);
     }
     feeder.join();
-    run.resolutions = listener.sizes();
+    run.resolutions = listener.snapshot();
     if (codec != nullptr) {
         run.rejectedUnits = codec->rejectedUnits();
         run.configInputs = codec->configInputs();
@@ -216,8 +199,9 @@ DecodedRun runDecoder(const std::vector<uint8_t>& ts, uint16_t pid, Decoder::cod
 
 std::vector<FramemdLine> ffmpegFramemd5(const std::string& path) {
     const std::string text =
-        capture("ffmpeg -v error -copyts -i '" + path +
-                "' -map 0:v:0 -pix_fmt nv12 -vsync passthrough -enc_time_base -1 -f framemd5 -");
+        runCommand("ffmpeg -v error -copyts -i '" + path +
+                   "' -map 0:v:0 -pix_fmt nv12 -vsync passthrough -enc_time_base -1 -f framemd5 -")
+            .out;
     std::vector<FramemdLine> lines;
     std::istringstream in(text);
     std::string line;
@@ -234,8 +218,9 @@ std::vector<FramemdLine> ffmpegFramemd5(const std::string& path) {
 }
 
 std::vector<uint8_t> ffmpegPcm(const std::string& path, const std::string& format) {
-    const std::string pcm = capture("ffmpeg -v error " + (format.empty() ? "" : "-f " + format) +
-                                    " -i '" + path + "' -map 0:a:0 -f s16le -acodec pcm_s16le -");
+    const std::string pcm = runCommand("ffmpeg -v error " + (format.empty() ? "" : "-f " + format) +
+                                       " -i '" + path + "' -map 0:a:0 -f s16le -acodec pcm_s16le -")
+                                .out;
     return std::vector<uint8_t>(pcm.begin(), pcm.end());
 }
 

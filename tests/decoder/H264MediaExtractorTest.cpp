@@ -279,10 +279,12 @@ TEST_F(H264AccessUnitTest, ResetGivesTheRecordBackAndDecodesTheSpsAgain) {
 Bytes encode(const std::string& x264Params, const std::string& extra, int frames) {
     const std::string path = std::string(TAVO_BINARY_DIR) + "/h264test_" +
                              std::to_string(std::hash<std::string>()(x264Params + extra)) + ".h264";
-    const bool ok = test::succeeds(
-        "ffmpeg -v error -y -f lavfi -i testsrc=size=352x288:rate=30000/1001 -frames:v " +
-        std::to_string(frames) + " -c:v libx264 -preset ultrafast -x264-params " + x264Params +
-        " " + extra + " -f h264 '" + path + "'");
+    const bool ok =
+        test::runCommand(
+            "ffmpeg -v error -y -f lavfi -i testsrc=size=352x288:rate=30000/1001 -frames:v " +
+            std::to_string(frames) + " -c:v libx264 -preset ultrafast -x264-params " + x264Params +
+            " " + extra + " -f h264 '" + path + "'")
+            .exitCode == 0;
     const Bytes es = ok ? test::fileBytes(path) : Bytes();
     std::filesystem::remove(path);
     return es;

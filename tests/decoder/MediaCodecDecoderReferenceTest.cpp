@@ -25,13 +25,8 @@ using test::PrintTo;
 
 class MediaCodecDecoderReferenceTest : public ::testing::TestWithParam<ReferenceCase> {
 protected:
-    void SetUp() override {
-        mDir =
-            std::filesystem::temp_directory_path() / ("tavo_mcd_ref_" + std::to_string(getpid()));
-        std::filesystem::create_directories(mDir);
-    }
-    void TearDown() override { std::filesystem::remove_all(mDir); }
-    std::filesystem::path mDir;
+    void SetUp() override { ASSERT_FALSE(mDir.path().empty()); }
+    test::TempDir mDir{"tavo_mcd_ref"};
 };
 
 TEST_P(MediaCodecDecoderReferenceTest, OutputIsFfmpegsDecode) {
@@ -39,9 +34,9 @@ TEST_P(MediaCodecDecoderReferenceTest, OutputIsFfmpegsDecode) {
     GTEST_SKIP() << "tsgen is not part of this build";
 #else
     const ReferenceCase& c = GetParam();
-    const std::string path = (mDir / (c.name + ".ts")).string();
-    ASSERT_TRUE(
-        test::succeeds(std::string(TAVO_TSGEN_PATH) + " -o " + path + " " + c.args + " 2>&1"));
+    const std::string path = mDir / (c.name + ".ts");
+    ASSERT_EQ(
+        test::runCommand(std::string(TAVO_TSGEN_PATH) + " -o " + path + " " + c.args).exitCode, 0);
     const test::Bytes ts = test::fileBytes(path);
     const bool video = c.type == Decoder::CODING_H264;
     android::sp<test::RecordingSurface> surface = new test::RecordingSurface();
@@ -102,7 +97,7 @@ TEST_P(MediaCodecDecoderReferenceTest, OutputIsFfmpegsDecode) {
         // ISO/IEC 14496-3, 1.A.2 (adts_variable_header: frame_length).
         const size_t first = (es[3] & 3u) << 11 | es[4] << 3 | es[5] >> 5;
         es.erase(es.begin(), es.begin() + static_cast<long>(first));
-        referencePath = (mDir / (c.name + ".es")).string();
+        referencePath = mDir / (c.name + ".es");
         FILE* file = fopen(referencePath.c_str(), "wb");
         ASSERT_NE(nullptr, file);
         fwrite(es.data(), 1, es.size(), file);

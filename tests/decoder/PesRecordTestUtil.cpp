@@ -12,6 +12,7 @@
 #include "common/data/PESData.h"
 #include "support/ParseTs.h"
 #include "support/PesBuilder.h"
+#include "support/TsReader.h"
 #include "tsparser/TSParser.h"
 
 extern "C" {
@@ -210,40 +211,11 @@ std::vector<ExtractedUnit> runThroughTsParser(MediaExtractor& extractor, RingBuf
 
 std::vector<PesChunk> pesFromTs(const Bytes& ts, uint16_t pid) {
     std::vector<PesChunk> chunks;
-    Bytes pes;
     uint64_t lastPts = 0;
-    auto flush = [&]() {
-        // 2.4.3.6: prefix, stream_id, length, flags; PTS when PTS_DTS_flags has bit 1.
-        if (pes.size() >= 9 && pes[0] == 0 && pes[1] == 0 && pes[2] == 1) {
-            const size_t headerEnd = 9u + pes[8];
-            if ((pes[7] & 0x80) != 0 && pes.size() >= 14) {
-                lastPts = (static_cast<uint64_t>(pes[9] & 0x0E) << 29) |
-                          (static_cast<uint64_t>(pes[10]) << 22) |
-                          (static_cast<uint64_t>(pes[11] & 0xFE) << 14) |
-                          (static_cast<uint64_t>(pes[12]) << 7) | (pes[13] >> 1);
-            }
-            const size_t length = (static_cast<size_t>(pes[4]) << 8) | pes[5];
-            const size_t end = length != 0 ? std::min(pes.size(), 6 + length) : pes.size();
-            if (headerEnd <= end)
-                chunks.push_back({Bytes(pes.begin() + static_cast<long>(headerEnd),
-                                        pes.begin() + static_cast<long>(end)),
-                                  lastPts});
-        }
-        pes.clear();
-    };
-    for (size_t at = 0; at + 188 <= ts.size(); at += 188) {
-        const uint8_t* packet = &ts[at];
-        if (packet[0] != 0x47 || (((packet[1] & 0x1F) << 8) | packet[2]) != pid)
-            continue;
-        const uint8_t control = (packet[3] >> 4) & 3;
-        const size_t offset = (control & 2) ? 5u + packet[4] : 4u;
-        if (!(control & 1) || offset >= 188)
-            continue;
-        if ((packet[1] & 0x40) != 0)  // payload_unit_start_indicator
-            flush();
-        pes.insert(pes.end(), packet + offset, packet + 188);
+    for (Pes& pes : TsFile(ts).pesOf(pid)) {
+        lastPts = pes.hasPts ? static_cast<uint64_t>(pes.pts) : lastPts;
+        chunks.push_back({std::move(pes.payload), lastPts});
     }
-    flush();
     return chunks;
 }
 
@@ -289,8 +261,7 @@ std::string compareGolden(const std::string& name, const std::string& dump) {
         std::ofstream(path, std::ios::binary | std::ios::trunc) << dump;
         return {};
     }
-    const Bytes bytes = fileBytes(path);
-    const std::string expected(bytes.begin(), bytes.end());
+    const std::string expected = fileText(path);
     if (expected == dump)
         return {};
     const auto at = std::mismatch(expected.begin(), expected.end(), dump.begin(), dump.end()).first;
@@ -304,17 +275,12 @@ std::string sampleStream(const std::string& name) {
     return std::filesystem::exists(path) ? path : std::string();
 }
 
-bool succeeds(const std::string& command) {
-    bool ok = false;
-    runCommand(command + " >/dev/null", &ok);
-    return ok;
-}
-
 Bytes runTsgen(const std::string& arguments) {
 #ifdef TAVO_TSGEN_PATH
     const std::string path = std::string(TAVO_BINARY_DIR) + "/extractor_tsgen_" +
                              std::to_string(std::hash<std::string>()(arguments)) + ".ts";
-    const bool ok = succeeds(std::string(TAVO_TSGEN_PATH) + " -o '" + path + "' " + arguments);
+    const bool ok =
+        runCommand(std::string(TAVO_TSGEN_PATH) + " -o '" + path + "' " + arguments).exitCode == 0;
     const Bytes ts = ok ? fileBytes(path) : Bytes();
     std::remove(path.c_str());
     return ts;

@@ -125,9 +125,6 @@ std::string compareGolden(const std::string& name, const std::string& dump);
 // Path of a sample stream in the shared folder, empty when it is absent.
 std::string sampleStream(const std::string& name);
 
-// True when the shell command exits with status 0 (its standard output discarded).
-bool succeeds(const std::string& command);
-
 // Runs the project's stream generator with `arguments` and returns the stream it wrote;
 // empty when the generator is not built or fails.
 Bytes runTsgen(const std::string& arguments);

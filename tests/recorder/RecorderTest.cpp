@@ -26,19 +26,13 @@ class RecordingRecorderListener : public IRecorderListener {
 public:
     void onRecorderStarted(int fileNumName) override { started.push_back(fileNumName); }
     void onRecorderStopped(int result) override { stopped.push_back(result); }
-    void onError(int code) override {
-        std::lock_guard<std::mutex> lock(mutex);
-        errors.push_back(code);
-        changed.notify_all();
-    }
+    void onError(int code) override { errors.push(code); }
     std::vector<int> waitForErrors() {
-        std::unique_lock<std::mutex> lock(mutex);
-        changed.wait_for(lock, test::kDeadline, [&] { return !errors.empty(); });
-        return errors;
+        errors.waitFor([](auto& all) { return !all.empty(); });
+        return errors.snapshot();
     }
-    std::vector<int> started, stopped, errors;
-    std::mutex mutex;
-    std::condition_variable changed;
+    std::vector<int> started, stopped;
+    test::Recorded<int> errors;
 };
 
 TEST(RecorderCallbackTest, EventTable) {
@@ -55,7 +49,7 @@ TEST(RecorderCallbackTest, EventTable) {
         recorder->setListener(&listener);
         TraceCapture trace;
         Recorder::recorderCallback(c.event, recorder.get());
-        EXPECT_EQ(listener.errors, c.errors) << c.event;
+        EXPECT_EQ(listener.errors.snapshot(), c.errors) << c.event;
     }
     TraceCapture trace;
     Recorder::recorderCallback(0, nullptr);  // neither may crash

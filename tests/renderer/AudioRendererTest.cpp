@@ -5,9 +5,7 @@
 
 #include <atomic>
 #include <cstring>
-#include <fstream>
 #include <functional>
-#include <iterator>
 #include <mutex>
 #include <string>
 #include <vector>
@@ -17,6 +15,8 @@
 #include "platform/audio/AudioTrack.h"
 #include "support/CaptionTestDoubles.h"
 #include "support/NamedRow.h"
+#include "support/Recorded.h"
+#include "support/RunCommand.h"
 #include "support/TraceCapture.h"
 #include "support/TsTestUtil.h"
 
@@ -32,23 +32,13 @@ constexpr Uint33 kAnchor = 1'000'000;  // the clock's PCR while the test runs
 
 struct Listener : AudioRenderer::AudioRenderedListener, ErrorListener {
     void onAudioRendered() override { ++rendered; }
-    void onAudioReady(long waitMs) override {
-        std::lock_guard<std::mutex> lock(mutex);
-        ready.push_back(waitMs);
-    }
-    void onAudioSessionId(int id) override {
-        std::lock_guard<std::mutex> lock(mutex);
-        sessions.push_back(id);
-    }
-    void onError(unsigned int code, const Module*) const override {
-        std::lock_guard<std::mutex> lock(mutex);
-        errors.push_back(code);
-    }
+    void onAudioReady(long waitMs) override { ready.push(waitMs); }
+    void onAudioSessionId(int id) override { sessions.push(id); }
+    void onError(unsigned int code, const Module*) const override { errors.push(code); }
     std::atomic<int> rendered{0};
-    mutable std::mutex mutex;
-    std::vector<long> ready;
-    std::vector<int> sessions;
-    mutable std::vector<unsigned int> errors;
+    test::Recorded<long> ready;
+    test::Recorded<int> sessions;
+    mutable test::Recorded<unsigned int> errors;
 };
 
 // The renderer against the real clock (on a monotonic time the test holds still),
@@ -56,11 +46,9 @@ struct Listener : AudioRenderer::AudioRenderedListener, ErrorListener {
 class AudioRendererTest : public ::testing::Test {
 protected:
     void SetUp() override {
-        char dir[] = "/tmp/tavo-arendXXXXXX";
-        ASSERT_NE(nullptr, mkdtemp(dir));
-        mDir = dir;
-        setenv("TAVOPLAYER_PROPERTIES", (mDir + "/none.prop").c_str(), 1);
-        setSink("wav:" + mDir + "/out.wav");
+        ASSERT_FALSE(mDir.path().empty());
+        setenv("TAVOPLAYER_PROPERTIES", (mDir / "none.prop").c_str(), 1);
+        setSink("wav:" + mDir / "out.wav");
         ASSERT_EQ(0u, mRing->configure("AudioRaw", 19));
     }
     void TearDown() override {
@@ -68,7 +56,6 @@ protected:
         for (const char* name : {"TAVOPLAYER_PROPERTIES", "TAVOPLAYER_PROP_tavoplayer_audio_sink",
                                  "TAVOPLAYER_PROP_tavoplayer_audio_devices"})
             unsetenv(name);
-        system(("rm -rf " + mDir).c_str());
     }
     static void setSink(const std::string& sink) {
         setenv("TAVOPLAYER_PROP_tavoplayer_audio_sink", sink.c_str(), 1);
@@ -109,9 +96,7 @@ protected:
         return -1;
     }
     std::vector<uint8_t> wavData() const {
-        std::ifstream in(mDir + "/out.wav", std::ios::binary);
-        std::vector<uint8_t> bytes((std::istreambuf_iterator<char>(in)),
-                                   std::istreambuf_iterator<char>());
+        const std::vector<uint8_t> bytes = test::fileBytes(mDir / "out.wav");
         return bytes.size() > 44 ? std::vector<uint8_t>(bytes.begin() + 44, bytes.end())
                                  : std::vector<uint8_t>();
     }
@@ -127,7 +112,7 @@ protected:
     android::sp<RingBuffer> mRing = new RingBuffer();
     Listener mListener;
     TraceCapture mTrace;
-    std::string mDir;
+    test::TempDir mDir{"tavo-arend"};
     android::sp<AudioRenderer> mRenderer;
 };
 
@@ -167,10 +152,10 @@ TEST_P(AudioTimingTest, EarlyGetsSilenceLateLosesItsHead) {
     if (c.skipBytes == -2) {
         EXPECT_EQ(0u, mClock->getPCR());
         EXPECT_FALSE(mRenderer->isSynced());
-        EXPECT_TRUE(mListener.ready.empty());
+        EXPECT_TRUE(mListener.ready.snapshot().empty());
     } else {
-        ASSERT_FALSE(mListener.ready.empty());
-        EXPECT_EQ(c.firstReadyMs, mListener.ready.front());
+        ASSERT_FALSE(mListener.ready.snapshot().empty());
+        EXPECT_EQ(c.firstReadyMs, mListener.ready.snapshot().front());
         EXPECT_EQ(c.skipBytes == -1 ? 0 : 1, mListener.rendered.load());
     }
 }
@@ -213,7 +198,7 @@ TEST_F(AudioRendererTest, SilenceFlowsIn8192ByteWritesOnlyWhileSynced) {
 
 TEST_F(AudioRendererTest, FormatChangeRecreatesTheTrackAndResyncsOnce) {
     ASSERT_EQ(0u, build());
-    EXPECT_EQ(1u, mListener.sessions.size());  // configure: 48 kHz mono, the default
+    EXPECT_EQ(1u, mListener.sessions.snapshot().size());  // configure: 48 kHz mono, the default
     writeRecord(kAnchor, 2, 48000, pcm(3840, 1));
     writeRecord(kAnchor + 1800, 2, 48000, pcm(3840, 2));
     ASSERT_GT(drain(), 0);
@@ -225,8 +210,8 @@ TEST_F(AudioRendererTest, FormatChangeRecreatesTheTrackAndResyncsOnce) {
     ASSERT_GT(drain(), 0);
 
     EXPECT_EQ(resyncs + 1, mRenderer->resyncCount());
-    ASSERT_EQ(3u, mListener.sessions.size());
-    EXPECT_EQ(mListener.sessions.back(), mRenderer->audioTrack()->getSessionId());
+    ASSERT_EQ(3u, mListener.sessions.snapshot().size());
+    EXPECT_EQ(mListener.sessions.snapshot().back(), mRenderer->audioTrack()->getSessionId());
     EXPECT_EQ(32000u, mRenderer->audioTrack()->getSampleRate());
     EXPECT_EQ(1u, mRenderer->audioTrack()->channelCount());
     std::vector<uint8_t> expected = mono1;
@@ -245,7 +230,7 @@ TEST_F(AudioRendererTest, BadRecordsAreReportedOrDiscardedAndTheNextOnePlays) {
     writeRecord(kAnchor, 2, 48000, good);
     ASSERT_GT(drain(), 0);
 
-    EXPECT_EQ(std::vector<unsigned int>{ERROR_RENDERER_WRONG_RECORD}, mListener.errors);
+    EXPECT_EQ(std::vector<unsigned int>{ERROR_RENDERER_WRONG_RECORD}, mListener.errors.snapshot());
     EXPECT_EQ(good, wavData());
 }
 
@@ -257,10 +242,7 @@ TEST_F(AudioRendererTest, AnOutputThatCannotOpenOrFailsLeavesTheRendererRunning)
     EXPECT_TRUE(waitUntil([&] { return mRing->usedSpace() == 0; }));
     EXPECT_EQ(0u, mRenderer->stop());
     mRenderer.clear();
-    {
-        std::lock_guard<std::mutex> lock(mListener.mutex);
-        mListener.errors.clear();
-    }
+    mListener.errors.take();
 
     // /dev/full opens and then refuses every byte, like a device that went away.
     setSink("wav:/dev/full");
@@ -268,15 +250,12 @@ TEST_F(AudioRendererTest, AnOutputThatCannotOpenOrFailsLeavesTheRendererRunning)
     ASSERT_EQ(0u, mRenderer->start());
     writeRecord(kAnchor, 2, 48000, pcm(1920));
     ASSERT_TRUE(waitUntil([&] { return mTrace.count("Could not write") >= 4; }));
-    {
-        std::lock_guard<std::mutex> lock(mListener.mutex);
-        // Reported when the output starts failing, not on every pass.
-        EXPECT_EQ(std::vector<unsigned int>{ERROR_RENDERER_SHORT_WRITE}, mListener.errors);
-    }
+    // Reported when the output starts failing, not on every pass.
+    EXPECT_EQ(std::vector<unsigned int>{ERROR_RENDERER_SHORT_WRITE}, mListener.errors.snapshot());
     writeRecord(kAnchor + 1800, 2, 48000, pcm(1920));
     EXPECT_TRUE(waitUntil([&] { return mRing->usedSpace() == 0; }));
     EXPECT_EQ(0u, mRenderer->stop());
-    EXPECT_EQ(-1, mListener.sessions.back());
+    EXPECT_EQ(-1, mListener.sessions.snapshot().back());
 }
 
 TEST_F(AudioRendererTest, EveryResyncPathFlushesAndDropsSynchronisation) {

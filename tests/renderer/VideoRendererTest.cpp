@@ -26,19 +26,13 @@ struct Shown {
 
 struct FakeVideoListener : VideoFrameData::VideoListener {
     void renderFrame(bool render, VideoFrameData& frame) override {
-        std::lock_guard<std::mutex> hold(lock);
-        calls.push_back({render, frame.mPTS});
+        calls.push({render, frame.mPTS});
     }
     bool captureFrame(VideoFrameData& frame, CaptureFrameListener*) override {
         captures.push_back(frame.mPTS);
         return captureSucceeds;
     }
-    std::vector<Shown> snapshot() {
-        std::lock_guard<std::mutex> hold(lock);
-        return calls;
-    }
-    std::mutex lock;
-    std::vector<Shown> calls;
+    test::Recorded<Shown> calls;
     std::vector<Uint33> captures;
     bool captureSucceeds = true;
 };
@@ -110,9 +104,10 @@ public:
     bool renderDue(Uint33 pts, uint8_t keyFrame = 0) {
         presentAt(pts);
         writeFrame(pts, keyFrame);
-        const size_t before = mVideo.calls.size();
+        const size_t before = mVideo.calls.snapshot().size();
         mRenderer->render();
-        return mVideo.calls.size() == before + 1 && mVideo.calls.back().render;
+        return mVideo.calls.snapshot().size() == before + 1 &&
+               mVideo.calls.snapshot().back().render;
     }
     bool clockRunning() {
         Uint33 pcr = 0;
@@ -166,8 +161,8 @@ TEST(VideoRendererTimingTest, LateAndEarlyFramesAgainstTheClock) {
         const Uint33 pts = mask33(kBasePCR - c.lateMs * 90);
         h.writeFrame(pts);
         h.mRenderer->render();
-        ASSERT_EQ(h.mVideo.calls.size(), 1u);
-        EXPECT_EQ(h.mVideo.calls[0].render, c.shown);
+        ASSERT_EQ(h.mVideo.calls.snapshot().size(), 1u);
+        EXPECT_EQ(h.mVideo.calls.snapshot()[0].render, c.shown);
         EXPECT_EQ(h.mRendered.reports,
                   c.reported ? std::vector<Uint33>{pts} : std::vector<Uint33>{});
         EXPECT_EQ(h.clockRunning(), c.clockSource && !c.clockReset);
@@ -270,8 +265,8 @@ TEST(VideoRendererRecordTest, BadRecordsAreSkippedAndTheNextFrameIsShown) {
         if (!c.reported)
             h.writeFrame(kBasePCR);
         h.mRenderer->render();
-        ASSERT_EQ(h.mVideo.calls.size(), 1u);
-        EXPECT_TRUE(h.mVideo.calls[0].render);
+        ASSERT_EQ(h.mVideo.calls.snapshot().size(), 1u);
+        EXPECT_TRUE(h.mVideo.calls.snapshot()[0].render);
         EXPECT_EQ(h.mRing->usedSpace(), 0u);
     }
 }
@@ -294,7 +289,7 @@ TEST(VideoRendererThreadTest, StopCutsALongWaitShort) {
         EXPECT_LT(std::chrono::steady_clock::now() - before, std::chrono::seconds(2));
         EXPECT_EQ(h.mRenderer->state(), VideoRenderer::STATE_STOPPED);
         // Neither shown nor reported; its buffer goes back to the decoder.
-        const std::vector<Shown> calls = h.mVideo.snapshot();
+        const std::vector<Shown> calls = h.mVideo.calls.snapshot();
         ASSERT_EQ(calls.size(), 1u);
         EXPECT_FALSE(calls[0].render);
         EXPECT_TRUE(h.mRendered.reports.empty());

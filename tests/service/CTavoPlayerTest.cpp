@@ -10,54 +10,12 @@
 #include <utility>
 #include <vector>
 
-#include "service/BnCTavoPlayerClient.h"
+#include "support/RecordingPlayerClient.h"
 #include "support/ScopedEnv.h"
 #include "support/TsTestUtil.h"
 
 namespace TavoPlayer {
 namespace {
-
-class RecordingClient : public BnCTavoPlayerClient {
-public:
-    // The calls so far, forgotten once taken.
-    std::vector<std::string> take() {
-        std::lock_guard<std::mutex> lock(mLock);
-        return std::exchange(mCalls, {});
-    }
-
-    void openUriComplete(int32_t s) override { add("openUriComplete", {s}); }
-    void startComplete(int32_t s) override { add("startComplete", {s}); }
-    void onCaptureFrame(uint8_t*, int32_t, int32_t, int32_t) override { add("onCaptureFrame"); }
-    void onSignalStatusChanged(int32_t p, int32_t c) override {
-        add("onSignalStatusChanged", {p, c});
-    }
-    void closedCaptionText(const uint8_t*, int32_t n) override { add("closedCaptionText", {n}); }
-    void onStopComplete(int32_t s) override { add("onStopComplete", {s}); }
-    void onError(int32_t c) override { add("onError", {c}); }
-    void onBufferingBegin() override { add("onBufferingBegin"); }
-    void onBufferingEnd() override { add("onBufferingEnd"); }
-    void onBuffering(int32_t p) override { add("onBuffering", {p}); }
-    void onAudioSessionId(int32_t id) override { add("onAudioSessionId", {id}); }
-    void onStartVideoTask(int32_t w, int32_t h) override { add("onStartVideoTask", {w, h}); }
-    void onTimeUpdate(int32_t t) override { add("onTimeUpdate", {t}); }
-    void onEndOfContent() override { add("onEndOfContent"); }
-    void onRecorderStarted(int32_t s) override { add("onRecorderStarted", {s}); }
-    void onRecorderStopped(int32_t s) override { add("onRecorderStopped", {s}); }
-    void onPaused(int32_t s) override { add("onPaused", {s}); }
-    void onResumed(int32_t s) override { add("onResumed", {s}); }
-    void onSeeked(int32_t ms) override { add("onSeeked", {ms}); }
-
-private:
-    void add(const char* name, std::initializer_list<int32_t> args = {}) {
-        std::string call = std::string(name) + "(";
-        for (int32_t v : args)
-            call += (call.back() == '(' ? "" : ",") + std::to_string(v);
-        std::lock_guard<std::mutex> lock(mLock);
-        mCalls.push_back(call + ")");
-    }
-    std::mutex mLock;
-    std::vector<std::string> mCalls;
-};
 
 // A live URI whose pipeline configures without a source (the demux opens at
 // start).
@@ -104,7 +62,7 @@ TEST(CTavoPlayerTest, CommandsInEachStateGiveTheirResultsCallbacksAndState) {
     for (const Case& c : cases) {
         SCOPED_TRACE(c.what);
         android::sp<CTavoPlayer> player = new CTavoPlayer();
-        android::sp<RecordingClient> client = new RecordingClient();
+        android::sp<test::RecordingPlayerClient> client = new test::RecordingPlayerClient();
         player->registerClient(client);
         for (const Step& step : c.before)
             step(*player);
@@ -139,8 +97,8 @@ TEST(CTavoPlayerTest, AVSyncReachesThePicturesLessItsBias) {
 
 TEST(CTavoPlayerTest, ANewClientReplacesTheOldAndTheSameOneTwiceChangesNothing) {
     android::sp<CTavoPlayer> player = new CTavoPlayer();
-    android::sp<RecordingClient> first = new RecordingClient();
-    android::sp<RecordingClient> second = new RecordingClient();
+    android::sp<test::RecordingPlayerClient> first = new test::RecordingPlayerClient();
+    android::sp<test::RecordingPlayerClient> second = new test::RecordingPlayerClient();
     player->registerClient(first);
     player->registerClient(second);
     player->registerClient(second);
@@ -151,7 +109,7 @@ TEST(CTavoPlayerTest, ANewClientReplacesTheOldAndTheSameOneTwiceChangesNothing) 
 
 TEST(CTavoPlayerTest, ServiceControllerEventsBecomeClientCallbacks) {
     android::sp<CTavoPlayer> player = new CTavoPlayer();
-    android::sp<RecordingClient> client = new RecordingClient();
+    android::sp<test::RecordingPlayerClient> client = new test::RecordingPlayerClient();
     player->registerClient(client);
     for (uint32_t event = 0; event <= 6; ++event)
         player->onServiceControllerEvent(static_cast<ServiceController::event_t>(event), 1, 2);
@@ -180,7 +138,7 @@ TEST(CTavoPlayerDeathTest, StopWhileClosedAndFatalCodesEndTheProcess) {
         },
         testing::ExitedWithCode(CTavoPlayer::kSuicideExitStatus & 0xFF), "<200708>");
     android::sp<CTavoPlayer> player = new CTavoPlayer();
-    android::sp<RecordingClient> client = new RecordingClient();
+    android::sp<test::RecordingPlayerClient> client = new test::RecordingPlayerClient();
     player->registerClient(client);
     player->onError(0x41003u, nullptr);
     EXPECT_EQ(client->take(), std::vector<std::string>{"onError(266243)"});

@@ -47,18 +47,16 @@ public:
         add("frame", height);
     }
     std::vector<int> operator[](const std::string& kind) const {
-        std::lock_guard<std::mutex> lock(mMutex);
-        auto found = mValues.find(kind);
-        return found != mValues.end() ? found->second : std::vector<int>{};
+        std::vector<int> values;
+        for (const auto& [k, value] : mValues.snapshot())
+            if (k == kind)
+                values.push_back(value);
+        return values;
     }
 
 private:
-    void add(const std::string& kind, int value) const {
-        std::lock_guard<std::mutex> lock(mMutex);
-        mValues[kind].push_back(value);
-    }
-    mutable std::mutex mMutex;
-    mutable std::map<std::string, std::vector<int>> mValues;
+    void add(const std::string& kind, int value) const { mValues.push({kind, value}); }
+    mutable test::Recorded<std::pair<std::string, int>> mValues;
 };
 
 void attach(MP4Controller& controller, Listeners& listeners) {
@@ -175,20 +173,15 @@ public:
         *msec = positionMs;
         return android::OK;
     }
-    std::vector<std::string> calls() {
-        std::lock_guard<std::mutex> lock(mMutex);
-        return mCalls;
-    }
+    std::vector<std::string> calls() { return mCalls.snapshot(); }
     std::atomic<int> positionMs{0};
 
 private:
     android::status_t record(const std::string& call) {
-        std::lock_guard<std::mutex> lock(mMutex);
-        mCalls.push_back(call);
+        mCalls.push(call);
         return android::OK;
     }
-    std::mutex mMutex;
-    std::vector<std::string> mCalls;
+    test::Recorded<std::string> mCalls;
 };
 
 class MP4ControllerFakeTest : public ::testing::Test {

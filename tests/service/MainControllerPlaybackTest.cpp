@@ -7,6 +7,7 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <atomic>
 #include <chrono>
 #include <cstdlib>
 #include <filesystem>
@@ -38,7 +39,8 @@ struct Event {
 // Everything the controller reports upward, stamped with the time since start.
 class Viewer : public ServiceController::ServiceControllerListener,
                public VideoRenderer::FrameRenderedListener,
-               public ClosedCaptionListener {
+               public ClosedCaptionListener,
+               public test::Recorded<Event> {
 public:
     Clock::time_point started = Clock::now();
 
@@ -49,10 +51,7 @@ public:
             return;
         add(std::string(kNames[e]) + "(" + std::to_string(a) + "," + std::to_string(b) + ")");
     }
-    void onFrameRendered(int, int, Uint33) override {
-        std::lock_guard<std::mutex> lock(mLock);
-        ++frames;
-    }
+    void onFrameRendered(int, int, Uint33) override { ++frames; }
     void onFirstFrameRendered(int, int) override {}
     void onClosedCaptionReceived(unsigned char* text, int length) override {
         std::string utf8;
@@ -67,39 +66,25 @@ public:
         add("CAPTION " + utf8);
     }
 
-    std::vector<Event> events() {
-        std::lock_guard<std::mutex> lock(mLock);
-        return mEvents;
-    }
     // The time of the first event starting with `prefix` at or after `from`, or -1.
     double firstAt(const std::string& prefix, double from = 0) {
-        for (const Event& e : events())
+        for (const Event& e : snapshot())
             if (e.atSec >= from && e.what.rfind(prefix, 0) == 0)
                 return e.atSec;
         return -1;
     }
-    size_t frameCount() {
-        std::lock_guard<std::mutex> lock(mLock);
-        return frames;
-    }
+    std::atomic<size_t> frames{0};
 
 private:
     void add(const std::string& what) {
-        std::lock_guard<std::mutex> lock(mLock);
-        mEvents.push_back({std::chrono::duration<double>(Clock::now() - started).count(), what});
+        push({std::chrono::duration<double>(Clock::now() - started).count(), what});
     }
-    std::mutex mLock;
-    std::vector<Event> mEvents;
-    size_t frames = 0;
 };
 
 class LivePlayback : public testing::Test {
 protected:
     void SetUp() override {
-        mDir = fs::temp_directory_path() /
-               ("tavo-live-" + std::to_string(getpid()) + "-" +
-                testing::UnitTest::GetInstance()->current_test_info()->name());
-        fs::create_directories(mDir);
+        ASSERT_FALSE(mDir.path().empty());
         setenv("TAVOPLAYER_PROP_tavoplayer_video_sink", "null", 1);
         setenv("TAVOPLAYER_PROP_tavoplayer_audio_sink", ("wav:" + wavPath()).c_str(), 1);
     }
@@ -108,18 +93,16 @@ protected:
             mController->stop();
             mController.clear();
         }
-        fs::remove_all(mDir);
     }
-    std::string wavPath() const { return (mDir / "out.wav").string(); }
+    std::string wavPath() const { return mDir / "out.wav"; }
 
     static bool tsgen(const std::string& path, const std::string& options) {
-        return system((std::string(TAVO_TSGEN_PATH) + " -o " + path + " " + options +
-                       " >/dev/null 2>&1")
-                          .c_str()) == 0;
+        return test::runCommand(std::string(TAVO_TSGEN_PATH) + " -o " + path + " " + options)
+                   .exitCode == 0;
     }
     // Makes the stream and starts a controller on it with the PIDs tsgen uses.
     void play(const std::string& tsgenOptions, std::map<std::string, std::string> extra = {}) {
-        const std::string ts = (mDir / "s.ts").string();
+        const std::string ts = mDir / "s.ts";
         ASSERT_TRUE(tsgen(ts, tsgenOptions));
         ASSERT_EQ(startOn("file:" + ts, std::move(extra)), 0u);
     }
@@ -147,12 +130,12 @@ protected:
     }
     std::string eventLog() {
         std::string log;
-        for (const Event& e : mViewer.events())
+        for (const Event& e : mViewer.snapshot())
             log += std::to_string(e.atSec) + " " + e.what + "\n";
         return log;
     }
 
-    fs::path mDir;
+    test::TempDir mDir{"tavo-live"};
     Viewer mViewer;
     android::sp<MainController> mController;
 };
@@ -224,10 +207,10 @@ class LiveFault : public LivePlayback, public testing::WithParamInterface<Fault>
 TEST_P(LiveFault, PicturesAndSoundCarryOnWithoutASignalLoss) {
     play(std::string("-d 11 ") + GetParam().tsgenOptions);
     sleepUntil(6);
-    const size_t before = mViewer.frameCount();
+    const size_t before = mViewer.frames.load();
     sleepUntil(11);
     // 29.97 pictures a second: 150 in 5 s; a stall of a second or more falls short.
-    EXPECT_GT(mViewer.frameCount() - before, 110u) << eventLog();
+    EXPECT_GT(mViewer.frames.load() - before, 110u) << eventLog();
     // The signal check may call the signal late once at 0.3 s, before the first sound
     // has reported; from 3 s on (the fault is shown at about 4.7 s) nothing may.
     EXPECT_LT(mViewer.firstAt("SIGNAL", 3.0), 0) << eventLog();
@@ -260,14 +243,13 @@ TEST_F(LivePlayback, TheSoundIsFFmpegsDecodeOfTheStream) {
     play("-d 8 --no-caption-stream");
     sleepUntil(10.5);
     ASSERT_EQ(mController->stop(), 0u);
-    const std::string reference = (mDir / "ref.pcm").string();
-    ASSERT_EQ(system(("ffmpeg -v error -i " + (mDir / "s.ts").string() +
+    const std::string reference = mDir / "ref.pcm";
+    ASSERT_EQ(system(("ffmpeg -v error -i " + (mDir / "s.ts") +
                       " -map 0:a:0 -f s16le -acodec pcm_s16le " + reference)
                          .c_str()),
               0);
     auto samples = [](const std::string& path, size_t skip) {
-        std::ifstream in(path, std::ios::binary);
-        const std::string bytes(std::istreambuf_iterator<char>(in), {});
+        const std::string bytes = test::fileText(path);
         std::vector<int16_t> out((bytes.size() - std::min(skip, bytes.size())) / 2);
         memcpy(out.data(), bytes.data() + skip, out.size() * 2);
         return out;
@@ -328,7 +310,7 @@ TEST_F(LivePlayback, RecordedClipPausesSeeksAndEndsOnce) {
     ASSERT_EQ(mController->seek(1000), 0u);
     sleepUntil(16);
     size_t ends = 0;
-    for (const Event& e : mViewer.events())
+    for (const Event& e : mViewer.snapshot())
         ends += e.what == "EOC(0,0)";
     EXPECT_EQ(ends, 1u) << eventLog();
 }
@@ -395,7 +377,7 @@ TEST_P(LiveBadInput, StartGivesTheDesignedResultAndTheControllerGoesAway) {
     const size_t fds = std::distance(fs::directory_iterator("/proc/self/fd"), {});
     std::string source = GetParam().source;
     if (source.empty() || source == "nulls") {
-        const std::string ts = (mDir / "s.ts").string();
+        const std::string ts = mDir / "s.ts";
         if (source.empty()) {
             ASSERT_TRUE(tsgen(ts, "-d 3 --size 320x240 --mux-rate 1500000"));
         } else {
@@ -446,8 +428,7 @@ class LiveCapture : public LivePlayback, public testing::WithParamInterface<Capt
 protected:
     // Packets of `pid` in the capture.
     size_t packetsOf(const std::string& path, int pid) {
-        std::ifstream in(path, std::ios::binary);
-        const std::string bytes(std::istreambuf_iterator<char>(in), {});
+        const std::string bytes = test::fileText(path);
         size_t n = 0;
         for (size_t at = 0; at + 188 <= bytes.size(); at += GetParam().packetSize)
             n += ((bytes[at + 1] & 0x1F) << 8 | static_cast<uint8_t>(bytes[at + 2])) == pid;

@@ -7,10 +7,8 @@
 #include <unistd.h>
 
 #include <chrono>
-#include <condition_variable>
 #include <cstring>
 #include <filesystem>
-#include <mutex>
 #include <string>
 #include <vector>
 
@@ -18,6 +16,7 @@
 #include "platform/binder/IServiceManager.h"
 #include "platform/binder/Parcel.h"
 #include "service/BnCTavoPlayer.h"
+#include "support/Recorded.h"
 
 namespace TavoPlayer {
 namespace {
@@ -82,12 +81,12 @@ public:
         return 0x123456789ABLL;
     }
 
-    // The next call not taken yet, or "" when none comes within the deadline.
+    // The next call not taken yet, or "" when none comes within the deadline. Only the
+    // test's thread takes.
     std::string next() {
-        std::unique_lock<std::mutex> lock(mLock);
-        if (!mCalled.wait_for(lock, 30s, [&] { return mTaken < mCalls.size(); }))
+        if (!mCalls.waitFor([&](auto& all) { return mTaken < all.size(); }, 30s))
             return "";
-        return mCalls[mTaken++];
+        return mCalls.snapshot()[mTaken++];
     }
 
 private:
@@ -95,9 +94,7 @@ private:
     uint32_t call(const char* format, uint32_t result, Args... args) {
         char text[128];
         snprintf(text, sizeof text, format, args...);
-        std::lock_guard<std::mutex> lock(mLock);
-        mCalls.push_back(text);
-        mCalled.notify_all();
+        mCalls.push(text);
         return result;
     }
     uint32_t flood(int32_t count) {
@@ -115,9 +112,7 @@ private:
         return call("flood sent=%d dropped=%d", 0, sent, dropped);
     }
     sp<ICTavoPlayerClient> mClient;
-    std::mutex mLock;
-    std::condition_variable mCalled;
-    std::vector<std::string> mCalls;
+    test::Recorded<std::string> mCalls;
     size_t mTaken = 0;
 };
 

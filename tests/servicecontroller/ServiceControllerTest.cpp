@@ -13,39 +13,28 @@
 #include <tuple>
 #include <vector>
 
+#include "support/Recorded.h"
+
 namespace TavoPlayer {
 namespace {
 
 using Event = std::tuple<unsigned int, unsigned int, unsigned int>;  // event, a, b
 using SC = ServiceController;
 
-class RecordingListener : public SC::ServiceControllerListener {
-public:
+struct RecordingListener : SC::ServiceControllerListener, test::Recorded<Event> {
     void onServiceControllerEvent(SC::event_t event, unsigned int a, unsigned int b) override {
-        std::lock_guard<std::mutex> lock(mMutex);
-        mEvents.emplace_back(event, a, b);
-        mChanged.notify_all();
-    }
-    std::vector<Event> take() {
-        std::lock_guard<std::mutex> lock(mMutex);
-        return std::exchange(mEvents, {});
+        push({event, a, b});
     }
     // How many `event`s have come, once at least `atLeast` have (or the generous
     // deadline passed: behaviour, never timing, is asserted).
     size_t count(unsigned int event, size_t atLeast = 0) {
-        std::unique_lock<std::mutex> lock(mMutex);
-        auto n = [&] {
-            return static_cast<size_t>(std::count_if(
-                mEvents.begin(), mEvents.end(), [&](auto& e) { return std::get<0>(e) == event; }));
+        auto n = [&](const std::vector<Event>& all) {
+            return static_cast<size_t>(
+                std::ranges::count(all, event, [](const Event& e) { return std::get<0>(e); }));
         };
-        mChanged.wait_for(lock, std::chrono::seconds(10), [&] { return n() >= atLeast; });
-        return n();
+        waitFor([&](auto& all) { return n(all) >= atLeast; });
+        return n(snapshot());
     }
-
-private:
-    std::mutex mMutex;
-    std::condition_variable mChanged;
-    std::vector<Event> mEvents;
 };
 
 class ServiceControllerTest : public ::testing::Test {

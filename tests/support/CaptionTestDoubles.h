@@ -13,6 +13,7 @@
 
 #include "renderer/ClosedCaptionRenderer.h"
 #include "support/CaptionBuilder.h"
+#include "support/Recorded.h"
 
 namespace TavoPlayer::test {
 
@@ -31,34 +32,27 @@ struct ManualClock {
     android::sp<Synchronization> make() { return new Synchronization(reader()); }
 };
 
-class RecordingListener : public ClosedCaptionListener {
+struct CaptionDelivery {
+    std::u32string text;
+    uint64_t pcr;  // the stream clock when the caption arrived (0 without a clock)
+};
+
+class RecordingListener : public ClosedCaptionListener, public Recorded<CaptionDelivery> {
 public:
-    struct Delivery {
-        std::u32string text;
-        uint64_t pcr;  // the stream clock when the caption arrived (0 without a clock)
-    };
     explicit RecordingListener(android::sp<Synchronization> clock = nullptr)
         : mClock(std::move(clock)) {}
     void onClosedCaptionReceived(unsigned char* text, int length) override {
-        const uint64_t pcr = mClock != nullptr ? mClock->getPCR() : 0;
-        std::lock_guard<std::mutex> lock(mMutex);
-        mDeliveries.push_back({toU32(text, length), pcr});
-    }
-    std::vector<Delivery> deliveries() {
-        std::lock_guard<std::mutex> lock(mMutex);
-        return mDeliveries;
+        push({toU32(text, length), mClock != nullptr ? mClock->getPCR() : 0});
     }
     std::vector<std::u32string> texts() {
         std::vector<std::u32string> out;
-        for (const auto& d : deliveries())
+        for (const auto& d : snapshot())
             out.push_back(d.text);
         return out;
     }
 
 private:
     android::sp<Synchronization> mClock;
-    std::mutex mMutex;
-    std::vector<Delivery> mDeliveries;
 };
 
 class WaitRecordingRenderer : public ClosedCaptionRenderer {

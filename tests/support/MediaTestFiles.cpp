@@ -13,14 +13,10 @@ namespace TavoPlayer::test {
 MediaTestFiles::MediaTestFiles() {
     setenv("TAVOPLAYER_PROP_tavoplayer_video_sink", "null", 1);
     setenv("TAVOPLAYER_PROP_tavoplayer_audio_sink", "null", 1);
-    std::string templ = std::filesystem::temp_directory_path() / "tavo-media-XXXXXX";
-    std::vector<char> name(templ.begin(), templ.end());
-    name.push_back('\0');
-    if (mkdtemp(name.data()) == nullptr) {
+    if (mDir.path().empty()) {
         mError = "mkdtemp failed";
         return;
     }
-    mDir = name.data();
 
     const std::string d = std::to_string(kSeconds);
     const std::string ff = "ffmpeg -nostdin -hide_banner -loglevel error -y ";
@@ -34,9 +30,8 @@ MediaTestFiles::MediaTestFiles() {
         ff + tone + " -t " + d + aac + " '" + audioOnly() + "' 2>&1",
     };
     for (const std::string& command : commands) {
-        bool ok = false;
-        const std::string out = runCommand(command, &ok);
-        if (!ok) {
+        std::string out;
+        if (runCommand(command, &out) != 0) {
             mError = "ffmpeg failed: " + command + "\n" + out;
             return;
         }
@@ -46,13 +41,6 @@ MediaTestFiles::MediaTestFiles() {
         .write(reinterpret_cast<const char*>(bytes.data()),
                static_cast<std::streamsize>(bytes.size() * 6 / 10));
     std::ofstream(notMedia()) << "This is not a media file.\n";
-}
-
-MediaTestFiles::~MediaTestFiles() {
-    if (!mDir.empty()) {
-        std::error_code ignored;
-        std::filesystem::remove_all(mDir, ignored);
-    }
 }
 
 }  // namespace TavoPlayer::test

@@ -5,6 +5,8 @@
 
 #include <string>
 
+#include "support/ScopedEnv.h"
+
 namespace TavoPlayer::test {
 
 class MediaTestFiles {
@@ -13,7 +15,6 @@ public:
     static constexpr int kSeconds = 2;
 
     MediaTestFiles();
-    ~MediaTestFiles();
     MediaTestFiles(const MediaTestFiles&) = delete;
     MediaTestFiles& operator=(const MediaTestFiles&) = delete;
 
@@ -21,14 +22,14 @@ public:
     bool ok() const { return mError.empty(); }
     const std::string& error() const { return mError; }
 
-    std::string mp4() const { return mDir + "/av.mp4"; }               // H.264 320x240 + AAC
-    std::string audioOnly() const { return mDir + "/audio.m4a"; }      // AAC
-    std::string truncated() const { return mDir + "/truncated.mp4"; }  // first 60 %
-    std::string notMedia() const { return mDir + "/text.mp4"; }        // plain text
-    std::string missing() const { return mDir + "/missing.mp4"; }
+    std::string mp4() const { return mDir / "av.mp4"; }               // H.264 320x240 + AAC
+    std::string audioOnly() const { return mDir / "audio.m4a"; }      // AAC
+    std::string truncated() const { return mDir / "truncated.mp4"; }  // first 60 %
+    std::string notMedia() const { return mDir / "text.mp4"; }        // plain text
+    std::string missing() const { return mDir / "missing.mp4"; }
 
 private:
-    std::string mDir;
+    TempDir mDir{"tavo-media"};
     std::string mError;
 };
 

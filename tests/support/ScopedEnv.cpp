@@ -25,17 +25,13 @@ ScopedEnv::~ScopedEnv() {
         unsetenv(mName.c_str());
 }
 
-namespace {
-std::string newFolder() {
-    char name[] = "/tmp/tavo_recordings_XXXXXX";
-    return mkdtemp(name) != nullptr ? name : "";
+TempDir::TempDir(const std::string& prefix) {
+    std::string name = std::filesystem::temp_directory_path() / (prefix + "_XXXXXX");
+    if (mkdtemp(name.data()) != nullptr)
+        mPath = name;
 }
-}  // namespace
 
-ScopedRecordingsDir::ScopedRecordingsDir()
-    : mPath(newFolder()), mEnv("TAVOPLAYER_PROP_tavoplayer_recordings_dir", mPath) {}
-
-ScopedRecordingsDir::~ScopedRecordingsDir() {
+TempDir::~TempDir() {
     std::error_code ignored;
     if (!mPath.empty())
         std::filesystem::remove_all(mPath, ignored);
@@ -43,22 +39,14 @@ ScopedRecordingsDir::~ScopedRecordingsDir() {
 
 const std::string& tsgenStream(const std::string& tsgen, int seconds, const std::string& options) {
     static std::map<std::string, std::string> made;
-    static struct Cleanup {
-        ~Cleanup() {
-            for (auto& [key, path] : made)
-                unlink(path.c_str());
-        }
-    } cleanup;
     const std::string key = std::to_string(seconds) + options;
     auto it = made.find(key);
     if (it != made.end())
         return it->second;
-    const std::string path =
-        "/tmp/tavo_stream_" + std::to_string(getpid()) + "_" + std::to_string(made.size()) + ".ts";
-    bool ok = false;
-    runCommand(tsgen + " -o " + path + " -d " + std::to_string(seconds) + " --size 320x240 " +
-                   options + " 2>&1",
-               &ok);
+    const std::string path = tempPath("stream" + std::to_string(made.size()) + ".ts");
+    const bool ok = runCommand(tsgen + " -o " + path + " -d " + std::to_string(seconds) +
+                               " --size 320x240 " + options)
+                        .exitCode == 0;
     return made[key] = ok ? path : std::string();
 }
 

@@ -20,18 +20,31 @@ private:
     bool mHad = false;
 };
 
+// A new folder in the system's temporary folder while it lives, removed with its
+// contents afterwards; its path is empty when it could not be made.
+class TempDir {
+public:
+    explicit TempDir(const std::string& prefix = "tavo");
+    ~TempDir();
+    TempDir(const TempDir&) = delete;
+    TempDir& operator=(const TempDir&) = delete;
+    const std::string& path() const { return mPath; }
+    std::string operator/(const std::string& name) const { return mPath + "/" + name; }
+
+private:
+    std::string mPath;
+};
+
 // Points tavoplayer.recordings.dir at a new temporary folder while it lives, and
 // removes the folder afterwards.
 class ScopedRecordingsDir {
 public:
-    ScopedRecordingsDir();
-    ~ScopedRecordingsDir();
-    ScopedRecordingsDir(const ScopedRecordingsDir&) = delete;
-    ScopedRecordingsDir& operator=(const ScopedRecordingsDir&) = delete;
-    const std::string& path() const { return mPath; }
+    ScopedRecordingsDir() : mDir("tavo_recordings"), mEnv(kVariable, mDir.path()) {}
+    const std::string& path() const { return mDir.path(); }
 
 private:
-    std::string mPath;
+    static constexpr const char* kVariable = "TAVOPLAYER_PROP_tavoplayer_recordings_dir";
+    TempDir mDir;
     ScopedEnv mEnv;
 };
 

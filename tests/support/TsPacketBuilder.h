@@ -60,6 +60,12 @@ private:
     std::optional<Bytes> mPayload;
 };
 
+// A packet of `pid` carrying only a PCR (ISO/IEC 13818-1, 2.4.3.4: base in 90 kHz).
+inline TsPacket pcrPacket(uint16_t pid, uint64_t base, uint16_t extension = 0,
+                          bool discontinuity = false) {
+    return TsPacketBuilder().pid(pid).pcr(base, extension).discontinuity(discontinuity).build();
+}
+
 // Cuts a whole PES packet into transport packets of one PID: unit start on the
 // first, counters from *counter on (left at the next value), stuffing on the last.
 std::vector<TsPacket> packetizePes(uint16_t pid, const std::vector<uint8_t>& pes, uint8_t* counter);

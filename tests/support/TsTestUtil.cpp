@@ -101,24 +101,6 @@ std::vector<PesRecord> drainRecords(RingBuffer& ring) {
     return records;
 }
 
-std::string runCommand(const std::string& command, bool* ok) {
-    std::string out;
-    FILE* pipe = popen(command.c_str(), "r");
-    *ok = pipe != nullptr;
-    if (pipe == nullptr)
-        return out;
-    char buffer[65536];
-    for (size_t n; (n = fread(buffer, 1, sizeof buffer, pipe)) > 0;)
-        out.append(buffer, n);
-    *ok = pclose(pipe) == 0;
-    return out;
-}
-
-std::vector<uint8_t> fileBytes(const std::string& path) {
-    std::ifstream in(path, std::ios::binary);
-    return {std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>()};
-}
-
 std::string printed(const std::function<void(FILE*)>& write) {
     char* text = nullptr;
     size_t length = 0;
@@ -262,30 +244,11 @@ void RingDrain::run() {
         if (!mRing->waitForData(188))
             continue;
         const uint32_t used = mRing->usedSpace() / 188 * 188;
-        {
-            std::lock_guard<std::mutex> lock(mLock);
-            const std::vector<TsPacket> more =
-                toPackets(std::vector<uint8_t>(mRing->readPointer(), mRing->readPointer() + used));
-            mPackets.insert(mPackets.end(), more.begin(), more.end());
-        }
-        mChanged.notify_all();
+        const uint8_t* at = mRing->readPointer();
+        for (const TsPacket& packet : toPackets(std::vector<uint8_t>(at, at + used)))
+            mPackets.push(packet);
         mRing->consume(used);
     }
-}
-
-bool RingDrain::waitForPackets(size_t packets, std::chrono::milliseconds deadline) {
-    std::unique_lock<std::mutex> lock(mLock);
-    return mChanged.wait_for(lock, deadline, [&] { return mPackets.size() >= packets; });
-}
-
-std::vector<TsPacket> RingDrain::packets() const {
-    std::lock_guard<std::mutex> lock(mLock);
-    return mPackets;
-}
-
-size_t RingDrain::count() const {
-    std::lock_guard<std::mutex> lock(mLock);
-    return mPackets.size();
 }
 
 size_t threadsNamed(const std::string& name) {

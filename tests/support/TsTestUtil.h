@@ -20,13 +20,12 @@
 #include <utils/StrongPointer.h>
 
 #include "common/RingBuffer.h"
+#include "support/Recorded.h"
+#include "support/RunCommand.h"
 #include "support/ScopedEnv.h"
 #include "support/TsPacketBuilder.h"
 
 namespace TavoPlayer::test {
-
-// Generous: tests wait for events, they never time them.
-constexpr std::chrono::seconds kDeadline{20};
 
 android::sp<RingBuffer> makeRing(const std::string& name, uint32_t sizeBytes);
 // Polls `condition` every few milliseconds until it holds or `deadline` passes.
@@ -61,11 +60,6 @@ std::optional<PesRecord> readRecord(RingBuffer& ring,
 // Every record readable now, consumed.
 std::vector<PesRecord> drainRecords(RingBuffer& ring);
 
-// Runs a shell command and returns its standard output; `ok` tells whether it
-// exited with status 0.
-std::string runCommand(const std::string& command, bool* ok);
-// The bytes of a file; empty when it cannot be read.
-std::vector<uint8_t> fileBytes(const std::string& path);
 // What `write` prints to a stream (a module's dump).
 std::string printed(const std::function<void(FILE*)>& write);
 
@@ -147,16 +141,18 @@ public:
     ~RingDrain();
     RingDrain(const RingDrain&) = delete;
     RingDrain& operator=(const RingDrain&) = delete;
-    bool waitForPackets(size_t packets, std::chrono::milliseconds deadline = kDeadline);
-    std::vector<TsPacket> packets() const;
-    size_t count() const;
+    bool waitForPackets(size_t packets, std::chrono::milliseconds deadline = kDeadline) {
+        return mPackets.waitFor([&](auto& all) { return all.size() >= packets; }, deadline);
+    }
+    std::vector<TsPacket> packets() const { return mPackets.snapshot(); }
+    size_t count() const {
+        return mPackets.read([](auto& all) { return all.size(); });
+    }
 
 private:
     void run();
     android::sp<RingBuffer> mRing;
-    mutable std::mutex mLock;
-    std::condition_variable mChanged;
-    std::vector<TsPacket> mPackets;
+    Recorded<TsPacket> mPackets;
     std::atomic<bool> mStop{false};
     std::thread mThread;
 };

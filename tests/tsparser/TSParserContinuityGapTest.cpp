@@ -28,9 +28,9 @@ class TSParserContinuityGapTest : public ::testing::TestWithParam<GapCase> {};
 TEST_P(TSParserContinuityGapTest, OnlyThePesWithALostPacketIsMissing) {
     const GapCase& c = GetParam();
     const test::TempFile out({}, ".ts");
-    bool ok = false;
-    test::runCommand(std::string(TAVO_TSGEN_PATH) + " -d 3 --seed 7 -o " + out.path(), &ok);
-    ASSERT_TRUE(ok) << "tsgen failed";
+    const auto run =
+        test::runCommand(std::string(TAVO_TSGEN_PATH) + " -d 3 --seed 7 -o " + out.path());
+    ASSERT_EQ(run.exitCode, 0) << "tsgen failed: " << run.err;
     const std::vector<uint8_t> intact = test::bytesOfPid(test::fileBytes(out.path()), c.pid);
     const size_t count = intact.size() / 188;
     auto unitStart = [&](size_t i) { return (intact[i * 188 + 1] & 0x40) != 0; };

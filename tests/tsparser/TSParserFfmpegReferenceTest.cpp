@@ -60,37 +60,33 @@ uint32_t crc32(const uint8_t* bytes, size_t size) {
 class TSParserFfmpegReferenceTest : public ::testing::TestWithParam<int> {
 protected:
     void SetUp() override {
-        bool ok = false;
-        test::runCommand("command -v ffmpeg && command -v ffprobe", &ok);
-        if (!ok)
+        if (test::runCommand("command -v ffmpeg && command -v ffprobe").exitCode != 0)
             GTEST_SKIP() << "ffmpeg/ffprobe not installed: no independent reference";
         mFile = std::string(TAVO_BINARY_DIR) + "/tsparser_reference_bf" +
                 std::to_string(GetParam()) + ".ts";
         // H.264 with B-frames (PES with and without DTS), AAC and MPEG-1 Layer II.
-        const std::string out = test::runCommand(
+        const auto made = test::runCommand(
             "ffmpeg -y -v error -f lavfi -i testsrc2=size=320x240:rate=30 "
             "-f lavfi -i sine=frequency=1000:sample_rate=48000 "
             "-f lavfi -i sine=frequency=500:sample_rate=48000 -t 3 "
             "-map 0:v -map 1:a -map 2:a -c:v libx264 -preset ultrafast -g 15 -bf " +
-                std::to_string(GetParam()) + " -c:a:0 aac -c:a:1 mp2 -f mpegts " + mFile + " 2>&1",
-            &ok);
-        ASSERT_TRUE(ok) << "ffmpeg could not make the reference stream: " << out;
+            std::to_string(GetParam()) + " -c:a:0 aac -c:a:1 mp2 -f mpegts " + mFile + " 2>&1");
+        ASSERT_EQ(made.exitCode, 0) << "ffmpeg could not make the reference stream: " << made.out;
     }
     std::string mFile;
 };
 
 TEST_P(TSParserFfmpegReferenceTest, VideoPesMatchesFfprobe) {
-    bool ok = false;
-    const std::string pidText = test::runCommand(
-        "ffprobe -v error -select_streams v:0 -show_entries stream=id -of csv=p=0 " + mFile, &ok);
-    ASSERT_TRUE(ok);
-    const uint16_t pid = static_cast<uint16_t>(std::stoul(pidText, nullptr, 16));
-    const auto probe = parseProbe(test::runCommand(
+    const auto pidText = test::runCommand(
+        "ffprobe -v error -select_streams v:0 -show_entries stream=id -of csv=p=0 " + mFile);
+    ASSERT_EQ(pidText.exitCode, 0) << pidText.err;
+    const uint16_t pid = static_cast<uint16_t>(std::stoul(pidText.out, nullptr, 16));
+    const auto probed = test::runCommand(
         "ffprobe -v error -select_streams v:0 -show_entries packet=pts,dts,size,data_hash "
         "-show_data_hash CRC32 -of default=nw=1 " +
-            mFile,
-        &ok));
-    ASSERT_TRUE(ok);
+        mFile);
+    ASSERT_EQ(probed.exitCode, 0) << probed.err;
+    const auto probe = parseProbe(probed.out);
     ASSERT_GT(probe.size(), 60u);
 
     const std::vector<uint8_t> ts = test::fileBytes(mFile);

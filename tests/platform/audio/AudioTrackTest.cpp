@@ -9,6 +9,7 @@
 
 #include "platform/audio/AudioSystem.h"
 #include "platform/audio/AudioTrack.h"
+#include "support/ScopedEnv.h"
 #include "support/TsTestUtil.h"
 
 namespace android {
@@ -19,25 +20,22 @@ namespace {
 class AudioPlatformTest : public ::testing::Test {
 protected:
     void SetUp() override {
-        char dir[] = "/tmp/tavo-audioXXXXXX";
-        ASSERT_NE(nullptr, mkdtemp(dir));
-        mDir = dir;
-        setenv("TAVOPLAYER_PROPERTIES", (mDir + "/none.prop").c_str(), 1);
-        setenv("TAVOPLAYER_PROP_tavoplayer_audio_log", (mDir + "/audio.log").c_str(), 1);
+        ASSERT_FALSE(mDir.path().empty());
+        setenv("TAVOPLAYER_PROPERTIES", (mDir / "none.prop").c_str(), 1);
+        setenv("TAVOPLAYER_PROP_tavoplayer_audio_log", (mDir / "audio.log").c_str(), 1);
     }
     void TearDown() override {
         for (const char* name : {"TAVOPLAYER_PROPERTIES", "TAVOPLAYER_PROP_tavoplayer_audio_log",
                                  "TAVOPLAYER_PROP_tavoplayer_audio_sink",
                                  "TAVOPLAYER_PROP_tavoplayer_audio_devices", "ALSA_CONFIG_PATH"})
             unsetenv(name);
-        system(("rm -rf " + mDir).c_str());
     }
     static void setSink(const std::string& sink) {
         setenv("TAVOPLAYER_PROP_tavoplayer_audio_sink", sink.c_str(), 1);
     }
     // (leave ns, bytes) per logged write.
     std::vector<std::pair<int64_t, size_t>> logLines() const {
-        std::ifstream in(mDir + "/audio.log");
+        std::ifstream in(mDir / "audio.log");
         std::vector<std::pair<int64_t, size_t>> lines;
         int64_t ns;
         size_t bytes;
@@ -55,7 +53,7 @@ protected:
         return new AudioTrack(AUDIO_STREAM_MUSIC, rate, AUDIO_FORMAT_DEFAULT,
                               AUDIO_CHANNEL_OUT_STEREO);
     }
-    std::string mDir;
+    TavoPlayer::test::TempDir mDir{"tavo-audio"};
 };
 
 TEST_F(AudioPlatformTest, CreationParametersDecideTheInitStatus) {
@@ -89,7 +87,7 @@ TEST_F(AudioPlatformTest, CreationParametersDecideTheInitStatus) {
 }
 
 TEST_F(AudioPlatformTest, WavSinkKeepsThePcmWrittenWithItsVolumeAndAHeader) {
-    const std::string path = mDir + "/out.wav";
+    const std::string path = mDir / "out.wav";
     setSink("wav:" + path);
     const std::vector<uint8_t> first = pattern(4800, 1);
     const std::vector<uint8_t> second = pattern(1202, 9);  // not a whole frame: 1200 taken
@@ -121,9 +119,9 @@ TEST_F(AudioPlatformTest, WavSinkKeepsThePcmWrittenWithItsVolumeAndAHeader) {
 }
 
 TEST_F(AudioPlatformTest, PacedSinksReportWhenEachWriteLeavesTheDevice) {
-    for (const std::string& sink : {std::string("null"), "wav:" + mDir + "/paced.wav"}) {
+    for (const std::string& sink : {std::string("null"), "wav:" + mDir / "paced.wav"}) {
         SCOPED_TRACE(sink);
-        unlink((mDir + "/audio.log").c_str());
+        unlink((mDir / "audio.log").c_str());
         setSink(sink);
         sp<AudioTrack> track = stereoTrack();
         ASSERT_EQ(NO_ERROR, track->start());
@@ -153,8 +151,8 @@ TEST_F(AudioPlatformTest, PacedSinksReportWhenEachWriteLeavesTheDevice) {
 // ALSA without a sound card: ALSA's own file plugin, defined in a configuration
 // written here, keeps what reaches the device in a raw file.
 TEST_F(AudioPlatformTest, AlsaSinkDeliversThePcmInOrderThroughTheFilePlugin) {
-    const std::string raw = mDir + "/alsa.raw";
-    const std::string conf = mDir + "/asoundrc";
+    const std::string raw = mDir / "alsa.raw";
+    const std::string conf = mDir / "asoundrc";
     std::ofstream(conf) << "pcm.tavo_test_file {\n  type file\n  slave.pcm \"null\"\n  file \""
                         << raw << "\"\n  format \"raw\"\n}\n";
     const std::string global = "/usr/share/alsa/alsa.conf";

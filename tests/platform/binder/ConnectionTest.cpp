@@ -3,8 +3,6 @@
 #include <unistd.h>
 
 #include <chrono>
-#include <condition_variable>
-#include <mutex>
 #include <vector>
 
 #include "platform/binder/BBinder.h"
@@ -13,6 +11,7 @@
 #include "platform/binder/IPCThreadState.h"
 #include "platform/binder/Parcel.h"
 #include "platform/binder/ProcessState.h"
+#include "support/Recorded.h"
 
 namespace android {
 namespace {
@@ -111,25 +110,14 @@ TEST_F(ConnectionTest, NestedCallBackWhileTheCallerWaits) {
 }
 
 TEST_F(ConnectionTest, HangUpFailsCallsAndTellsDeathRecipients) {
-    struct Recipient : IBinder::DeathRecipient {
-        void binderDied(const wp<IBinder>& who) override {
-            std::lock_guard<std::mutex> lock(mLock);
-            mWho = who;
-            mCv.notify_all();
-        }
-        bool waitDeath() {
-            std::unique_lock<std::mutex> lock(mLock);
-            return mCv.wait_for(lock, std::chrono::seconds(10), [&] { return mWho != nullptr; });
-        }
-        std::mutex mLock;
-        std::condition_variable mCv;
-        wp<IBinder> mWho;
+    struct Recipient : IBinder::DeathRecipient, TavoPlayer::test::Recorded<wp<IBinder>> {
+        void binderDied(const wp<IBinder>& who) override { push(who); }
     };
     sp<Recipient> recipient = new Recipient();
     ASSERT_EQ(OK, proxy->linkToDeath(recipient));
     server->hangUp();
-    ASSERT_TRUE(recipient->waitDeath());
-    EXPECT_EQ(proxy.get(), recipient->mWho.unsafe_get());
+    ASSERT_TRUE(recipient->waitFor([](auto& all) { return !all.empty(); }));
+    EXPECT_EQ(proxy.get(), recipient->snapshot().front().unsafe_get());
     Parcel data, reply;
     EXPECT_EQ(DEAD_OBJECT, proxy->transact(Echo::ECHO, data, &reply));
     EXPECT_FALSE(proxy->isBinderAlive());

@@ -195,23 +195,22 @@ TEST_F(DemuxTest, FileIsReleasedAtThePaceOfItsPcrAcrossALoop) {
 TEST_F(DemuxTest, SourceThatCannotBeOpenedGivesANegativeHandleAndSaysWhy) {
     // A regular file where a DVB demux device should be: it opens, but it does not
     // take the filter ioctl.
-    const std::filesystem::path root =
-        std::filesystem::temp_directory_path() / ("tavo_dvb_" + std::to_string(getpid()));
+    const TempDir root("tavo_dvb");
     std::filesystem::create_directories(root / "adapter3");
-    std::ofstream(root / "adapter3" / "demux1") << "not a device";
+    std::ofstream(root / "adapter3/demux1") << "not a device";
     const struct {
         const char* source;
         std::string message;
     } cases[] = {
         {"file:/nonexistent/tavo.ts", "cannot open TS file /nonexistent/tavo.ts"},
-        {"dvb:99", "cannot open DVB demux " + root.string() + "/adapter99/demux0"},
+        {"dvb:99", "cannot open DVB demux " + root / "adapter99/demux0"},
         {"dvb:0.7?queue=64", "demux7"},
         {"dvb:3.1", "DMX_SET_PES_FILTER for PID 273"},
         {"udp://300.1.1.1:1234", "cannot resolve UDP address 300.1.1.1"},
         {"tcp://host:1", "unknown source"},
         {"", "no demux source"},
     };
-    setenv("TAVOPLAYER_DVB_ROOT", root.c_str(), 1);
+    setenv("TAVOPLAYER_DVB_ROOT", root.path().c_str(), 1);
     for (const auto& c : cases) {
         TraceCapture trace;
         ScopedDemuxSource source(c.source);
@@ -220,7 +219,6 @@ TEST_F(DemuxTest, SourceThatCannotBeOpenedGivesANegativeHandleAndSaysWhy) {
         EXPECT_FALSE(Demux::instance().sourceStats().open) << c.source;
     }
     unsetenv("TAVOPLAYER_DVB_ROOT");
-    std::filesystem::remove_all(root);
     EXPECT_LT(DemuxBinder_StartFiltering(0x2000, kDemuxFilterPes), 0);
     EXPECT_LT(DemuxBinder_StopFiltering(17), 0);
 }

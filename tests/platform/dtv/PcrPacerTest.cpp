@@ -7,15 +7,11 @@
 namespace TavoPlayer {
 namespace {
 
+using test::pcrPacket;
 using test::TsPacket;
 using test::TsPacketBuilder;
 
 constexpr int64_t kMs = 1'000'000;
-
-TsPacket pcrPacket(uint16_t pid, uint64_t base, uint16_t extension = 0,
-                   bool discontinuity = false) {
-    return TsPacketBuilder().pid(pid).pcr(base, extension).discontinuity(discontinuity).build();
-}
 
 TsPacket plainPacket(uint16_t pid, uint8_t tag) {
     return TsPacketBuilder().pid(pid).payload(std::vector<uint8_t>(184, tag)).build();

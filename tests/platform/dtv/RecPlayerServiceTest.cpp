@@ -15,7 +15,6 @@
 
 #include "platform/dtv/Demux.h"
 #include "platform/dtv/DemuxBinder.h"
-#include "platform/dtv/PcrPacer.h"
 #include "platform/dtv/RecPlayerBinder.h"
 #include "platform/dtv/RecPlayerService.h"
 #include "platform/dtv/RecordingCatalog.h"
@@ -24,6 +23,7 @@
 #include <functional>
 #include "DemuxTestUtil.h"
 #include "support/ScopedEnv.h"
+#include "support/TsReader.h"
 #include "support/TsTestUtil.h"
 
 namespace TavoPlayer {
@@ -43,21 +43,14 @@ const std::string& tsgenStream(int seconds) {
 }
 
 // Events from the service, as the recorder and the clip player receive them.
-struct EventLog {
+struct EventLog : Recorded<int> {
     static void callback(int event, void* userData) {
-        auto* self = static_cast<EventLog*>(userData);
-        std::lock_guard<std::mutex> lock(self->lock);
-        self->events.push_back(event);
+        static_cast<EventLog*>(userData)->push(event);
     }
-    bool waitFor(int event, std::chrono::milliseconds deadline = kDeadline) {
-        return waitUntil([&] { return std::ranges::count(all(), event) > 0; }, deadline);
+    bool waitFor(int event, std::chrono::milliseconds deadline = kDeadline) const {
+        return Recorded::waitFor([&](auto& all) { return std::ranges::count(all, event) > 0; },
+                                 deadline);
     }
-    std::vector<int> all() {
-        std::lock_guard<std::mutex> l(lock);
-        return events;
-    }
-    std::mutex lock;
-    std::vector<int> events;
 };
 
 std::vector<TsPacket> packetsOf(const std::vector<uint8_t>& ts, uint16_t pid) {
@@ -66,11 +59,9 @@ std::vector<TsPacket> packetsOf(const std::vector<uint8_t>& ts, uint16_t pid) {
 
 // What ffprobe reads of a file (its codec names unless told), or why it failed.
 std::string probe(const std::string& path, const char* entries = "stream=codec_name") {
-    bool ok = false;
-    const std::string out = runCommand(
-        std::string("ffprobe -v error -show_entries ") + entries + " -of csv=p=0 " + path + " 2>&1",
-        &ok);
-    return ok ? out : "ffprobe failed: " + out;
+    const auto run = runCommand(std::string("ffprobe -v error -show_entries ") + entries +
+                                " -of csv=p=0 " + path + " 2>&1");
+    return run.exitCode == 0 ? run.out : "ffprobe failed: " + run.out;
 }
 
 void freeDetails(RecDetails* d) {
@@ -171,11 +162,9 @@ TEST_F(RecordingServiceTest, RecordsTheLivePacketsOfItsPidsUnchangedInOrderInAPl
     ASSERT_GT(index.size(), 100u);
     for (const IndexPoint& p : index) {
         // Every point leads to the tables or to a PCR of the video PID.
-        const uint8_t* packet = &recorded[p.offset];
-        uint64_t pcr = 0;
-        bool discontinuity = false;
-        ASSERT_TRUE(pidOf(packet) == 0 || PcrPacer::readPcr(packet, &pcr, &discontinuity))
-            << p.offset;
+        ASSERT_LE(p.offset + 188, recorded.size());
+        const TsFile at({recorded.begin() + p.offset, recorded.begin() + p.offset + 188});
+        ASSERT_TRUE(at.valid && (at.packets[0].pid == 0 || at.packets[0].hasPcr)) << p.offset;
     }
 }
 
@@ -269,12 +258,10 @@ std::vector<TsPacket> readFor(int handle, std::chrono::milliseconds window) {
 int64_t firstPcrMs(int handle, uint64_t clipFirstPcr) {
     const auto end = std::chrono::steady_clock::now() + kDeadline;
     while (std::chrono::steady_clock::now() < end) {
-        for (const TsPacket& p : readFor(handle, 50ms)) {
-            uint64_t pcr = 0;
-            bool discontinuity = false;
-            if (PcrPacer::readPcr(p.data(), &pcr, &discontinuity))
-                return static_cast<int64_t>((pcr - clipFirstPcr) / 27000);
-        }
+        const TsFile read(concatPackets(readFor(handle, 50ms)));
+        for (const ParsedPacket& p : read.packets)
+            if (p.hasPcr)
+                return static_cast<int64_t>((p.pcr27 - clipFirstPcr) / 27000);
     }
     return -1;
 }
@@ -293,12 +280,10 @@ TEST_F(RecordingServiceTest, AClipRepositionsWhileFilteringOrStoppedAndReportsIt
         ASSERT_EQ(RecPlayerBinder_DeleteTSRecorder(), 1);
     }
     const std::vector<TsPacket> video = packetsOf(fileBytes(file(number)), kVideo);
-    uint64_t firstPcr = 0;
-    bool discontinuity = false;
-    for (const TsPacket& p : video) {
-        if (PcrPacer::readPcr(p.data(), &firstPcr, &discontinuity))
-            break;
-    }
+    const TsFile recorded(concatPackets(video));
+    const auto withPcr = std::ranges::find_if(recorded.packets, &ParsedPacket::hasPcr);
+    ASSERT_NE(withPcr, recorded.packets.end());
+    const uint64_t firstPcr = withPcr->pcr27;
     EventLog events;
     ASSERT_EQ(RecPlayerBinder_IsTSPlayerActive(EventLog::callback, &events), 1);
     auto open = [&] {
@@ -331,7 +316,7 @@ TEST_F(RecordingServiceTest, AClipRepositionsWhileFilteringOrStoppedAndReportsIt
     open();  // the clip player starts again
     handle = DemuxBinder_StartFiltering(kVideo, kDemuxFilterVideo);
     EXPECT_NEAR(firstPcrMs(handle, firstPcr), 20000, 500);
-    EXPECT_TRUE(events.all().empty());
+    EXPECT_TRUE(events.snapshot().empty());
     EXPECT_EQ(RecPlayerBinder_RepositioningTSPlayer(20, 39000), 1);
     EXPECT_TRUE(events.waitFor(kClipEventEnd));
     EXPECT_EQ(RecPlayerBinder_RepositioningTSPlayer(39, 60000), 0) << "beyond the clip";
@@ -452,9 +437,9 @@ TEST_F(BadInputTest, GivesTheDesignedFailure) {
         RecPlayerBinder_DeleteTSRecorder();
         EXPECT_TRUE(RecPlayerService::instance().events().drain(kDeadline));
         if (row.event >= 0) {
-            EXPECT_EQ(events.all(), std::vector<int>{row.event});
+            EXPECT_EQ(events.snapshot(), std::vector<int>{row.event});
         } else {
-            EXPECT_TRUE(events.all().empty());
+            EXPECT_TRUE(events.snapshot().empty());
         }
     }
 }

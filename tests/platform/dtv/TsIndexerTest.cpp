@@ -8,11 +8,6 @@
 namespace TavoPlayer {
 namespace {
 
-// A packet of `pid` carrying PCR base `base` (90 kHz), ISO/IEC 13818-1, 2.4.3.4.
-test::TsPacket pcrPacket(uint16_t pid, uint64_t base, bool discontinuity = false) {
-    return test::TsPacketBuilder().pid(pid).pcr(base).discontinuity(discontinuity).build();
-}
-
 TEST(TsIndexerTest, TimeLineSumsPcrIntervalsAcrossWrapsAndNewTimeBases) {
     constexpr uint64_t kWrap = uint64_t{1} << 33;
     struct Step {
@@ -38,7 +33,8 @@ TEST(TsIndexerTest, TimeLineSumsPcrIntervalsAcrossWrapsAndNewTimeBases) {
     uint64_t offset = 0;
     for (const Step& s : steps) {
         SCOPED_TRACE(offset / 188);
-        EXPECT_EQ(indexer.push(pcrPacket(s.pid, s.base, s.discontinuity).data(), offset), s.point);
+        EXPECT_EQ(indexer.push(test::pcrPacket(s.pid, s.base, 0, s.discontinuity).data(), offset),
+                  s.point);
         EXPECT_EQ(indexer.elapsedMs(), s.elapsedMs);
         if (s.point) {
             EXPECT_EQ(indexer.points().back().offset, offset);

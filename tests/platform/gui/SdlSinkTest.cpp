@@ -98,7 +98,8 @@ protected:
             screen = runCommand("ffmpeg -v error -f x11grab -video_size " +
                                 std::to_string(kScreenWidth) + "x" + std::to_string(kScreenHeight) +
                                 " -draw_mouse 0 -i " + mDisplay->name() +
-                                " -frames:v 1 -f rawvideo -pix_fmt rgb24 -");
+                                " -frames:v 1 -f rawvideo -pix_fmt rgb24 -")
+                         .out;
             if (screen.find_first_not_of('\0') != std::string::npos)
                 break;
             std::this_thread::sleep_for(std::chrono::milliseconds(100));

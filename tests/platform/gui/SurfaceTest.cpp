@@ -13,10 +13,6 @@
 namespace android::test {
 namespace {
 
-std::string tempPath(const std::string& name) {
-    return testing::TempDir() + "/" + std::to_string(getpid()) + "_" + name;
-}
-
 sp<SinkSurface> createSurface(const std::string& sink, const std::string& logPath = "") {
     ScopedSinkProperties properties(sink, logPath);
     sp<Surface> surface = Surface::create();
@@ -43,7 +39,7 @@ protected:
     // A 1920 x 1088 coded picture shown with the SPS's crop to 1920 x 1080 is the
     // broadcast case; here a smaller one with a crop that is off the origin.
     static constexpr android_native_rect_t kCrop{4, 2, 68, 50};  // 64 x 48 at (4, 2)
-    const std::string mLogPath = tempPath("null.log");
+    const std::string mLogPath = TavoPlayer::test::tempPath("null.log");
 };
 
 TEST_F(NullSinkTest, CountsCropsAndLogsEveryPicture) {
@@ -74,7 +70,7 @@ TEST_F(NullSinkTest, CountsCropsAndLogsEveryPicture) {
     const char* pts[] = {" 90000 64 48\n", " 93002 64 48\n", " 1 64 48\n"};
     for (int i = 0; i < 3; ++i)
         expected += std::to_string(history[i].monotonicNs) + pts[i];
-    EXPECT_EQ(readFile(mLogPath), expected);
+    EXPECT_EQ(fileText(mLogPath), expected);
     EXPECT_LE(history[0].monotonicNs, history[2].monotonicNs);
     unlink(mLogPath.c_str());
 }
@@ -163,7 +159,7 @@ TEST_F(SharedPictureTest, KeepsAReferenceToTheCropAndCapturesItPacked) {
 // The y4m file is a stream FFmpeg reads back: every picture, at the size of the first
 // (a stream that changes size midway is scaled to it), the crop of shared planes.
 TEST_F(SharedPictureTest, Y4mSinkWritesEveryPictureAtTheFirstCropsSize) {
-    const std::string path = tempPath("shared.y4m");
+    const std::string path = TavoPlayer::test::tempPath("shared.y4m");
     std::shared_ptr<const TestPicture> picture = makePicture(3);
     {
         sp<SinkSurface> surface = createSurface("y4m:" + path);
@@ -177,10 +173,11 @@ TEST_F(SharedPictureTest, Y4mSinkWritesEveryPictureAtTheFirstCropsSize) {
     }
     EXPECT_EQ(runCommand("ffprobe -v error -count_frames -select_streams v:0 -show_entries "
                          "stream=width,height,nb_read_frames -of csv=p=0 '" +
-                         path + "'"),
+                         path + "'")
+                  .out,
               "64,48,3\n");
     const std::string frame =
-        runCommand("ffmpeg -v error -i '" + path + "' -frames:v 1 -f rawvideo -pix_fmt nv12 -");
+        runCommand("ffmpeg -v error -i '" + path + "' -frames:v 1 -f rawvideo -pix_fmt nv12 -").out;
     unlink(path.c_str());
     ASSERT_EQ(frame.size(), 64u * 48u * 3 / 2);
     const auto* y = reinterpret_cast<const uint8_t*>(frame.data());

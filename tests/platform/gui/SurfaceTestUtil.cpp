@@ -1,7 +1,5 @@
 #include "SurfaceTestUtil.h"
 
-#include "support/TsTestUtil.h"
-
 namespace android::test {
 
 TestPicture::TestPicture(int32_t w, int32_t h, int seed, int64_t pts)
@@ -26,16 +24,6 @@ TestPicture::TestPicture(int32_t w, int32_t h, uint8_t luma, uint8_t cb, uint8_t
 
 SurfacePicture TestPicture::picture() const {
     return SurfacePicture{y.data(), stride, uv.data(), stride, width, height, ptsUs, false, true};
-}
-
-std::string readFile(const std::string& path) {
-    const auto bytes = TavoPlayer::test::fileBytes(path);
-    return std::string(bytes.begin(), bytes.end());
-}
-
-std::string runCommand(const std::string& command) {
-    bool ok = false;
-    return TavoPlayer::test::runCommand(command, &ok);
 }
 
 }  // namespace android::test

@@ -6,6 +6,7 @@
 #include <vector>
 
 #include "platform/gui/Surface.h"
+#include "support/RunCommand.h"
 #include "support/ScopedEnv.h"
 
 namespace android::test {
@@ -38,8 +39,7 @@ struct ScopedSinkProperties {
     TavoPlayer::test::ScopedEnv propertyFile, videoSink, videoLog;
 };
 
-std::string readFile(const std::string& path);
-// Standard output of a shell command.
-std::string runCommand(const std::string& command);
+using TavoPlayer::test::fileText;
+using TavoPlayer::test::runCommand;
 
 }  // namespace android::test

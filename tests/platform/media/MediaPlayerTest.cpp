@@ -34,21 +34,16 @@ struct Note {
     std::string thread;
 };
 
-class RecordingListener : public android::MediaPlayerListener {
+class RecordingListener : public android::MediaPlayerListener, public test::Recorded<Note> {
 public:
     void notify(int msg, int ext1, int ext2, const android::Parcel*) override {
         char name[16] = {};
         pthread_getname_np(pthread_self(), name, sizeof name);
-        std::lock_guard<std::mutex> lock(mMutex);
-        mNotes.push_back({msg, ext1, ext2, name});
-    }
-    std::vector<Note> notes() {
-        std::lock_guard<std::mutex> lock(mMutex);
-        return mNotes;
+        push({msg, ext1, ext2, name});
     }
     // Index of the first note `msg` (and `ext1` unless -1) so far; -1 if none.
     int find(int msg, int ext1 = -1) {
-        const std::vector<Note> all = notes();
+        const std::vector<Note> all = snapshot();
         for (size_t i = 0; i < all.size(); ++i) {
             if (all[i].msg == msg && (ext1 == -1 || all[i].ext1 == ext1))
                 return static_cast<int>(i);
@@ -63,14 +58,10 @@ public:
     }
     int count(int msg, int ext1 = -1) {
         int n = 0;
-        for (const Note& note : notes())
+        for (const Note& note : snapshot())
             n += note.msg == msg && (ext1 == -1 || note.ext1 == ext1);
         return n;
     }
-
-private:
-    std::mutex mMutex;
-    std::vector<Note> mNotes;
 };
 
 int position(const sp<MediaPlayer>& player) {
@@ -117,8 +108,8 @@ TEST_P(MediaPlayerPlaybackTest, PreparesPlaysToTheEndAndNotifiesInOrder) {
     ASSERT_EQ(mPlayer->prepare(), android::OK);
     const int size = mListener->waitFor(android::MEDIA_SET_VIDEO_SIZE);
     ASSERT_GE(size, 0);
-    EXPECT_EQ(mListener->notes()[size].ext1, c.width);
-    EXPECT_EQ(mListener->notes()[size].ext2, c.height);
+    EXPECT_EQ(mListener->snapshot()[size].ext1, c.width);
+    EXPECT_EQ(mListener->snapshot()[size].ext2, c.height);
     int durationMs = 0;
     ASSERT_EQ(mPlayer->getDuration(&durationMs), android::OK);
     if (c.intact) {
@@ -146,7 +137,7 @@ TEST_P(MediaPlayerPlaybackTest, PreparesPlaysToTheEndAndNotifiesInOrder) {
     if (c.intact) {
         EXPECT_NEAR(position(mPlayer), durationMs, 100);
     }
-    for (const Note& note : mListener->notes())
+    for (const Note& note : mListener->snapshot())
         EXPECT_EQ(note.thread, "MediaPlayerCB") << "message " << note.msg;
     EXPECT_EQ(mPlayer->stop(), android::OK);
 }

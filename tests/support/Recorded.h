@@ -16,11 +16,11 @@ constexpr std::chrono::seconds kDeadline{20};
 template <typename T>
 class Recorded {
 public:
+    // Notified under the lock: a waiter that sees the value may end the test and destroy
+    // this recorder at once, so the callback's thread must be done with it by then.
     void push(T value) {
-        {
-            std::lock_guard<std::mutex> lock(mMutex);
-            mValues.push_back(std::move(value));
-        }
+        std::lock_guard<std::mutex> lock(mMutex);
+        mValues.push_back(std::move(value));
         mChanged.notify_all();
     }
     std::vector<T> snapshot() const {

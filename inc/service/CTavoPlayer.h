@@ -22,7 +22,6 @@
 
 #include "decoder/CaptureFrameListener.h"
 #include "platform/binder/IBinder.h"
-#include "platform/binder/RefSync.h"
 #include "service/BnCTavoPlayer.h"
 #include "service/ControllerInterface.h"
 
@@ -112,10 +111,6 @@ public:
     void onRecorderStopped(int status) override;
     void onServiceControllerEvent(ServiceController::event_t event, unsigned int a,
                                   unsigned int b) override;
-
-    // Both the binder and the death recipient publish their last reference drop to
-    // ThreadSanitizer; one object needs one overrider.
-    void onLastStrongRef(const void* /*id*/) override { android::refsync::observed(); }
 
     // The controller of the open source, for the daemon's shutdown and for dumps.
     android::sp<ControllerInterface> controller();

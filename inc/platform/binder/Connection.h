@@ -72,7 +72,8 @@ public:
     bool isAlive() const;
     // Hangs up; the I/O thread ends and the peer sees the connection die.
     void hangUp();
-    // Waits for the I/O thread to end (not from the I/O thread itself).
+    // Waits for the I/O thread to end (not from the I/O thread itself); at once if it
+    // has ended and let itself go.
     void join();
 
     pid_t peerPid() const { return mPeerPid; }
@@ -91,9 +92,9 @@ private:
     };
 
     Connection(int fd, const sp<IBinder>& root);
-    void onLastStrongRef(const void* id) override;
 
     void ioLoop();
+    void letThreadGo();
     bool readFrames();
     bool handleFrame(const uint8_t* frame, size_t len, std::vector<int>& fds);
     bool flushQueue();
@@ -119,6 +120,7 @@ private:
     const bool mOutgoing;  // we connected: close once nothing is shared any more
     pid_t mPeerPid = -1;
     uid_t mPeerUid = static_cast<uid_t>(-1);
+    std::mutex mThreadLock;  // guards mThread: join() and the ending thread race for it
     std::thread mThread;
     std::thread::id mThreadId;
     std::vector<uint8_t> mRecvBuffer;   // the I/O thread's only

@@ -10,8 +10,6 @@
 #include <utils/StrongPointer.h>
 #include <utils/Vector.h>
 
-#include "platform/binder/RefSync.h"
-
 namespace android {
 
 class BBinder;
@@ -38,9 +36,6 @@ public:
     public:
         // Called on a binder thread once the object's process has gone.
         virtual void binderDied(const wp<IBinder>& who) = 0;
-
-    protected:
-        void onLastStrongRef(const void* /*id*/) override { refsync::observed(); }
     };
 
     virtual sp<IInterface> queryLocalInterface(const String16& descriptor);
@@ -62,7 +57,6 @@ public:
 
 protected:
     ~IBinder() override = default;
-    void onLastStrongRef(const void* /*id*/) override { refsync::observed(); }
 };
 
 }  // namespace android

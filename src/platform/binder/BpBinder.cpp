@@ -95,7 +95,6 @@ void BpBinder::sendObituary() {
         if (recipient != nullptr)
             recipient->binderDied(who);
         recipient.clear();
-        refsync::published();
     }
 }
 

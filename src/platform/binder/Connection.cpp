@@ -91,22 +91,13 @@ Connection::Connection(int fd, const sp<IBinder>& root)
 }
 
 Connection::~Connection() {
-    if (mThread.joinable()) {
-        // The I/O thread may drop the last reference itself on its way out.
-        if (std::this_thread::get_id() == mThread.get_id())
-            mThread.detach();
-        else
-            mThread.join();
-    }
+    // The I/O thread holds a reference until it has let itself go or been taken by
+    // join(), so no thread is left to wait for here.
     for (Outgoing& frame : mQueue)
         closeAll(frame.fds);
     close(mFd);
     if (mWakeFd >= 0)
         close(mWakeFd);
-}
-
-void Connection::onLastStrongRef(const void* /*id*/) {
-    refsync::observed();
 }
 
 sp<Connection> Connection::create(int fd, const sp<IBinder>& root) {
@@ -149,12 +140,15 @@ sp<Connection> Connection::connect(const char* path, status_t* status) {
 
 status_t Connection::start() {
     sp<Connection> self(this);
-    mThread = std::thread([self] {
-        pthread_setname_np(pthread_self(), "BinderIO");
-        self->ioLoop();
-        refsync::published();
-    });
-    mThreadId = mThread.get_id();
+    {
+        std::lock_guard<std::mutex> lock(mThreadLock);
+        mThread = std::thread([self] {
+            pthread_setname_np(pthread_self(), "BinderIO");
+            self->ioLoop();
+            self->letThreadGo();
+        });
+        mThreadId = mThread.get_id();
+    }
     ProcessState::self()->addConnection(self);
     return OK;
 }
@@ -192,8 +186,24 @@ void Connection::hangUp() {
 }
 
 void Connection::join() {
-    if (mThread.joinable() && std::this_thread::get_id() != mThreadId)
-        mThread.join();
+    if (std::this_thread::get_id() == mThreadId)
+        return;
+    std::thread thread;
+    {
+        std::lock_guard<std::mutex> lock(mThreadLock);
+        thread.swap(mThread);
+    }
+    if (thread.joinable())
+        thread.join();
+}
+
+void Connection::letThreadGo() {
+    // A connection whose peer went away can outlive its I/O thread for as long as
+    // proxies hold it, often until the process exits; a thread nobody is joining
+    // yet lets itself go instead of staying unjoined until then.
+    std::lock_guard<std::mutex> lock(mThreadLock);
+    if (mThread.joinable())
+        mThread.detach();
 }
 
 // ---- sending -------------------------------------------------------------------
@@ -656,7 +666,6 @@ bool Connection::readFrames() {
             return false;
         }
         closeAll(fds);
-        refsync::published();
     }
     return true;
 }
@@ -727,7 +736,6 @@ void Connection::die() {
         });
     }
     proxies.clear();
-    refsync::published();
     ProcessState::self()->removeConnection(this);
 }
 

@@ -5,7 +5,6 @@
 #include <chrono>
 
 #include "platform/binder/Connection.h"
-#include "platform/binder/RefSync.h"
 #include "platform/binder/SocketServiceManager.h"
 
 namespace android {
@@ -63,7 +62,6 @@ void ProcessState::workerLoop(bool joined) {
         lock.unlock();
         task();
         task = nullptr;  // its captures go before the lock is taken again
-        refsync::published();
         lock.lock();
         ++mIdle;
     }

@@ -17,14 +17,7 @@
 namespace TavoPlayer {
 namespace {
 
-using test::adtsFrame;
-using test::AdtsOptions;
-using test::Bytes;
-using test::ExtractedUnit;
-using test::loasFrame;
-using test::LoasOptions;
-using test::patternPayload;
-using test::PesChunk;
+using namespace test;
 
 constexpr uint64_t kTicksPerFrame48k = 1920;  // 1024 samples at 48 kHz in 90 kHz ticks
 const std::vector<uint8_t> kLcStereo48kAsc = {0x11, 0x90, 0, 0, 0, 0, 0, 0, 0, 0};
@@ -59,9 +52,9 @@ class AACExtractorTest : public ::testing::Test {
 protected:
     void SetUp() override { mRing = test::makeRing("AudioPES", 1u << 20); }
 
-    void writeRecords(const std::vector<std::vector<uint8_t>>& records, uint64_t firstPts,
-                      uint64_t step) {
-        for (const auto& record : test::groupCuts(records, 1, firstPts, step))
+    // One frame per record, a frame's duration apart.
+    void writeRecords(const std::vector<std::vector<uint8_t>>& frames) {
+        for (const auto& record : test::groupCuts(frames, 1, 0, kTicksPerFrame48k))
             ASSERT_TRUE(test::writePesRecord(*mRing, record.es, record.pts, 0xC0));
     }
 
@@ -82,7 +75,7 @@ class AACFramingTest : public AACExtractorTest, public ::testing::WithParamInter
 
 TEST_P(AACFramingTest, ResetSendsTheConfigurationAgainBeforeAudio) {
     const Stream s = makeStream(GetParam(), 10);
-    writeRecords(s.frames, 0, kTicksPerFrame48k);
+    writeRecords(s.frames);
     mExtractor = new AACMediaExtractor(mRing, GetParam());
     std::vector<uint8_t> out(4096);
     std::vector<ExtractedUnit> before;
@@ -127,15 +120,11 @@ TEST_P(AACSwitchTest, SwitchesAfterTheCountedErrorsAndThenDeliversConfigAndAudio
     const Stream s = makeStream(c.stream, total, 11, 1);
     std::vector<std::vector<uint8_t>> records;
     for (size_t i = 0; i < total; ++i) {
-        std::vector<uint8_t> record;
         const bool lookAlike =
             i >= c.recordsBeforeSwitch || (c.lookAlikeEvery != 0 && (i % c.lookAlikeEvery) == 0);
-        if (!lookAlike)
-            record.push_back(0x00);
-        record.insert(record.end(), s.frames[i].begin(), s.frames[i].end());
-        records.push_back(record);
+        records.push_back(lookAlike ? s.frames[i] : test::concat({{0x00}, s.frames[i]}));
     }
-    writeRecords(records, 0, kTicksPerFrame48k);
+    writeRecords(records);
     const auto units = extract(c.openedAs);
 
     EXPECT_EQ(c.stream, mExtractor->transportLayer());
@@ -143,11 +132,10 @@ TEST_P(AACSwitchTest, SwitchesAfterTheCountedErrorsAndThenDeliversConfigAndAudio
     EXPECT_EQ(AACMediaExtractor::FLAG_CODEC_CONFIG, units[0].flags);
     EXPECT_EQ(kLcStereo48kAsc, units[0].bytes);
     // The first record after the switch gives the configuration, all later ones audio.
-    const auto audio = test::bytesOf({units.begin() + 1, units.end()});
-    const size_t firstAudio = c.recordsBeforeSwitch + 1;
-    ASSERT_EQ(total - firstAudio - 1, audio.size()) << mTrace.all();
-    for (size_t i = 0; i < audio.size(); ++i)
-        EXPECT_EQ(s.units[firstAudio + i], audio[i]);
+    const auto firstAudio = s.units.begin() + static_cast<long>(c.recordsBeforeSwitch) + 1;
+    EXPECT_EQ(std::vector<Bytes>(firstAudio, s.units.end() - 1),
+              test::bytesOf({units.begin() + 1, units.end()}))
+        << mTrace.all();
     const size_t lookAlikes =
         c.lookAlikeEvery == 0 ? 0
                               : (c.recordsBeforeSwitch + c.lookAlikeEvery - 1) / c.lookAlikeEvery;
@@ -171,8 +159,8 @@ INSTANTIATE_TEST_SUITE_P(Framings, AACSwitchTest, ::testing::Values(
 TEST_F(AACExtractorTest, NoSwitchAfterTheFirstConfiguration) {
     const Stream loas = makeStream(kLoas, 3);
     const Stream adts = makeStream(kAdts, 60);
-    writeRecords(loas.frames, 0, kTicksPerFrame48k);
-    writeRecords(adts.frames, 0, kTicksPerFrame48k);
+    writeRecords(loas.frames);
+    writeRecords(adts.frames);
     const auto units = extract(kLoas);
     EXPECT_EQ(AACMediaExtractor::TRANSPORT_LAYER_LOAS, mExtractor->transportLayer());
     EXPECT_EQ(3u, units.size());
@@ -214,7 +202,7 @@ TEST_F(AACExtractorTest, RecordsClaimingMoreEsThanTheyHoldAreReadOnlyToTheirEnd)
                                      PESData::kHeaderSize, 5000, 0, f));
     ASSERT_TRUE(test::writeRawRecord(*mRing, PESData::kHeaderSize + 8, 4000, 100, 0,
                                      std::vector<uint8_t>(8, 0xFF)));
-    writeRecords(s.frames, 0, kTicksPerFrame48k);
+    writeRecords(s.frames);
     const auto units = extract(kAdts);
     // The first (bounded) record's frame is complete: it becomes the configuration;
     // the last frame waits for a next header.
@@ -248,7 +236,7 @@ TEST_F(AACExtractorTest, UnitLargerThanTheOutputIsDroppedAndTheNextDelivered) {
     Stream s = makeStream(kAdts, 5);
     s.units[2] = patternPayload(600, 99);
     s.frames[2] = adtsFrame({}, s.units[2]);
-    writeRecords(s.frames, 0, kTicksPerFrame48k);
+    writeRecords(s.frames);
     const auto units = extract(kAdts, 512);
     EXPECT_EQ((std::vector<Bytes>{kLcStereo48kAsc, s.units[1], s.units[3]}), test::bytesOf(units));
 }

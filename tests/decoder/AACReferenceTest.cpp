@@ -5,7 +5,6 @@
 // own decoder must decode the units with that configuration.
 #include <gtest/gtest.h>
 
-#include <filesystem>
 #include <string>
 #include <vector>
 
@@ -24,14 +23,10 @@ namespace TavoPlayer {
 namespace {
 
 using Unit = test::ExtractedUnit;
-
-struct Packet {
-    std::vector<uint8_t> bytes;
-    int64_t pts = 0;
-};
+constexpr auto kAdts = AACMediaExtractor::TRANSPORT_LAYER_ADTS;
 
 struct Demuxed {
-    std::vector<Packet> packets;
+    std::vector<Unit> packets;
     std::vector<uint8_t> extradata;
     int sampleRate = 0;
     int channels = 0;
@@ -92,55 +87,37 @@ Demuxed demux(const std::string& path, const char* format = nullptr, bool adtsTo
     return out;
 }
 
-struct Decoded {
-    int frames = 0;
-    int errors = 0;
-    int sampleRate = 0;
-    int channels = 0;
-};
-
-// Decodes raw access units with FFmpeg's AAC decoder given `asc` as configuration.
-Decoded decodeRaw(const std::vector<uint8_t>& asc, const std::vector<Unit>& units) {
-    Decoded out;
+// FFmpeg's AAC decoder, given the first unit (the configuration) as its own, decodes
+// every other unit without error into frames of the rate and channels `ref` reports.
+void expectFfmpegDecodes(const std::vector<Unit>& units, const Demuxed& ref) {
     const AVCodec* codec = avcodec_find_decoder(AV_CODEC_ID_AAC);
     AVCodecContext* ctx = avcodec_alloc_context3(codec);
+    const std::vector<uint8_t>& asc = units[0].bytes;
     ctx->extradata = static_cast<uint8_t*>(av_mallocz(asc.size() + AV_INPUT_BUFFER_PADDING_SIZE));
     std::copy(asc.begin(), asc.end(), ctx->extradata);
     ctx->extradata_size = static_cast<int>(asc.size());
-    if (avcodec_open2(ctx, codec, nullptr) < 0) {
-        avcodec_free_context(&ctx);
-        out.errors = 1;
-        return out;
-    }
+    ASSERT_GE(avcodec_open2(ctx, codec, nullptr), 0) << "configuration rejected";
     AVPacket* pkt = av_packet_alloc();
     AVFrame* frame = av_frame_alloc();
-    for (const auto& unit : units) {
-        if (unit.flags & AACMediaExtractor::FLAG_CODEC_CONFIG)
-            continue;
-        av_new_packet(pkt, static_cast<int>(unit.bytes.size()));
-        std::copy(unit.bytes.begin(), unit.bytes.end(), pkt->data);
-        if (avcodec_send_packet(ctx, pkt) < 0)
-            ++out.errors;
+    size_t frames = 0;
+    for (size_t i = 1; i < units.size(); ++i) {
+        av_new_packet(pkt, static_cast<int>(units[i].bytes.size()));
+        std::copy(units[i].bytes.begin(), units[i].bytes.end(), pkt->data);
+        EXPECT_GE(avcodec_send_packet(ctx, pkt), 0) << "unit " << i;
         av_packet_unref(pkt);
-        while (avcodec_receive_frame(ctx, frame) >= 0) {
-            ++out.frames;
-            out.sampleRate = frame->sample_rate;
-            out.channels = frame->ch_layout.nb_channels;
+        for (; avcodec_receive_frame(ctx, frame) >= 0; ++frames) {
+            EXPECT_EQ(ref.sampleRate, frame->sample_rate) << "unit " << i;
+            EXPECT_EQ(ref.channels, frame->ch_layout.nb_channels) << "unit " << i;
         }
     }
+    EXPECT_EQ(units.size() - 1, frames);
     av_frame_free(&frame);
     av_packet_free(&pkt);
     avcodec_free_context(&ctx);
-    return out;
 }
 
 class AACReferenceTest : public ::testing::Test {
 protected:
-    void SetUp() override {
-        mDir = std::filesystem::path(TAVO_BINARY_DIR) / "aac_reference";
-        std::filesystem::create_directories(mDir);
-    }
-
     // Runs the extractor over `records` (PTS given per record).
     std::vector<Unit> extract(const std::vector<test::PesChunk>& records,
                               AACMediaExtractor::transportLayer_t layer) {
@@ -149,23 +126,6 @@ protected:
             EXPECT_TRUE(test::writePesRecord(*ring, r.es, r.pts, 0xC0));
         android::sp<AACMediaExtractor> extractor = new AACMediaExtractor(ring, layer);
         return test::drain(*extractor);
-    }
-
-    // The same bytes cut three ways: one FFmpeg packet per PES, fixed odd cuts, and
-    // several packets per PES. Each must give the same units.
-    void expectSameUnitsThreeWays(const std::vector<Packet>& packets,
-                                  AACMediaExtractor::transportLayer_t layer,
-                                  std::vector<Unit>* onePerPes) {
-        std::vector<std::vector<uint8_t>> units;
-        for (const Packet& packet : packets)
-            units.push_back(packet.bytes);
-        const auto perPacket = test::groupCuts(units, 1, 0, 1920);
-        *onePerPes = extract(perPacket, layer);
-        const auto odd = test::fixedCuts(test::joinEs(perPacket), 181, 0, 181);
-        EXPECT_EQ(test::bytesOf(*onePerPes), test::bytesOf(extract(odd, layer))) << "odd cuts";
-        EXPECT_EQ(test::bytesOf(*onePerPes),
-                  test::bytesOf(extract(test::groupCuts(units, 4, 0, 1920), layer)))
-            << "grouped";
     }
 
     // Units: the configuration first, then every reference unit but the first (whose
@@ -182,13 +142,12 @@ protected:
         for (size_t i = 1; i + 1 < reference.size(); ++i)
             expected.push_back({reference[i], 0, 0});
         std::vector<Unit> got = units;
-        for (Unit& unit : got) {
+        for (Unit& unit : got)
             unit.pts = 0;  // compared elsewhere
-        }
         EXPECT_EQ(test::firstDifference(got, expected), "");
     }
 
-    std::filesystem::path mDir;
+    test::TempDir mDir{"tavo_aac_ref"};
 };
 
 TEST_F(AACReferenceTest, ExoPlayerAdtsSamples) {
@@ -199,14 +158,19 @@ TEST_F(AACReferenceTest, ExoPlayerAdtsSamples) {
     }
     const Demuxed packets = demux(plain, "aac", true);
     ASSERT_TRUE(packets.ok);
-    const auto& reference = packets.raw;
-    const auto& asc = packets.asc;
-    std::vector<Unit> units;
-    expectSameUnitsThreeWays(packets.packets, AACMediaExtractor::TRANSPORT_LAYER_ADTS, &units);
-    expectUnits(units, reference, asc);
+    // The same bytes cut three ways: one FFmpeg packet per PES, fixed odd cuts, and
+    // several packets per PES. Each must give the same units.
+    const auto frames = test::bytesOf(packets.packets);
+    const auto perPacket = test::groupCuts(frames, 1, 0, 1920);
+    const auto units = extract(perPacket, kAdts);
+    EXPECT_EQ(test::bytesOf(units),
+              test::bytesOf(extract(test::fixedCuts(test::joinEs(perPacket), 181, 0, 181), kAdts)))
+        << "odd cuts";
+    EXPECT_EQ(test::bytesOf(units),
+              test::bytesOf(extract(test::groupCuts(frames, 4, 0, 1920), kAdts)))
+        << "grouped";
+    expectUnits(units, packets.raw, packets.asc);
     ASSERT_FALSE(units.empty());
-    EXPECT_EQ((std::vector<uint8_t>{0x12, 0x08}),
-              std::vector<uint8_t>(units[0].bytes.begin(), units[0].bytes.begin() + 2));
     EXPECT_EQ(test::compareGolden("aac_exoplayer_sample_adts.txt", test::goldenDump(units)), "");
 
     // The same audio with ID3v2 tags: one before the first frame and one between the
@@ -216,16 +180,14 @@ TEST_F(AACReferenceTest, ExoPlayerAdtsSamples) {
     // third. FFmpeg's demuxer knows ID3 and keeps the first frame.
     const Demuxed taggedRef = demux(withId3, "aac", true);
     ASSERT_TRUE(taggedRef.ok);
-    const auto& taggedReference = taggedRef.raw;
-    EXPECT_EQ(asc, taggedRef.asc);
+    EXPECT_EQ(packets.asc, taggedRef.asc);
     const std::vector<uint8_t> file = test::fileBytes(withId3);
     ASSERT_FALSE(file.empty());
-    const auto tagged =
-        extract(test::fixedCuts(file, 500, 0, 500), AACMediaExtractor::TRANSPORT_LAYER_ADTS);
-    ASSERT_EQ(taggedReference.size() - 2, tagged.size());
+    const auto tagged = extract(test::fixedCuts(file, 500, 0, 500), kAdts);
+    ASSERT_EQ(taggedRef.raw.size() - 2, tagged.size());
     EXPECT_EQ(units[0].bytes, tagged[0].bytes);
     for (size_t i = 1; i < tagged.size(); ++i)
-        ASSERT_EQ(taggedReference[i + 1], tagged[i].bytes) << i;
+        ASSERT_EQ(taggedRef.raw[i + 1], tagged[i].bytes) << i;
 }
 
 TEST_F(AACReferenceTest, ExoPlayerLatmInTransportStream) {
@@ -263,12 +225,8 @@ TEST_F(AACReferenceTest, ExoPlayerLatmInTransportStream) {
 
     // FFmpeg's decoder takes the units with the written configuration and finds what
     // its own demuxer reports for the stream.
-    const Decoded decoded = decodeRaw(units[0].bytes, units);
-    EXPECT_EQ(0, decoded.errors);
-    EXPECT_EQ(static_cast<int>(units.size()) - 1, decoded.frames);
-    EXPECT_EQ(ref.sampleRate, decoded.sampleRate);
+    expectFfmpegDecodes(units, ref);
     EXPECT_EQ(test::compareGolden("aac_exoplayer_sample_latm_ts.txt", test::goldenDump(units)), "");
-    EXPECT_EQ(ref.channels, decoded.channels);
 }
 
 // Whole transport streams from tsgen: the audio PID's PES payloads go to the
@@ -287,7 +245,7 @@ TEST_P(AACTsgenTest, UnitsAndTimesMatchFfmpeg) {
     GTEST_SKIP() << "tsgen is not part of this build";
 #else
     const TsgenCase& c = GetParam();
-    const std::string path = (mDir / (c.name + ".ts")).string();
+    const std::string path = mDir / (c.name + ".ts");
     ASSERT_EQ(test::runCommand(std::string(TAVO_TSGEN_PATH) + " -o " + path +
                                " -d 2 --size 160x120 --audio " + (c.adts ? "adts " : "latm ") +
                                c.args + " 2>&1")
@@ -304,11 +262,7 @@ TEST_P(AACTsgenTest, UnitsAndTimesMatchFfmpeg) {
         EXPECT_EQ(ref.packets[i].pts, units[i].pts) << "unit " << i;
     if (c.adts)
         expectUnits(units, ref.raw, ref.asc);
-    const Decoded decoded = decodeRaw(units[0].bytes, units);
-    EXPECT_EQ(0, decoded.errors);
-    EXPECT_EQ(static_cast<int>(units.size()) - 1, decoded.frames);
-    EXPECT_EQ(ref.sampleRate, decoded.sampleRate);
-    EXPECT_EQ(ref.channels, decoded.channels);
+    expectFfmpegDecodes(units, ref);
 #endif
 }
 

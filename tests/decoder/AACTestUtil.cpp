@@ -6,16 +6,13 @@ namespace {
 
 // AudioSpecificConfig with a GASpecificConfig for channel configurations 1..7.
 void writeAsc(BitSink& sink, const AscFields& asc) {
-    if (asc.hierarchicalExtension != 0) {
-        sink.put(asc.hierarchicalExtension, 5);
-        sink.put(asc.samplingFrequencyIndex, 4);
-        sink.put(asc.channelConfiguration, 4);
+    const bool hierarchical = asc.hierarchicalExtension != 0;
+    sink.put(hierarchical ? asc.hierarchicalExtension : asc.aot, 5);
+    sink.put(asc.samplingFrequencyIndex, 4);
+    sink.put(asc.channelConfiguration, 4);
+    if (hierarchical) {
         sink.put(asc.extensionSamplingFrequencyIndex, 4);
-        sink.put(asc.aot, 5);
-    } else {
-        sink.put(asc.aot, 5);
-        sink.put(asc.samplingFrequencyIndex, 4);
-        sink.put(asc.channelConfiguration, 4);
+        sink.put(asc.aot, 5);  // the core's object type
     }
     sink.put(asc.frameLengthFlag, 1);
     sink.put(0, 1);  // dependsOnCoreCoder

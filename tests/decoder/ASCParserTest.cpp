@@ -8,6 +8,8 @@
 #include <string>
 #include <vector>
 
+#include "support/NamedRow.h"
+
 namespace TavoPlayer {
 namespace {
 
@@ -22,9 +24,7 @@ struct AscCase {
     uint32_t extSf;
     std::vector<uint8_t> expected;  // all 10 bytes
 };
-void PrintTo(const AscCase& c, std::ostream* os) {
-    *os << c.name;
-}
+using test::PrintTo;
 
 std::vector<AscCase> ascCases() {
     // clang-format off

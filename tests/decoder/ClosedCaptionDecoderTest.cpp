@@ -6,6 +6,7 @@
 #include <vector>
 
 #include "support/CaptionBuilder.h"
+#include "support/NamedRow.h"
 #include "support/TraceCapture.h"
 #include "support/TsTestUtil.h"
 
@@ -17,9 +18,6 @@ using namespace test;
 const char* const kOutOfScope =
     "48 out of scope at void TavoPlayer::ClosedCaptionDecoder::handleCommands(uint8_t)";
 
-Bytes repeat(char c, size_t n) {
-    return Bytes(n, static_cast<uint8_t>(c));
-}
 struct DecodeCase {
     const char* name;
     Bytes es;
@@ -27,27 +25,12 @@ struct DecodeCase {
     std::u32string text;      // the record's text when result is 1
     const char* logged = "";  // a message that must have been logged
 };
-void PrintTo(const DecodeCase& c, std::ostream* os) {
-    *os << c.name;
-}
+using test::PrintTo;
 
 std::vector<DecodeCase> decodeCases() {
-    CaptionUnitOptions timed;
-    timed.timeControlMode = 1;
-    CaptionUnitOptions notBody;
-    notBody.unitParameter = 0x30;
-    CaptionUnitOptions badIdentifier;
-    badIdentifier.dataIdentifier = 0x81;
-    CaptionUnitOptions noSeparator;
-    noSeparator.separator = 0x1E;
-    CaptionUnitOptions overrun;
-    overrun.declaredSize = 4;
-    CaptionUnitOptions withHeader;
-    withHeader.headerLength = 3;
-    const Bytes fourty = repeat('x', 40);
     return {
         {"Ola", captionEs({0x4F, 0x6C, 0x61}), 1, U"Ola\n"},
-        {"FortyCharactersFillRowZero", captionEs(fourty), 1,
+        {"FortyCharactersFillRowZero", captionEs(Bytes(40, 'x')), 1,
          std::u32string(32, U'x') + std::u32string(8, U'x') + U"\n"},
         {"FourthRowScrollsUp", captionEs(bytesOf("a\rb\rc\rd")), 1, U"b\nc\nd\n"},
         {"HundredCharactersKeepLastThreeRows",
@@ -77,14 +60,15 @@ std::vector<DecodeCase> decodeCases() {
                            "1 !\rq")),
          1, U"q\n", "CONTROLCODE not valid"},
         {"NulInRowZeroEndsTheRow", captionEs({'a', 0x00, 'b'}), 1, U"a\n"},
-        {"TimedStatementSkipsPresentationTime", captionEs({'t'}, timed), 1, U"t\n"},
-        {"PesDataHeaderSkipped", captionEs({'h'}, withHeader), 1, U"h\n"},
-        {"NotStatementBody", captionEs({'a'}, notBody), 4, U""},
-        {"WrongDataIdentifier", captionEs({'a'}, badIdentifier), 0, U""},
-        {"NoUnitSeparator", captionEs({'a'}, noSeparator), 0, U""},
-        {"UnitPastTheRecord", captionEs({'a'}, overrun), 0, U""},
-        {"UnitOf256BytesDropped", captionEs(repeat('z', 256)), 0, U"", "256 bytes dropped"},
-        {"UnitOf255BytesDecoded", captionEs(repeat('z', 255)), 1, std::u32string(95, U'z') + U"\n"},
+        {"TimedStatementSkipsPresentationTime", captionEs({'t'}, {.timeControlMode = 1}), 1,
+         U"t\n"},
+        {"PesDataHeaderSkipped", captionEs({'h'}, {.headerLength = 3}), 1, U"h\n"},
+        {"NotStatementBody", captionEs({'a'}, {.unitParameter = 0x30}), 4, U""},
+        {"WrongDataIdentifier", captionEs({'a'}, {.dataIdentifier = 0x81}), 0, U""},
+        {"NoUnitSeparator", captionEs({'a'}, {.separator = 0x1E}), 0, U""},
+        {"UnitPastTheRecord", captionEs({'a'}, {.declaredSize = 4}), 0, U""},
+        {"UnitOf256BytesDropped", captionEs(Bytes(256, 'z')), 0, U"", "256 bytes dropped"},
+        {"UnitOf255BytesDecoded", captionEs(Bytes(255, 'z')), 1, std::u32string(95, U'z') + U"\n"},
         {"TruncatedBeforeUnit", Bytes{0x80, 0xFF, 0xF0, 0x04, 0x00, 0x00, 0x00}, 0, U""},
     };
 }

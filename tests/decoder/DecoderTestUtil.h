@@ -34,7 +34,6 @@ public:
     int queueBuffer(android::ANativeWindowBuffer* buffer, int fenceFd) override;
 
     std::vector<Shown> shown() const;
-    size_t shownCount() const;
     // The last picture, cropped, as contiguous NV12.
     std::vector<uint8_t> lastPicture(int* width, int* height) const;
     // Replaces the last picture (for capture tests).

@@ -1,6 +1,6 @@
 #include <gtest/gtest.h>
 
-#include <filesystem>
+#include <functional>
 #include <map>
 #include <string>
 #include <vector>
@@ -16,11 +16,9 @@ extern "C" {
 namespace TavoPlayer {
 namespace {
 
-using test::Bytes;
-using test::concat;
-using test::ExtractedUnit;
-using test::PesChunk;
+using namespace test;
 using test::PrintTo;
+using Units = std::vector<ExtractedUnit>;
 
 // An independent bit-string builder for RBSPs: u(n) and ue(v) (ITU-T H.264, 7.2, 9.1).
 class Rbsp : public test::BitSink {
@@ -154,26 +152,19 @@ protected:
 
 // --- SPS and SEI --------------------------------------------------------------
 
-class H264SpsSeiTest : public H264Fixture {
-protected:
-    void decodeSps(const SpsParams& p) {
-        Bytes rbsp = spsRbsp(p);
-        ASSERT_EQ(mExtractor->decodeSPS(rbsp.data(), rbsp.size(), false), 0u);
-    }
-    unsigned decodeSei(Bytes seiNal) {
-        seiNal.erase(seiNal.begin(), seiNal.begin() + 4);  // 3-byte start code and header
-        return mExtractor->decodeSEI(seiNal.data(), seiNal.size(), true);
-    }
-};
+class H264SpsSeiTest : public H264Fixture {};
 
 TEST_F(H264SpsSeiTest, PicTimingWithHrdDelaysAndClockTimestamp) {
-    decodeSps({.nalHrd = true, .picStructPresent = true});
+    Bytes sps = spsRbsp({.nalHrd = true, .picStructPresent = true});
+    ASSERT_EQ(mExtractor->decodeSPS(sps.data(), sps.size(), false), 0u);
     Rbsp payload;
     payload.u(10, 0x155).u(10, 0x0AA).u(4, 3);  // two delays, pic_struct 3: two clocks
     payload.u(1, 1).u(2, 1).u(1, 0).u(5, 4).u(1, 1).u(1, 0).u(1, 0).u(8, 12);
     payload.u(6, 30).u(6, 59).u(5, 23);  // full timestamp
     payload.u(1, 0);
-    EXPECT_EQ(decodeSei(seiNal(1, payload.bytes(false))), 0u);
+    Bytes sei = seiNal(1, payload.bytes(false));
+    // Without its 3-byte start code and header.
+    EXPECT_EQ(mExtractor->decodeSEI(sei.data() + 4, sei.size() - 4, true), 0u);
     EXPECT_TRUE(mExtractor->isPicTimingSeen());
     EXPECT_EQ(mExtractor->getPicStruct(), 3);
 }
@@ -198,7 +189,6 @@ TEST_F(H264SpsSeiTest, ExpGolombCodesReadBackAsWritten) {
 
 class H264AccessUnitTest : public H264Fixture {};
 
-using Units = std::vector<ExtractedUnit>;
 constexpr unsigned char kIdrSps = H264MediaExtractor::kFlagIdr | H264MediaExtractor::kFlagSps;
 
 TEST_F(H264AccessUnitTest, DelimiterSplitsRecordIntoTwoUnits) {
@@ -276,18 +266,29 @@ TEST_F(H264AccessUnitTest, ResetGivesTheRecordBackAndDecodesTheSpsAgain) {
 
 // --- real encoder output against libavcodec's H.264 parser --------------------------
 
-Bytes encode(const std::string& x264Params, const std::string& extra, int frames) {
-    const std::string path = std::string(TAVO_BINARY_DIR) + "/h264test_" +
-                             std::to_string(std::hash<std::string>()(x264Params + extra)) + ".h264";
-    const bool ok =
-        test::runCommand(
-            "ffmpeg -v error -y -f lavfi -i testsrc=size=352x288:rate=30000/1001 -frames:v " +
-            std::to_string(frames) + " -c:v libx264 -preset ultrafast -x264-params " + x264Params +
-            " " + extra + " -f h264 '" + path + "'")
-            .exitCode == 0;
-    const Bytes es = ok ? test::fileBytes(path) : Bytes();
-    std::filesystem::remove(path);
-    return es;
+// libavcodec's units as the extractor must deliver them: unit i with the PTS `ptsOf(i)`,
+// the IDR flag where libavcodec sees a key frame and the SPS flag on the first when `sps`.
+Units referenceUnits(const std::vector<test::ParsedUnit>& reference, bool sps,
+                     const std::function<long long(size_t)>& ptsOf) {
+    Units units;
+    for (size_t i = 0; i < reference.size(); ++i) {
+        const int flags = (reference[i].key ? H264MediaExtractor::kFlagIdr : 0) |
+                          (sps && i == 0 ? H264MediaExtractor::kFlagSps : 0);
+        units.push_back({reference[i].bytes, ptsOf(i), static_cast<unsigned char>(flags)});
+    }
+    return units;
+}
+
+// 45 frames of FFmpeg's test pattern from libx264; empty when that encoder is missing.
+Bytes encode(const std::string& x264Params, const std::string& extra) {
+    const TempDir dir("tavo_h264");
+    const std::string path = dir / "x264.h264";
+    const bool ok = runCommand(
+                        "ffmpeg -v error -f lavfi -i testsrc=size=352x288:rate=30000/1001 "
+                        "-frames:v 45 -c:v libx264 -preset ultrafast -x264-params " +
+                        x264Params + " " + extra + " -f h264 '" + path + "'")
+                        .exitCode == 0;
+    return ok ? fileBytes(path) : Bytes();
 }
 
 struct StreamCase {
@@ -301,31 +302,22 @@ class H264RealStreamTest : public H264Fixture, public ::testing::WithParamInterf
 
 TEST_P(H264RealStreamTest, SameAccessUnitsAsFfmpegParser) {
     const StreamCase& c = GetParam();
-    const Bytes es = encode(c.x264Params, c.extra, 45);
+    const Bytes es = encode(c.x264Params, c.extra);
     if (es.empty()) {
         GTEST_SKIP() << "ffmpeg with libx264 not available";
     }
     const auto reference = test::ffmpegParse(es, AV_CODEC_ID_H264);
     ASSERT_EQ(reference.size(), 45u);
-    std::vector<Bytes> referenceBytes;
-    for (const auto& unit : reference)
-        referenceBytes.push_back(unit.bytes);
     // One access unit per PES, then several: the same units, each PES's first with its
     // PTS, the others the frame duration after the one before.
     for (size_t group : {1, 3, 7}) {
         SetUp();
-        Units expected;
-        for (size_t i = 0; i < reference.size(); ++i) {
-            const auto pts =
-                static_cast<long long>(500 + (i - i % group) * 3003 + (i % group) * c.ticks);
-            expected.push_back(
-                {reference[i].bytes, pts,
-                 static_cast<unsigned char>((reference[i].key ? H264MediaExtractor::kFlagIdr : 0) |
-                                            (i == 0 ? H264MediaExtractor::kFlagSps : 0))});
-        }
-        EXPECT_EQ(
-            test::firstDifference(run(test::groupCuts(referenceBytes, group, 500, 3003)), expected),
-            "")
+        const Units expected = referenceUnits(reference, true, [&](size_t i) {
+            return static_cast<long long>(500 + (i - i % group) * 3003 + (i % group) * c.ticks);
+        });
+        EXPECT_EQ(test::firstDifference(
+                      run(test::groupCuts(test::bytesOf(reference), group, 500, 3003)), expected),
+                  "")
             << "group " << group;
         EXPECT_EQ(mExtractor->getCroppedWidth(), 352u);
         EXPECT_EQ(mExtractor->getCroppedHeight(), 288u);
@@ -384,15 +376,9 @@ TEST_F(H264TsgenTest, OneUnitPerPesWithAndWithoutVui) {
         SetUp();
         test::TraceCapture trace;
         ASSERT_EQ(mReference.size(), mChunks.size());
-        const auto units = run(mChunks);
-        ASSERT_EQ(units.size(), mReference.size());
-        for (size_t i = 0; i < units.size(); ++i) {
-            ASSERT_EQ(units[i].bytes, mReference[i].bytes) << "unit " << i;
-            EXPECT_EQ(units[i].pts, static_cast<long long>(mChunks[i].pts)) << "unit " << i;
-            EXPECT_EQ(units[i].flags, (mReference[i].key ? H264MediaExtractor::kFlagIdr : 0) |
-                                          (vui && i == 0 ? H264MediaExtractor::kFlagSps : 0))
-                << "unit " << i;
-        }
+        const Units expected = referenceUnits(
+            mReference, vui, [&](size_t i) { return static_cast<long long>(mChunks[i].pts); });
+        EXPECT_EQ(test::firstDifference(run(mChunks), expected), "");
         EXPECT_EQ(trace.count("decodeSPS: VUI is not present"), vui ? 0u : 1u);
         if (vui) {
             EXPECT_EQ(mExtractor->getCroppedWidth(), 1920u);
@@ -445,7 +431,7 @@ TEST_P(H264GoldenTest, UnitsMatchTheDumpFfmpegAndTheTsParserPath) {
         GTEST_SKIP() << "sample stream absent from " << TAVO_SHARED_STREAMS_DIR;
     }
     const Bytes ts = test::fileBytes(path);
-    auto chunks = test::pesFromTs(ts, c.pid);
+    const auto chunks = test::pesFromTs(ts, c.pid);
     ASSERT_GT(chunks.size(), 1u);
     const auto units = run(chunks);
     EXPECT_EQ(test::compareGolden(std::string(c.name) + ".h264.txt", test::goldenDump(units)), "");
@@ -460,14 +446,9 @@ TEST_P(H264GoldenTest, UnitsMatchTheDumpFfmpegAndTheTsParserPath) {
             << "unit " << i << " of " << units.size() << ", " << units[i].bytes.size() << " bytes";
     }
 
-    // Through the system's TS parser module, which emits a PES only when the next one
-    // starts: the units of all but the last PES.
-    chunks.pop_back();
-    SetUp();
-    const auto expected = run(chunks);
-    SetUp();
-    EXPECT_EQ(test::firstDifference(test::runThroughTsParser(*mExtractor, *mRing, ts, c.pid, 1),
-                                    expected),
+    // The same units through the system's TS parser module.
+    EXPECT_EQ(test::tsParserPathDifference(
+                  ts, c.pid, 1, [](const auto& input) { return new H264MediaExtractor(input); }),
               "");
 }
 

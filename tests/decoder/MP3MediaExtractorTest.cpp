@@ -16,10 +16,9 @@ extern "C" {
 namespace TavoPlayer {
 namespace {
 
-using test::Bytes;
-using test::ExtractedUnit;
-using test::PesChunk;
+using namespace test;
 using test::PrintTo;
+using Units = std::vector<ExtractedUnit>;
 
 struct HeaderFields {
     unsigned version = 3;  // 3 MPEG-1, 2 MPEG-2, 0 MPEG 2.5
@@ -79,14 +78,11 @@ class MP3FrameLengthTest : public MP3ExtractorFixture,
 
 TEST_P(MP3FrameLengthTest, LengthAndDurationFollowTheTables) {
     const LengthCase& c = GetParam();
-    std::vector<uint8_t> es = frame(c.fields, c.length, 1);
-    es = test::concat({es, frame(c.fields, c.length, 2)});
-    const auto units = run({{es, 9000}});
-    ASSERT_EQ(units.size(), 2u);
-    EXPECT_EQ(units[0].bytes.size(), c.length);
-    EXPECT_EQ(units[0].pts, 9000);
-    EXPECT_EQ(units[1].pts, static_cast<long long>(9000 + c.durationTicks));
-    EXPECT_EQ(units[1].bytes, std::vector<uint8_t>(es.begin() + c.length, es.end()));
+    const Bytes first = frame(c.fields, c.length, 1);
+    const Bytes second = frame(c.fields, c.length, 2);
+    EXPECT_EQ(
+        run({{test::concat({first, second}), 9000}}),
+        (Units{{first, 9000, 0}, {second, static_cast<long long>(9000 + c.durationTicks), 0}}));
 }
 
 INSTANTIATE_TEST_SUITE_P(Tables, MP3FrameLengthTest,
@@ -122,7 +118,7 @@ TEST_P(MP3BadFrameTest, IsSkippedWithItsMessageAndTheStreamGoesOn) {
     test::TraceCapture trace;
     const Bytes good = frame({}, 417, 4);
     EXPECT_EQ(run({{test::concat({frame(c.fields, c.length, 3), good}), 1000}}, c.outputSize),
-              (std::vector<ExtractedUnit>{{good, 1000, 0}}));
+              (Units{{good, 1000, 0}}));
     EXPECT_GE(trace.count(TRACE_ERROR, c.message), 1u) << trace.all();
 }
 
@@ -138,8 +134,6 @@ INSTANTIATE_TEST_SUITE_P(BadFrames, MP3BadFrameTest, ::testing::Values(
                  "getNextFragment: not enough space in output buffer for MPEG audio frame.", 561, 560}),
     [](const auto& info) { return std::string(info.param.name); });
 // clang-format on
-
-using Units = std::vector<ExtractedUnit>;
 
 TEST_F(MP3ExtractorFixture, ResyncSkipsGarbageAndFalseSyncs) {
     // FF E0 with a reserved layer: a false sync that must be stepped over.
@@ -167,15 +161,8 @@ TEST_F(MP3ExtractorFixture, RecordLargerThanReadableIsAFaultAndNotConsumed) {
     EXPECT_NE(dump.find("ReadLock: \e[01;32mUnlocked"), std::string::npos) << dump;
 }
 
-std::vector<std::vector<uint8_t>> ffmpegFrames(const std::vector<uint8_t>& es, AVCodecID id) {
-    std::vector<std::vector<uint8_t>> frames;
-    for (auto& unit : test::ffmpegParse(es, id))
-        frames.push_back(std::move(unit.bytes));
-    return frames;
-}
-
-// Real encoder output against libavcodec's MPEG audio parser on the same bytes, from
-// the ffmpeg command (cut here three ways) or from tsgen (cut as its muxer cuts it).
+// Real encoder output from tsgen, cut as its muxer cuts it, against libavcodec's MPEG
+// audio parser on the same bytes.
 struct ReferenceCase {
     const char* name;
     const char* tsgen;  // the audio options
@@ -183,47 +170,41 @@ struct ReferenceCase {
 };
 
 class MP3ReferenceTest : public MP3ExtractorFixture,
-                         public ::testing::WithParamInterface<ReferenceCase> {
-protected:
-    // A header needs its 6 bytes inside one record: a frame whose header a record
-    // boundary cuts is lost (the extractor resyncs on the next header); every other
-    // frame comes out whole, and one that starts a record carries the record's PTS.
-    void expectFfmpegFrames(const std::vector<PesChunk>& chunks, AVCodecID codec) {
-        SetUp();
-        std::vector<uint8_t> es;
-        std::map<size_t, uint64_t> recordAt;  // ES offset -> PTS of the record there
-        for (const auto& chunk : chunks) {
-            recordAt[es.size()] = chunk.pts;
-            es.insert(es.end(), chunk.es.begin(), chunk.es.end());
-        }
-        const auto reference = ffmpegFrames(es, codec);
-        ASSERT_GT(reference.size(), 30u);
-        const auto units = run(chunks);
-        size_t at = 0;
-        size_t next = 0;
-        for (const auto& frame : reference) {
-            const auto boundary = recordAt.upper_bound(at);
-            if (boundary == recordAt.end() || boundary->first >= at + 6) {
-                ASSERT_LT(next, units.size());
-                ASSERT_EQ(units[next].bytes, frame) << "frame at " << at;
-                if (recordAt.count(at) != 0) {
-                    EXPECT_EQ(units[next].pts, static_cast<long long>(recordAt[at]));
-                }
-                ++next;
-            }
-            at += frame.size();
-        }
-        EXPECT_EQ(next, units.size());
-    }
-};
+                         public ::testing::WithParamInterface<ReferenceCase> {};
 
+// A header needs its 6 bytes inside one record: a frame whose header a record boundary
+// cuts is lost (the extractor resyncs on the next header); every other frame comes out
+// whole, and one that starts a record carries the record's PTS.
 TEST_P(MP3ReferenceTest, SameFramesAsFfmpegParser) {
     const auto ts =
         test::runTsgen(std::string("-d 2 --size 176x144 --no-caption-stream ") + GetParam().tsgen);
     if (ts.empty()) {
         GTEST_SKIP() << "tsgen not available";
     }
-    expectFfmpegFrames(test::pesFromTs(ts, 0x112), GetParam().codec);
+    const std::vector<PesChunk> chunks = test::pesFromTs(ts, 0x112);
+    std::map<size_t, uint64_t> recordAt;  // ES offset -> PTS of the record there
+    for (size_t at = 0; const auto& chunk : chunks) {
+        recordAt[at] = chunk.pts;
+        at += chunk.es.size();
+    }
+    const auto reference = test::bytesOf(test::ffmpegParse(test::joinEs(chunks), GetParam().codec));
+    ASSERT_GT(reference.size(), 30u);
+    const auto units = run(chunks);
+    size_t at = 0;
+    size_t next = 0;
+    for (const auto& frame : reference) {
+        const auto boundary = recordAt.upper_bound(at);
+        if (boundary == recordAt.end() || boundary->first >= at + 6) {
+            ASSERT_LT(next, units.size());
+            ASSERT_EQ(units[next].bytes, frame) << "frame at " << at;
+            if (recordAt.count(at) != 0) {
+                EXPECT_EQ(units[next].pts, static_cast<long long>(recordAt[at]));
+            }
+            ++next;
+        }
+        at += frame.size();
+    }
+    EXPECT_EQ(next, units.size());
 }
 
 // 48 and 24 kHz at these rates need no padding, where the extractor's padded-frame rule
@@ -261,25 +242,21 @@ TEST_P(MP3GoldenTest, FramesMatchTheDumpFfmpegAndTheTsParserPath) {
         GTEST_SKIP() << "sample stream absent from " << TAVO_SHARED_STREAMS_DIR;
     }
     const std::vector<uint8_t> ts = test::fileBytes(path);
-    auto chunks = test::pesFromTs(ts, c.pid);
+    const auto chunks = test::pesFromTs(ts, c.pid);
     ASSERT_GT(chunks.size(), 1u);
     const auto units = run(chunks);
     ASSERT_FALSE(units.empty());
     EXPECT_EQ(test::compareGolden(std::string(c.name) + ".mpa.txt", test::goldenDump(units)), "");
     if (c.sameAsFfmpeg) {
-        const auto reference = ffmpegFrames(test::joinEs(chunks), AV_CODEC_ID_MP2);
+        const auto reference =
+            test::bytesOf(test::ffmpegParse(test::joinEs(chunks), AV_CODEC_ID_MP2));
         ASSERT_EQ(units.size(), reference.size());
         for (size_t i = 0; i < units.size(); ++i)
             ASSERT_EQ(units[i].bytes, reference[i]) << "frame " << i;
     }
-    // Through the system's TS parser module, which emits a PES only when the next one
-    // starts: the frames of all but the last PES.
-    chunks.pop_back();
-    SetUp();
-    const auto expected = run(chunks);
-    SetUp();
-    EXPECT_EQ(test::firstDifference(test::runThroughTsParser(*mExtractor, *mRing, ts, c.pid, 2),
-                                    expected),
+    // The same frames through the system's TS parser module.
+    EXPECT_EQ(test::tsParserPathDifference(
+                  ts, c.pid, 2, [](const auto& input) { return new MP3MediaExtractor(input); }),
               "");
 }
 

@@ -2,7 +2,6 @@
 // compared with FFmpeg's own RGB conversion, and the refusals and failures.
 #include <gtest/gtest.h>
 
-#include <condition_variable>
 #include <mutex>
 
 extern "C" {
@@ -18,37 +17,25 @@ extern "C" {
 namespace TavoPlayer {
 namespace {
 
-class Listener : public CaptureFrameListener {
+struct Capture {
+    std::vector<uint32_t> pixels;
+    bool flag;
+};
+
+// Keeps every capture delivered; while a test holds `gate`, the callback waits for it.
+class Listener : public CaptureFrameListener, public test::Recorded<Capture> {
 public:
     void onCaptureFrame(unsigned char* pixels, unsigned int width, unsigned int height,
                         bool flag) override {
-        std::unique_lock<std::mutex> lock(mMutex);
-        mChanged.wait(lock, [&] { return !mBlocked; });
-        mPixels.assign(reinterpret_cast<uint32_t*>(pixels),
-                       reinterpret_cast<uint32_t*>(pixels) + width * height);
+        std::lock_guard<std::mutex> wait(gate);
+        const auto* argb = reinterpret_cast<const uint32_t*>(pixels);
+        push({std::vector<uint32_t>(argb, argb + width * height), flag});
         delete[] pixels;
-        mWidth = width;
-        mHeight = height;
-        mFlag = flag;
-        ++mCalls;
     }
-    void block(bool blocked) {
-        std::lock_guard<std::mutex> lock(mMutex);
-        mBlocked = blocked;
-        mChanged.notify_all();
+    bool waitForCaptures(size_t count) {
+        return waitFor([&](const auto& all) { return all.size() == count; });
     }
-    int calls() {
-        std::lock_guard<std::mutex> lock(mMutex);
-        return mCalls;
-    }
-
-    std::mutex mMutex;
-    std::condition_variable mChanged;
-    bool mBlocked = false;
-    int mCalls = 0;
-    std::vector<uint32_t> mPixels;
-    unsigned int mWidth = 0, mHeight = 0;
-    bool mFlag = true;
+    std::mutex gate;
 };
 
 class MediaCodecDecoderCaptureTest : public ::testing::Test {
@@ -74,15 +61,16 @@ TEST_F(MediaCodecDecoderCaptureTest, DecodedPictureMatchesFfmpegsConversion) {
     const test::Bytes ts = test::runTsgen("-d 1 --audio none --size 320x240 --progressive");
     ASSERT_FALSE(ts.empty());
     const test::DecodedRun run = test::runDecoder(ts, 0x111, Decoder::CODING_H264, mSurface);
-    ASSERT_GT(mSurface->shownCount(), 10u);
+    ASSERT_GT(mSurface->shown().size(), 10u);
     int width = 0, height = 0;
     std::vector<uint8_t> nv12 = mSurface->lastPicture(&width, &height);
     ASSERT_EQ(320, width);
     setSurface();
     ASSERT_TRUE(mDecoder->captureFrame(mFrame, &mListener));
-    ASSERT_TRUE(test::waitUntil([&] { return mListener.calls() == 1; }));
-    EXPECT_FALSE(mListener.mFlag);
-    ASSERT_EQ(320u * 240u, mListener.mPixels.size());
+    ASSERT_TRUE(mListener.waitForCaptures(1));
+    const Capture capture = mListener.snapshot()[0];
+    EXPECT_FALSE(capture.flag);
+    ASSERT_EQ(320u * 240u, capture.pixels.size());
     EXPECT_EQ(1, mSurface->queuedBack);
 
     // FFmpeg: full-range BT.601 NV12 to BGRA (bytes B, G, R, A as the capture's
@@ -103,11 +91,11 @@ TEST_F(MediaCodecDecoderCaptureTest, DecodedPictureMatchesFfmpegsConversion) {
     int worst = 0;
     for (size_t i = 0; i < reference.size(); ++i) {
         for (int shift : {0, 8, 16}) {
-            const int ours = (mListener.mPixels[i] >> shift) & 0xFF;
+            const int ours = (capture.pixels[i] >> shift) & 0xFF;
             const int theirs = (reference[i] >> shift) & 0xFF;
             worst = std::max(worst, std::abs(ours - theirs));
         }
-        ASSERT_EQ(0xFF000000u, mListener.mPixels[i] & 0xFF000000u);
+        ASSERT_EQ(0xFF000000u, capture.pixels[i] & 0xFF000000u);
     }
     EXPECT_LE(worst, 3);
 }
@@ -115,16 +103,16 @@ TEST_F(MediaCodecDecoderCaptureTest, DecodedPictureMatchesFfmpegsConversion) {
 TEST_F(MediaCodecDecoderCaptureTest, OneCaptureAtATime) {
     mSurface->setLastPicture(std::vector<uint8_t>(320 * 240 * 3 / 2, 128), 320, 240);
     setSurface();
-    mListener.block(true);
+    std::unique_lock<std::mutex> held(mListener.gate);
     ASSERT_TRUE(mDecoder->captureFrame(mFrame, &mListener));
     EXPECT_FALSE(mDecoder->captureFrame(mFrame, &mListener));
     EXPECT_TRUE(mTrace.contains("captureFrame: Capture is in progress"));
-    mListener.block(false);
-    ASSERT_TRUE(test::waitUntil([&] { return mListener.calls() == 1; }));
-    EXPECT_EQ(std::vector<uint32_t>(320 * 240, 0xFF808080u), mListener.mPixels);
+    held.unlock();
+    ASSERT_TRUE(mListener.waitForCaptures(1));
+    EXPECT_EQ(std::vector<uint32_t>(320 * 240, 0xFF808080u), mListener.snapshot()[0].pixels);
     // A finished capture is replaced by the next one.
     ASSERT_TRUE(test::waitUntil([&] { return mDecoder->captureFrame(mFrame, &mListener); }));
-    EXPECT_TRUE(test::waitUntil([&] { return mListener.calls() == 2; }));
+    EXPECT_TRUE(mListener.waitForCaptures(2));
 }
 
 // Each failure is logged, and the listener is never called.
@@ -163,7 +151,7 @@ TEST_F(MediaCodecDecoderCaptureTest, FailuresLogAndNeverCallTheListener) {
         if (row.lockStatus != 0) {
             EXPECT_EQ(1, recording->queuedBack) << "a dequeued buffer always goes back";
         }
-        EXPECT_EQ(0, listener.calls()) << row.name;
+        EXPECT_TRUE(listener.snapshot().empty()) << row.name;
     }
 }
 

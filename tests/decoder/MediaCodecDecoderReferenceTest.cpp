@@ -2,11 +2,11 @@
 // -> output ring; the pictures shown and the PCM written must be FFmpeg's own decode
 // of the same file (framemd5 of nv12 with the stream's PTS; s16 PCM).
 #include <gtest/gtest.h>
-#include <unistd.h>
 
 #include <algorithm>
-#include <filesystem>
+#include <fstream>
 #include <map>
+#include <tuple>
 
 #include "DecoderTestUtil.h"
 #include "PesRecordTestUtil.h"
@@ -65,18 +65,16 @@ TEST_P(MediaCodecDecoderReferenceTest, OutputIsFfmpegsDecode) {
             const int64_t pts = shown[i].ptsUs * 9 / 100;
             EXPECT_EQ(md5At[pts], shown[i].md5) << "picture " << i << " pts " << pts;
             EXPECT_EQ(static_cast<uint64_t>(pts), run.video[i].pts) << "record " << i;
-            EXPECT_EQ(1920, shown[i].width);
-            EXPECT_EQ(1080, shown[i].height);
-            EXPECT_EQ(261, run.video[i].colorFormat);
-            EXPECT_EQ(1920u, run.video[i].width);
-            EXPECT_EQ(1080u, run.video[i].height);
+            EXPECT_EQ(std::make_pair(1920, 1080), std::make_pair(shown[i].width, shown[i].height));
+            // NV12, 1920 x 1080; GOP of 15: the pictures 0 and 15 are IDR pictures.
+            const test::VideoRecord& record = run.video[i];
+            EXPECT_EQ(std::make_tuple(261, 1920u, 1080u, i % 15 == 0 ? 1 : 0),
+                      std::make_tuple(record.colorFormat, record.width, record.height, record.flag))
+                << "record " << i;
             if (i > 0) {
                 EXPECT_LT(shown[i - 1].ptsUs, shown[i].ptsUs);
             }
         }
-        // GOP of 15: the pictures 0 and 15 are IDR pictures, the others not.
-        for (size_t i = 0; i < run.video.size(); ++i)
-            EXPECT_EQ(i % 15 == 0 ? 1 : 0, run.video[i].flag) << "record " << i;
         ASSERT_FALSE(run.resolutions.empty());
         EXPECT_EQ(std::make_pair(1920, 1080), run.resolutions.front());
         return;
@@ -98,10 +96,9 @@ TEST_P(MediaCodecDecoderReferenceTest, OutputIsFfmpegsDecode) {
         const size_t first = (es[3] & 3u) << 11 | es[4] << 3 | es[5] >> 5;
         es.erase(es.begin(), es.begin() + static_cast<long>(first));
         referencePath = mDir / (c.name + ".es");
-        FILE* file = fopen(referencePath.c_str(), "wb");
-        ASSERT_NE(nullptr, file);
-        fwrite(es.data(), 1, es.size(), file);
-        fclose(file);
+        std::ofstream(referencePath, std::ios::binary)
+            .write(reinterpret_cast<const char*>(es.data()),
+                   static_cast<std::streamsize>(es.size()));
     }
     const test::Bytes reference = test::ffmpegPcm(referencePath, aac ? "aac" : "");
     ASSERT_GT(reference.size(), 10000u);

@@ -2,11 +2,8 @@
 // its states and configure table, the input thread's empty turns, the surface rules,
 // and bad input that must be survived.
 #include <gtest/gtest.h>
-#include <unistd.h>
 
-#include <filesystem>
 #include <set>
-#include <thread>
 
 #include "DecoderTestUtil.h"
 #include "PesRecordTestUtil.h"
@@ -105,8 +102,8 @@ TEST_F(MediaCodecDecoderTest, NewSurfaceWhileStartedRestartsAndFlushes) {
     EXPECT_EQ(240u, frame->mCropHeight);
     frame->mListener->renderFrame(true, *frame);
     mOutput->consume(frame->mSize);
-    EXPECT_EQ(1u, second->shownCount());
-    EXPECT_EQ(0u, first->shownCount());
+    EXPECT_EQ(1u, second->shown().size());
+    EXPECT_EQ(0u, first->shown().size());
 }
 
 // Damaged and changing streams: the module logs, carries on, decodes what it can,
@@ -138,7 +135,7 @@ TEST_P(MediaCodecDecoderBadInputTest, CarriesOn) {
     EXPECT_EQ(0u, run.heldOutputBuffers);
     std::set<int> seen;
     if (video) {
-        EXPECT_GT(surface->shownCount(), 20u);
+        EXPECT_GT(surface->shown().size(), 20u);
         for (const auto& shown : surface->shown())
             seen.insert(shown.width);
     } else {

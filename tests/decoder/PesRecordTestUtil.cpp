@@ -106,13 +106,6 @@ void PrintTo(const ExtractedUnit& unit, std::ostream* os) {
     *os << goldenDump({unit});
 }
 
-std::vector<Bytes> bytesOf(const std::vector<ExtractedUnit>& units) {
-    std::vector<Bytes> out;
-    for (const ExtractedUnit& unit : units)
-        out.push_back(unit.bytes);
-    return out;
-}
-
 std::string firstDifference(const std::vector<ExtractedUnit>& got,
                             const std::vector<ExtractedUnit>& want) {
     const auto [g, w] = std::mismatch(got.begin(), got.end(), want.begin(), want.end());
@@ -196,17 +189,23 @@ void feedPid(RingBuffer& input, const Bytes& ts, uint16_t pid,
     }
 }
 
-std::vector<ExtractedUnit> runThroughTsParser(MediaExtractor& extractor, RingBuffer& ring,
-                                              const Bytes& ts, uint16_t pid, int kind) {
+std::string tsParserPathDifference(const Bytes& ts, uint16_t pid, int kind,
+                                   const ExtractorFactory& make) {
+    std::vector<PesChunk> chunks = pesFromTs(ts, pid);
+    chunks.pop_back();
+    android::sp<RingBuffer> ring = makeRing("PES", 1u << 22);
+    const std::vector<ExtractedUnit> expected = runExtractor(*make(ring), *ring, chunks);
     const std::vector<PesRecord> records = parseTs(bytesOfPid(ts, pid), kind);
-    return feedAndPull(
-        extractor, ring, records.size(),
+    ring = makeRing("PES", 1u << 22);
+    const std::vector<ExtractedUnit> units = feedAndPull(
+        *make(ring), *ring, records.size(),
         [&](size_t i) { return RingBuffer::roundUp4(records[i].size); },
         [&](size_t i) {
             const PesRecord& r = records[i];
-            writeRawRecord(ring, r.size, r.offsetES, r.sizeES, r.pts, r.pes);
+            writeRawRecord(*ring, r.size, r.offsetES, r.sizeES, r.pts, r.pes);
         },
         4u << 20);
+    return firstDifference(units, expected);
 }
 
 std::vector<PesChunk> pesFromTs(const Bytes& ts, uint16_t pid) {
@@ -277,13 +276,11 @@ std::string sampleStream(const std::string& name) {
 
 Bytes runTsgen(const std::string& arguments) {
 #ifdef TAVO_TSGEN_PATH
-    const std::string path = std::string(TAVO_BINARY_DIR) + "/extractor_tsgen_" +
-                             std::to_string(std::hash<std::string>()(arguments)) + ".ts";
+    const TempDir dir("tavo_tsgen");
+    const std::string path = dir / "stream.ts";
     const bool ok =
         runCommand(std::string(TAVO_TSGEN_PATH) + " -o '" + path + "' " + arguments).exitCode == 0;
-    const Bytes ts = ok ? fileBytes(path) : Bytes();
-    std::remove(path.c_str());
-    return ts;
+    return ok ? fileBytes(path) : Bytes();
 #else
     (void)arguments;
     return {};

@@ -6,6 +6,7 @@
 #pragma once
 
 #include <cstdint>
+#include <functional>
 #include <ostream>
 #include <string>
 #include <vector>
@@ -70,7 +71,14 @@ struct ExtractedUnit {
 };
 // Prints as its golden-dump line.
 void PrintTo(const ExtractedUnit& unit, std::ostream* os);
-std::vector<Bytes> bytesOf(const std::vector<ExtractedUnit>& units);
+// The bytes of each unit: an extractor's, libavcodec's parser's or a demuxer's.
+template <typename Unit = ExtractedUnit>
+std::vector<Bytes> bytesOf(const std::vector<Unit>& units) {
+    std::vector<Bytes> out;
+    for (const Unit& unit : units)
+        out.push_back(unit.bytes);
+    return out;
+}
 
 // Empty when `got` equals `want`, else which unit first differs and how.
 std::string firstDifference(const std::vector<ExtractedUnit>& got,
@@ -96,11 +104,13 @@ std::vector<ExtractedUnit> drain(MediaExtractor& extractor, size_t outputSize = 
 void feedPid(RingBuffer& input, const Bytes& ts, uint16_t pid,
              std::chrono::steady_clock::time_point deadline);
 
-// The records the system's TS parser module of `kind` writes for the packets of `pid`,
-// copied as they are into `ring` for `extractor`. The parser emits a PES only when the
-// next one starts, so the last PES is never seen.
-std::vector<ExtractedUnit> runThroughTsParser(MediaExtractor& extractor, RingBuffer& ring,
-                                              const Bytes& ts, uint16_t pid, int kind);
+// Empty when the records the system's TS parser module of `kind` writes for the packets
+// of `pid` bring an extractor made by `make` the units of every PES of `pid` but the last
+// (the parser emits a PES only when the next one starts), else the first difference.
+using ExtractorFactory =
+    std::function<android::sp<MediaExtractor>(const android::sp<RingBuffer>& input)>;
+std::string tsParserPathDifference(const Bytes& ts, uint16_t pid, int kind,
+                                   const ExtractorFactory& make);
 
 // The PES packets of `pid` in a transport stream (ISO/IEC 13818-1, 2.4.3.2 and
 // 2.4.3.6), each as its ES payload (bounded by PES_packet_length when given) with its

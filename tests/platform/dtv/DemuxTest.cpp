@@ -6,7 +6,6 @@
 #include <gtest/gtest.h>
 
 #include <chrono>
-#include <cstdlib>
 #include <cstring>
 #include <filesystem>
 #include <fstream>
@@ -210,7 +209,7 @@ TEST_F(DemuxTest, SourceThatCannotBeOpenedGivesANegativeHandleAndSaysWhy) {
         {"tcp://host:1", "unknown source"},
         {"", "no demux source"},
     };
-    setenv("TAVOPLAYER_DVB_ROOT", root.path().c_str(), 1);
+    const ScopedEnv dvbRoot("TAVOPLAYER_DVB_ROOT", root.path());
     for (const auto& c : cases) {
         TraceCapture trace;
         ScopedDemuxSource source(c.source);
@@ -218,7 +217,6 @@ TEST_F(DemuxTest, SourceThatCannotBeOpenedGivesANegativeHandleAndSaysWhy) {
         EXPECT_TRUE(trace.contains(c.message)) << c.source << "\n" << trace.all();
         EXPECT_FALSE(Demux::instance().sourceStats().open) << c.source;
     }
-    unsetenv("TAVOPLAYER_DVB_ROOT");
     EXPECT_LT(DemuxBinder_StartFiltering(0x2000, kDemuxFilterPes), 0);
     EXPECT_LT(DemuxBinder_StopFiltering(17), 0);
 }

@@ -7,10 +7,9 @@
 #include <sys/socket.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <chrono>
 #include <future>
-#include <mutex>
-#include <thread>
 #include <vector>
 
 #include "platform/media/MediaPlayerOutputs.h"
@@ -34,6 +33,11 @@ struct Note {
     std::string thread;
 };
 
+// Notes `msg`, and `ext1` unless it is -1.
+auto matching(int msg, int ext1) {
+    return [=](const Note& note) { return note.msg == msg && (ext1 == -1 || note.ext1 == ext1); };
+}
+
 class RecordingListener : public android::MediaPlayerListener, public test::Recorded<Note> {
 public:
     void notify(int msg, int ext1, int ext2, const android::Parcel*) override {
@@ -44,11 +48,8 @@ public:
     // Index of the first note `msg` (and `ext1` unless -1) so far; -1 if none.
     int find(int msg, int ext1 = -1) {
         const std::vector<Note> all = snapshot();
-        for (size_t i = 0; i < all.size(); ++i) {
-            if (all[i].msg == msg && (ext1 == -1 || all[i].ext1 == ext1))
-                return static_cast<int>(i);
-        }
-        return -1;
+        const auto it = std::ranges::find_if(all, matching(msg, ext1));
+        return it == all.end() ? -1 : static_cast<int>(it - all.begin());
     }
     // The same, once it has come.
     int waitFor(int msg) {
@@ -57,18 +58,9 @@ public:
         return found;
     }
     int count(int msg, int ext1 = -1) {
-        int n = 0;
-        for (const Note& note : snapshot())
-            n += note.msg == msg && (ext1 == -1 || note.ext1 == ext1);
-        return n;
+        return static_cast<int>(std::ranges::count_if(snapshot(), matching(msg, ext1)));
     }
 };
-
-int position(const sp<MediaPlayer>& player) {
-    int ms = -1;
-    EXPECT_EQ(player->getCurrentPosition(&ms), android::OK);
-    return ms;
-}
 
 class MediaPlayerTest : public ::testing::Test {
 protected:
@@ -134,8 +126,10 @@ TEST_P(MediaPlayerPlaybackTest, PreparesPlaysToTheEndAndNotifiesInOrder) {
     }
     EXPECT_EQ(mListener->count(android::MEDIA_SET_VIDEO_SIZE), 1);
     EXPECT_EQ(mListener->count(android::MEDIA_ERROR), 0);
+    int positionMs = -1;
+    EXPECT_EQ(mPlayer->getCurrentPosition(&positionMs), android::OK);
     if (c.intact) {
-        EXPECT_NEAR(position(mPlayer), durationMs, 100);
+        EXPECT_NEAR(positionMs, durationMs, 100);
     }
     for (const Note& note : mListener->snapshot())
         EXPECT_EQ(note.thread, "MediaPlayerCB") << "message " << note.msg;

@@ -27,9 +27,7 @@ using android::MediaPlayer;
 using android::sp;
 
 struct Note {
-    int msg;
-    int ext1;
-    int ext2;
+    int msg, ext1, ext2;
     std::string thread;
 };
 
@@ -86,9 +84,8 @@ MediaTestFiles* MediaPlayerTest::sFiles = nullptr;
 struct PlaybackCase {
     const char* name;
     std::string (MediaTestFiles::*file)() const;
-    int width;  // 0: no video
-    int height;
-    bool intact;  // the whole file is there: its duration is the encoded one
+    int width, height;  // 0: no video
+    bool intact;        // the whole file is there: its duration is the encoded one
 };
 
 class MediaPlayerPlaybackTest : public MediaPlayerTest,
@@ -144,31 +141,26 @@ INSTANTIATE_TEST_SUITE_P(
     [](const auto& info) { return std::string(info.param.name); });
 
 // A server that accepts the connection and never answers: prepare waits on it.
-class SilentServer {
-public:
+struct SilentServer {
     SilentServer() {
-        mListen = socket(AF_INET, SOCK_STREAM, 0);
         sockaddr_in addr{};
         addr.sin_family = AF_INET;
         addr.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
         socklen_t len = sizeof addr;
-        bind(mListen, reinterpret_cast<sockaddr*>(&addr), len);
-        listen(mListen, 4);
-        getsockname(mListen, reinterpret_cast<sockaddr*>(&addr), &len);
-        mUrl = "http://127.0.0.1:" + std::to_string(ntohs(addr.sin_port)) + "/a.mp4";
+        bind(listenFd, reinterpret_cast<sockaddr*>(&addr), len);
+        listen(listenFd, 4);
+        getsockname(listenFd, reinterpret_cast<sockaddr*>(&addr), &len);
+        url = "http://127.0.0.1:" + std::to_string(ntohs(addr.sin_port)) + "/a.mp4";
     }
     ~SilentServer() {
-        if (mClient >= 0)
-            close(mClient);
-        close(mListen);
+        if (client >= 0)
+            close(client);
+        close(listenFd);
     }
-    void acceptOne() { mClient = accept(mListen, nullptr, nullptr); }
-    const std::string& url() const { return mUrl; }
-
-private:
-    int mListen = -1;
-    int mClient = -1;
-    std::string mUrl;
+    void acceptOne() { client = accept(listenFd, nullptr, nullptr); }
+    int listenFd = socket(AF_INET, SOCK_STREAM, 0);
+    int client = -1;
+    std::string url;
 };
 
 class MediaPlayerInterruptTest : public MediaPlayerTest,
@@ -178,7 +170,7 @@ TEST_P(MediaPlayerInterruptTest, StopOrDisconnectEndsAPrepareThatWaitsOnTheNetwo
     const bool disconnect = GetParam();
     TraceCapture trace;
     SilentServer server;
-    open(server.url());
+    open(server.url);
     auto prepared = std::async(std::launch::async, [&] { return mPlayer->prepare(); });
     server.acceptOne();  // the player is connected and waiting for an answer
     if (disconnect)

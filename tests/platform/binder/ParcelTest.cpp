@@ -14,10 +14,6 @@ namespace {
 
 using TavoPlayer::test::PrintTo;
 
-std::vector<uint8_t> bytesOf(const Parcel& p) {
-    return std::vector<uint8_t>(p.data(), p.data() + p.dataSize());
-}
-
 // The exact bytes each writer produces: the layout a client in another language
 // builds by hand, so a change here breaks compatibility. Reading them back is what
 // every call of the service protocol test does.
@@ -41,7 +37,7 @@ TEST(ParcelEncodingTest, BytesOnTheWire) {
         0,    0,    0x40, 0,                          // strict-mode word of a token
         1,    0,    0,    0,    'T',  0,    0,    0,  // descriptor "T"
     };
-    EXPECT_EQ(expected, bytesOf(p));
+    EXPECT_EQ(expected, std::vector<uint8_t>(p.data(), p.data() + p.dataSize()));
 }
 
 // Every read on short or damaged data: an error status, the position unchanged, and

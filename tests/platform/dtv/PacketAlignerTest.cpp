@@ -47,8 +47,7 @@ INSTANTIATE_TEST_SUITE_P(Pieces, PacketAlignerPieces,
 // whole come out, the broken ones do not.
 struct Fault {
     const char* name;
-    size_t at;
-    size_t erase;
+    size_t at, erase;
     std::vector<uint8_t> insert;
     size_t expectedPackets;  // of the 60 in the clean stream
     int finishDropped = -1;  // bytes finish() reports, where checked

@@ -48,9 +48,8 @@ struct EventLog : Recorded<int> {
     static void callback(int event, void* userData) {
         static_cast<EventLog*>(userData)->push(event);
     }
-    bool waitFor(int event, std::chrono::milliseconds deadline = kDeadline) const {
-        return Recorded::waitFor([&](auto& all) { return std::ranges::count(all, event) > 0; },
-                                 deadline);
+    bool waitFor(int event) const {
+        return Recorded::waitFor([&](auto& all) { return std::ranges::count(all, event) > 0; });
     }
 };
 
@@ -404,7 +403,7 @@ TEST_F(RecordingServiceTest, BadInputGivesTheDesignedFailure) {
              const uint32_t duration = details != nullptr ? details->playbackDuration : 0;
              const int handle = DemuxBinder_StartFiltering(kVideo, kDemuxFilterVideo);
              const size_t got = readFor(handle, 300ms).size();
-             e.waitFor(kClipEventEnd, 5s);
+             e.waitFor(kClipEventEnd);
              DemuxBinder_StopFiltering(handle);
              // 100 whole packets, 40 ms of PCR each.
              return got == 100 && duration == 99 * 40 ? 1 : 0;

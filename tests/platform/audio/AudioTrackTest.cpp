@@ -1,9 +1,10 @@
 #include <gtest/gtest.h>
-#include <stdlib.h>
 #include <unistd.h>
 
+#include <chrono>
 #include <cstdint>
 #include <fstream>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -15,23 +16,14 @@
 namespace android {
 namespace {
 
+using TavoPlayer::test::ScopedEnv;
+
 // A scratch folder and the audio properties, set through the environment so that
 // the machine's property file plays no part.
 class AudioPlatformTest : public ::testing::Test {
 protected:
-    void SetUp() override {
-        ASSERT_FALSE(mDir.path().empty());
-        setenv("TAVOPLAYER_PROPERTIES", (mDir / "none.prop").c_str(), 1);
-        setenv("TAVOPLAYER_PROP_tavoplayer_audio_log", (mDir / "audio.log").c_str(), 1);
-    }
-    void TearDown() override {
-        for (const char* name : {"TAVOPLAYER_PROPERTIES", "TAVOPLAYER_PROP_tavoplayer_audio_log",
-                                 "TAVOPLAYER_PROP_tavoplayer_audio_sink",
-                                 "TAVOPLAYER_PROP_tavoplayer_audio_devices", "ALSA_CONFIG_PATH"})
-            unsetenv(name);
-    }
-    static void setSink(const std::string& sink) {
-        setenv("TAVOPLAYER_PROP_tavoplayer_audio_sink", sink.c_str(), 1);
+    void setSink(const std::string& sink) {
+        mSink.emplace("TAVOPLAYER_PROP_tavoplayer_audio_sink", sink);
     }
     // (leave ns, bytes) per logged write.
     std::vector<std::pair<int64_t, size_t>> logLines() const {
@@ -54,17 +46,19 @@ protected:
                               AUDIO_CHANNEL_OUT_STEREO);
     }
     TavoPlayer::test::TempDir mDir{"tavo-audio"};
+    ScopedEnv mProperties{"TAVOPLAYER_PROPERTIES", mDir / "none.prop"};
+    ScopedEnv mLog{"TAVOPLAYER_PROP_tavoplayer_audio_log", mDir / "audio.log"};
+    std::optional<ScopedEnv> mSink;
 };
 
 TEST_F(AudioPlatformTest, CreationParametersDecideTheInitStatus) {
-    struct Case {
+    const struct {
         const char* sink;
         uint32_t rate;
         audio_format_t format;
         audio_channel_mask_t mask;
         status_t expected;
-    };
-    const Case cases[] = {
+    } cases[] = {
         {"null", 48000, AUDIO_FORMAT_DEFAULT, 0x3, NO_ERROR},
         {"null", 32000, AUDIO_FORMAT_PCM_16_BIT, 0x63F, NO_ERROR},  // eight channels
         {"null", 0, AUDIO_FORMAT_DEFAULT, 0x3, BAD_VALUE},
@@ -73,7 +67,7 @@ TEST_F(AudioPlatformTest, CreationParametersDecideTheInitStatus) {
         {"bogus", 48000, AUDIO_FORMAT_DEFAULT, 0x3, NO_INIT},
         {"alsa:tavo_no_such_device", 48000, AUDIO_FORMAT_DEFAULT, 0x3, NO_INIT},
     };
-    for (const Case& c : cases) {
+    for (const auto& c : cases) {
         SCOPED_TRACE(std::string(c.sink) + " " + std::to_string(c.rate) + " mask " +
                      std::to_string(c.mask));
         setSink(c.sink);
@@ -127,9 +121,9 @@ TEST_F(AudioPlatformTest, PacedSinksReportWhenEachWriteLeavesTheDevice) {
         ASSERT_EQ(NO_ERROR, track->start());
         EXPECT_EQ(AudioTrack::kSimulatedLatencyMs, track->latency());
         const std::vector<uint8_t> pcm = pattern(1920, 0);  // 10 ms
-        timespec before{};
-        clock_gettime(CLOCK_MONOTONIC, &before);
-        const int64_t beforeNs = before.tv_sec * 1'000'000'000ll + before.tv_nsec;
+        // The log's times are on the monotonic clock, which steady_clock reads.
+        const int64_t beforeNs =
+            std::chrono::nanoseconds(std::chrono::steady_clock::now().time_since_epoch()).count();
         for (int i = 0; i < 3; ++i)
             ASSERT_EQ(1920, track->write(pcm.data(), pcm.size()));
         AudioTimestamp ts{};
@@ -156,8 +150,8 @@ TEST_F(AudioPlatformTest, AlsaSinkDeliversThePcmInOrderThroughTheFilePlugin) {
     std::ofstream(conf) << "pcm.tavo_test_file {\n  type file\n  slave.pcm \"null\"\n  file \""
                         << raw << "\"\n  format \"raw\"\n}\n";
     const std::string global = "/usr/share/alsa/alsa.conf";
-    setenv("ALSA_CONFIG_PATH",
-           (access(global.c_str(), R_OK) == 0 ? global + ":" + conf : conf).c_str(), 1);
+    const ScopedEnv alsa("ALSA_CONFIG_PATH",
+                         access(global.c_str(), R_OK) == 0 ? global + ":" + conf : conf);
     setSink("alsa:tavo_test_file");
     std::vector<uint8_t> written;
     {
@@ -191,7 +185,7 @@ TEST_F(AudioPlatformTest, DeviceConnectionStatesFollowThePropertyOnEveryQuery) {
         {"junk 0x10", AUDIO_DEVICE_OUT_BLUETOOTH_SCO, true},
     };
     for (const auto& c : cases) {
-        setenv("TAVOPLAYER_PROP_tavoplayer_audio_devices", c.devices, 1);
+        const ScopedEnv devices("TAVOPLAYER_PROP_tavoplayer_audio_devices", c.devices);
         EXPECT_EQ(c.connected ? AUDIO_POLICY_DEVICE_STATE_AVAILABLE
                               : AUDIO_POLICY_DEVICE_STATE_UNAVAILABLE,
                   AudioSystem::getDeviceConnectionState(c.device, ""))

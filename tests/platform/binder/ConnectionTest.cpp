@@ -81,7 +81,7 @@ protected:
     sp<IBinder> proxy;
 };
 
-TEST_F(ConnectionTest, ObjectsAndDescriptorsCrossAndComeBackAsThemselves) {
+TEST_F(ConnectionTest, ObjectsAndDescriptorsCrossComeBackAsThemselvesAndCallBack) {
     sp<IBinder> mine = new Echo();
     int pipeFds[2];
     ASSERT_EQ(0, pipe(pipeFds));
@@ -99,14 +99,12 @@ TEST_F(ConnectionTest, ObjectsAndDescriptorsCrossAndComeBackAsThemselves) {
     EXPECT_EQ('Z', reply.readInt32());
     EXPECT_EQ(getpid(), service->callerPid);
     EXPECT_EQ(getuid(), service->callerUid);
-}
 
-TEST_F(ConnectionTest, NestedCallBackWhileTheCallerWaits) {
-    sp<IBinder> mine = new Echo();
-    Parcel data, reply;
-    data.writeStrongBinder(mine);
-    ASSERT_EQ(OK, proxy->transact(Echo::CALL_BACK, data, &reply));
-    EXPECT_EQ(42, reply.readInt32());
+    // The service calls our object, two-way, while this call waits for its answer.
+    Parcel callBack, answer;
+    callBack.writeStrongBinder(mine);
+    ASSERT_EQ(OK, proxy->transact(Echo::CALL_BACK, callBack, &answer));
+    EXPECT_EQ(42, answer.readInt32());
 }
 
 TEST_F(ConnectionTest, HangUpFailsCallsAndTellsDeathRecipients) {

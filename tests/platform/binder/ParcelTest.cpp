@@ -14,10 +14,6 @@ namespace {
 
 using TavoPlayer::test::PrintTo;
 
-std::vector<uint8_t> bytesOf(const Parcel& p) {
-    return std::vector<uint8_t>(p.data(), p.data() + p.dataSize());
-}
-
 // The exact bytes each writer produces: the layout a client in another language
 // builds by hand, so a change here breaks compatibility. Reading them back is what
 // every call of the service protocol test does.
@@ -41,7 +37,7 @@ TEST(ParcelEncodingTest, BytesOnTheWire) {
         0,    0,    0x40, 0,                          // strict-mode word of a token
         1,    0,    0,    0,    'T',  0,    0,    0,  // descriptor "T"
     };
-    EXPECT_EQ(expected, bytesOf(p));
+    EXPECT_EQ(expected, std::vector<uint8_t>(p.data(), p.data() + p.dataSize()));
 }
 
 // Every read on short or damaged data: an error status, the position unchanged, and
@@ -89,26 +85,21 @@ const auto token = [](const Parcel& p) {
     return p.enforceInterface(String16("TavoPlayer")) ? OK : BAD_VALUE;
 };
 
-INSTANTIATE_TEST_SUITE_P(
-    Reads, ParcelShortReadTest,
-    ::testing::Values(
-        ShortReadCase{"int32_of_3_bytes", {1, 2, 3}, readI32, NOT_ENOUGH_DATA},
-        ShortReadCase{"string16_units_missing", {5, 0, 0, 0, 'a', 0}, readS16, NOT_ENOUGH_DATA},
-        ShortReadCase{"string16_length_huge",
-                      {0xff, 0xff, 0xff, 0x7f, 'a', 0, 0, 0},
-                      readS16,
-                      NOT_ENOUGH_DATA},
-        ShortReadCase{"string16_negative_length", {0xfe, 0xff, 0xff, 0xff}, readS16, BAD_VALUE},
-        ShortReadCase{
-            "string16_without_terminator", {1, 0, 0, 0, 'a', 0, 'b', 0}, readS16, NOT_ENOUGH_DATA},
-        ShortReadCase{
-            "string8_bytes_missing", {9, 0, 0, 0, 'a', 'b', 'c', 'd'}, readS8, NOT_ENOUGH_DATA},
-        ShortReadCase{"binder_from_plain_data", std::vector<uint8_t>(24, 0), readBinder, BAD_TYPE},
-        ShortReadCase{"binder_past_end", {0x85, 0x2a, 0x62, 0x73}, readBinder, NOT_ENOUGH_DATA},
-        ShortReadCase{"fd_from_plain_data", std::vector<uint8_t>(24, 0), readFd, BAD_TYPE},
-        ShortReadCase{"raw_bytes_past_end", {1, 2, 3, 4}, readBytes, NOT_ENOUGH_DATA},
-        ShortReadCase{"token_without_descriptor", {0, 0, 0x40, 0}, token, BAD_VALUE}),
-    [](const ::testing::TestParamInfo<ShortReadCase>& info) { return info.param.name; });
+const ShortReadCase kShortReads[] = {
+    {"int32_of_3_bytes", {1, 2, 3}, readI32, NOT_ENOUGH_DATA},
+    {"string16_units_missing", {5, 0, 0, 0, 'a', 0}, readS16, NOT_ENOUGH_DATA},
+    {"string16_length_huge", {0xff, 0xff, 0xff, 0x7f, 'a', 0, 0, 0}, readS16, NOT_ENOUGH_DATA},
+    {"string16_negative_length", {0xfe, 0xff, 0xff, 0xff}, readS16, BAD_VALUE},
+    {"string16_without_terminator", {1, 0, 0, 0, 'a', 0, 'b', 0}, readS16, NOT_ENOUGH_DATA},
+    {"string8_bytes_missing", {9, 0, 0, 0, 'a', 'b', 'c', 'd'}, readS8, NOT_ENOUGH_DATA},
+    {"binder_from_plain_data", std::vector<uint8_t>(24, 0), readBinder, BAD_TYPE},
+    {"binder_past_end", {0x85, 0x2a, 0x62, 0x73}, readBinder, NOT_ENOUGH_DATA},
+    {"fd_from_plain_data", std::vector<uint8_t>(24, 0), readFd, BAD_TYPE},
+    {"raw_bytes_past_end", {1, 2, 3, 4}, readBytes, NOT_ENOUGH_DATA},
+    {"token_without_descriptor", {0, 0, 0x40, 0}, token, BAD_VALUE},
+};
+INSTANTIATE_TEST_SUITE_P(Reads, ParcelShortReadTest, ::testing::ValuesIn(kShortReads),
+                         [](const auto& info) { return info.param.name; });
 
 // Objects are recognised only where they were written.
 TEST(ParcelObjectTest, BindersAndDescriptorsReadBackAtTheirOffsets) {

@@ -10,28 +10,21 @@ namespace {
 
 using test::PrintTo;
 
-using test::buildStream;
-using test::StreamPlan;
-
-std::vector<uint8_t> cleanStream(size_t rounds = 20) {
-    StreamPlan plan;
-    plan.pids = {0x100, 0x101, 0x47};  // a PID whose low byte is the sync byte
-    plan.rounds = rounds;
-    return buildStream(plan);
+// 60 packets, of a PID whose low byte is the sync byte among them.
+std::vector<uint8_t> cleanStream() {
+    return test::buildStream({.pids = {0x100, 0x101, 0x47}, .rounds = 20});
 }
 
-// Feeds `bytes` in pieces of `piece` bytes (0: all at once) and finishes.
+// Feeds `bytes` in pieces of `piece` bytes (0: all at once) and finishes, setting
+// `dropped` to the bytes finish() reports.
 std::vector<uint8_t> align(PacketAligner& aligner, const std::vector<uint8_t>& bytes, size_t piece,
-                           size_t* dropped = nullptr) {
+                           size_t& dropped) {
     std::vector<uint8_t> out;
     if (piece == 0)
         piece = bytes.size();
-    for (size_t at = 0; at < bytes.size(); at += piece) {
+    for (size_t at = 0; at < bytes.size(); at += piece)
         aligner.push(bytes.data() + at, std::min(piece, bytes.size() - at), out);
-    }
-    const size_t d = aligner.finish(out);
-    if (dropped != nullptr)
-        *dropped = d;
+    dropped = aligner.finish(out);
     return out;
 }
 
@@ -41,7 +34,7 @@ TEST_P(PacketAlignerPieces, CleanStreamComesOutUnchangedWhateverThePieceSize) {
     const std::vector<uint8_t> stream = cleanStream();
     PacketAligner aligner;
     size_t dropped = 99;
-    EXPECT_EQ(align(aligner, stream, GetParam(), &dropped), stream);
+    EXPECT_EQ(align(aligner, stream, GetParam(), dropped), stream);
     EXPECT_EQ(dropped, 0u);
     EXPECT_EQ(aligner.syncLosses(), 0u);
     EXPECT_EQ(aligner.bytesSkipped(), 0u);
@@ -54,8 +47,7 @@ INSTANTIATE_TEST_SUITE_P(Pieces, PacketAlignerPieces,
 // whole come out, the broken ones do not.
 struct Fault {
     const char* name;
-    size_t at;
-    size_t erase;
+    size_t at, erase;
     std::vector<uint8_t> insert;
     size_t expectedPackets;  // of the 60 in the clean stream
     int finishDropped = -1;  // bytes finish() reports, where checked
@@ -72,7 +64,7 @@ TEST_P(PacketAlignerFaults, RecoversAndDeliversOnlyWholePackets) {
     for (size_t piece : {size_t{1}, size_t{100}, size_t{0}}) {
         PacketAligner aligner;
         size_t dropped = 0;
-        const std::vector<uint8_t> out = align(aligner, damaged, piece, &dropped);
+        const std::vector<uint8_t> out = align(aligner, damaged, piece, dropped);
         ASSERT_EQ(out.size() % 188, 0u);
         EXPECT_EQ(out.size() / 188, f.expectedPackets) << "piece " << piece;
         if (f.finishDropped >= 0) {

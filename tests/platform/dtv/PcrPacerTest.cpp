@@ -47,113 +47,105 @@ TEST(PcrPacerReadPcr, ReadsBaseAndExtensionOnlyWhereTheFlagsSayThereIsOne) {
     }
 }
 
-// Pushes packets and records, for each one taken, the time at which it was due.
+// Pushes packets at `now` and reads the pacer's times relative to it.
 class PcrPacerTest : public ::testing::Test {
 protected:
     void push(const TsPacket& packet) { pacer.push(packet.data(), now); }
+    void pushPlain(size_t count) {
+        for (size_t i = 0; i < count; ++i)
+            push(plainPacket(0x101, static_cast<uint8_t>(i)));
+    }
+    // Takes what is due `ms` after now; returns how many packets that was.
+    size_t takeDue(int64_t ms) { return pacer.takeDue(now + ms * kMs, out); }
+    // When the oldest held packet is due, in ns after now; -1 while it has no time.
+    int64_t nextDue() const { return pacer.nextKnown() ? pacer.nextDueNs() - now : -1; }
     PcrPacer pacer;
     int64_t now = 5'000 * kMs;
+    std::vector<uint8_t> out;
 };
 
 TEST_F(PcrPacerTest, PacketsBetweenTwoPcrsAreSpreadEvenlyBetweenTheirTimes) {
     push(pcrPacket(0x100, 90000));  // anchors now
-    for (int i = 0; i < 3; ++i)
-        push(plainPacket(0x101, static_cast<uint8_t>(i)));
+    pushPlain(3);
     // Nothing after the first PCR is timed until the next PCR arrives.
-    std::vector<uint8_t> out;
-    EXPECT_EQ(pacer.takeDue(now + 10'000 * kMs, out), 1u);
-    EXPECT_FALSE(pacer.nextKnown());
+    EXPECT_EQ(takeDue(10'000), 1u);
+    EXPECT_EQ(nextDue(), -1);
     push(pcrPacket(0x100, 90000 + 3600));  // 40 ms later in stream time
-    ASSERT_TRUE(pacer.nextKnown());
-    EXPECT_EQ(pacer.takeDue(now + 10 * kMs, out), 1u);
-    EXPECT_EQ(pacer.nextDueNs(), now + 20 * kMs);
-    EXPECT_EQ(pacer.takeDue(now + 39 * kMs, out), 2u);
-    EXPECT_EQ(pacer.nextDueNs(), now + 40 * kMs);  // the second PCR packet itself
-    EXPECT_EQ(pacer.takeDue(now + 40 * kMs, out), 1u);
+    EXPECT_EQ(takeDue(10), 1u);
+    EXPECT_EQ(nextDue(), 20 * kMs);
+    EXPECT_EQ(takeDue(39), 2u);
+    EXPECT_EQ(nextDue(), 40 * kMs);  // the second PCR packet itself
+    EXPECT_EQ(takeDue(40), 1u);
     EXPECT_EQ(out.size(), 5u * 188);
 }
 
 // Packets before the first PCR are due at once; only the first PCR PID drives the
 // clock.
 TEST_F(PcrPacerTest, FirstPcrPidAnchorsAndDrivesTheClock) {
-    push(plainPacket(0x101, 1));
-    push(plainPacket(0x101, 2));
-    EXPECT_FALSE(pacer.nextKnown());
+    pushPlain(2);
+    EXPECT_EQ(nextDue(), -1);
     push(pcrPacket(0x100, 0));
     push(pcrPacket(0x200, 9'000'000));  // another programme's clock: ignored
     push(pcrPacket(0x100, 900));        // 10 ms
-    std::vector<uint8_t> out;
-    EXPECT_EQ(pacer.takeDue(now, out), 3u);
-    EXPECT_EQ(pacer.nextDueNs(), now + 5 * kMs);
+    EXPECT_EQ(takeDue(0), 3u);
+    EXPECT_EQ(nextDue(), 5 * kMs);
 }
 
 // A steady 40 ms segment of 4 packets establishes 10 ms per packet; then a second
 // segment of 4 ends in a PCR that jumps, or not. A discontinuity re-anchors at the
-// last rate, without stall or burst.
-TEST(PcrPacerJumps, DiscontinuityReanchorsWithoutStallOrBurst) {
+// last rate, without stall or burst: the second segment's PCR packet is due 80 ms on.
+TEST_F(PcrPacerTest, DiscontinuityReanchorsWithoutStallOrBurst) {
     const struct {
         const char* name;
         uint64_t firstBase, secondBase;
         bool indicator, discontinuity;
-        int64_t secondDueMs;  // from the anchor
     } cases[] = {
-        // In step: the next 40 ms.
-        {"steady", 90000, 90000 + 7200, false, false, 80},
+        {"steady", 90000, 90000 + 7200, false, false},
         // The 33-bit base wraps inside the segment: still 40 ms, no discontinuity.
-        {"wrap of 33 bits", (1ull << 33) - 5400, 1800, false, false, 80},
+        {"wrap of 33 bits", (1ull << 33) - 5400, 1800, false, false},
         // Backwards (a loop to the start of a file): continue at the last rate.
-        {"backwards", 900000, 1000, false, true, 80},
+        {"backwards", 900000, 1000, false, true},
         // Twenty seconds ahead: a new time base, not a silence to wait out.
-        {"far ahead", 90000, 90000 + 1800000, false, true, 80},
+        {"far ahead", 90000, 90000 + 1800000, false, true},
         // The discontinuity_indicator says so even for a plausible step.
-        {"indicator", 90000, 90000 + 7200, true, true, 80},
+        {"indicator", 90000, 90000 + 7200, true, true},
     };
     for (const auto& c : cases) {
         SCOPED_TRACE(c.name);
-        PcrPacer pacer;
-        const int64_t now = 1'000 * kMs;
-        pacer.push(pcrPacket(0x100, c.firstBase).data(), now);
-        for (int i = 0; i < 3; ++i)
-            pacer.push(plainPacket(0x101, 0).data(), now);
-        pacer.push(pcrPacket(0x100, (c.firstBase + 3600) % (1ull << 33)).data(), now);
-        for (int i = 0; i < 3; ++i)
-            pacer.push(plainPacket(0x101, 0).data(), now);
-        pacer.push(pcrPacket(0x100, c.secondBase, 0, c.indicator).data(), now);
-        std::vector<uint8_t> out;
-        pacer.takeDue(now + 40 * kMs, out);
-        ASSERT_TRUE(pacer.nextKnown());
+        pacer = PcrPacer();
+        push(pcrPacket(0x100, c.firstBase));
+        pushPlain(3);
+        push(pcrPacket(0x100, (c.firstBase + 3600) % (1ull << 33)));
+        pushPlain(3);
+        push(pcrPacket(0x100, c.secondBase, 0, c.indicator));
+        takeDue(40);
         EXPECT_EQ(pacer.discontinuities(), c.discontinuity ? 1u : 0u);
         // The three packets in between and the new PCR packet:
-        EXPECT_EQ(pacer.nextDueNs(), now + 50 * kMs);
-        pacer.takeDue(now + 79 * kMs, out);
-        EXPECT_EQ(pacer.nextDueNs(), now + c.secondDueMs * kMs);
+        EXPECT_EQ(nextDue(), 50 * kMs);
+        takeDue(79);
+        EXPECT_EQ(nextDue(), 80 * kMs);
     }
 }
 
 TEST_F(PcrPacerTest, EndOfStreamTimesTheTailAtTheLastRateAndReanchorsTheNextPass) {
     push(pcrPacket(0x100, 0));
-    push(plainPacket(0x101, 0));
+    pushPlain(1);
     push(pcrPacket(0x100, 1800));  // 20 ms for 2 packets: 10 ms each
-    push(plainPacket(0x101, 0));
-    push(plainPacket(0x101, 0));
+    pushPlain(2);
     pacer.endOfStream(now);
-    std::vector<uint8_t> out;
-    EXPECT_EQ(pacer.takeDue(now + 20 * kMs, out), 3u);
-    EXPECT_EQ(pacer.nextDueNs(), now + 30 * kMs);
-    EXPECT_EQ(pacer.takeDue(now + 40 * kMs, out), 2u);
+    EXPECT_EQ(takeDue(20), 3u);
+    EXPECT_EQ(nextDue(), 30 * kMs);
+    EXPECT_EQ(takeDue(40), 2u);
     // The same file again: its first PCR (0) continues the time line.
     push(pcrPacket(0x100, 0));
     EXPECT_EQ(pacer.discontinuities(), 1u);
-    ASSERT_TRUE(pacer.nextKnown());
-    EXPECT_EQ(pacer.nextDueNs(), now + 50 * kMs);
+    EXPECT_EQ(nextDue(), 50 * kMs);
 }
 
 TEST_F(PcrPacerTest, StreamWithoutPcrIsNotHeldForever) {
-    for (size_t i = 0; i < PcrPacer::kMaxUntimedPackets; ++i)
-        push(plainPacket(0x101, 0));
-    ASSERT_TRUE(pacer.nextKnown());
-    std::vector<uint8_t> out;
-    EXPECT_EQ(pacer.takeDue(now, out), PcrPacer::kMaxUntimedPackets);
+    pushPlain(PcrPacer::kMaxUntimedPackets);
+    EXPECT_NE(nextDue(), -1);
+    EXPECT_EQ(takeDue(0), PcrPacer::kMaxUntimedPackets);
     EXPECT_EQ(pacer.heldPackets(), 0u);
 }
 
@@ -161,10 +153,8 @@ TEST_F(PcrPacerTest, TimeLineFarBehindTheClockMovesToNow) {
     push(pcrPacket(0x100, 0));
     now += 10'000 * kMs;  // the reader stalled for ten seconds
     push(pcrPacket(0x100, 900));
-    std::vector<uint8_t> out;
-    pacer.takeDue(now - 10'000 * kMs, out);
-    ASSERT_TRUE(pacer.nextKnown());
-    EXPECT_EQ(pacer.nextDueNs(), now);
+    takeDue(-10'000);
+    EXPECT_EQ(nextDue(), 0);
 }
 
 }  // namespace

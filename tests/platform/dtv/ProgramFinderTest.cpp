@@ -32,8 +32,11 @@ TEST(ProgramFinderTest, ReadsBackTheTablesTheWriterMadeForTheRecordedPids) {
     EXPECT_NE(packets[3] & 0x0F, packets[writer.packetsPerRepetition() * 188 + 3] & 0x0F);
 
     ProgramFinder finder(0x112);
-    for (size_t i = 0; i < packets.size(); i += 188)
+    ProgramFinder other(0x222);  // a PID no programme carries
+    for (size_t i = 0; i < packets.size(); i += 188) {
         finder.push(&packets[i]);
+        other.push(&packets[i]);
+    }
     ASSERT_TRUE(finder.program().has_value());
     const ProgramInfo& found = *finder.program();
     EXPECT_EQ(found.transportStreamId, 0x5A5);
@@ -45,10 +48,6 @@ TEST(ProgramFinderTest, ReadsBackTheTablesTheWriterMadeForTheRecordedPids) {
         EXPECT_EQ(found.streams[i].descriptors, broadcast.streams[i].descriptors);
     ASSERT_NE(found.captionStream(), nullptr);
     EXPECT_EQ(found.captionStream()->pid, 0x130);
-
-    ProgramFinder other(0x222);  // a PID no programme carries
-    for (size_t i = 0; i < packets.size(); i += 188)
-        other.push(&packets[i]);
     EXPECT_TRUE(other.havePat());
     EXPECT_FALSE(other.program().has_value());
 }

@@ -8,7 +8,8 @@
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
-#include <mutex>
+#include <memory>
+#include <optional>
 #include <string>
 #include <thread>
 #include <vector>
@@ -47,15 +48,10 @@ struct EventLog : Recorded<int> {
     static void callback(int event, void* userData) {
         static_cast<EventLog*>(userData)->push(event);
     }
-    bool waitFor(int event, std::chrono::milliseconds deadline = kDeadline) const {
-        return Recorded::waitFor([&](auto& all) { return std::ranges::count(all, event) > 0; },
-                                 deadline);
+    bool waitFor(int event) const {
+        return Recorded::waitFor([&](auto& all) { return std::ranges::count(all, event) > 0; });
     }
 };
-
-std::vector<TsPacket> packetsOf(const std::vector<uint8_t>& ts, uint16_t pid) {
-    return toPackets(bytesOfPid(ts, pid));
-}
 
 // What ffprobe reads of a file (its codec names unless told), or why it failed.
 std::string probe(const std::string& path, const char* entries = "stream=codec_name") {
@@ -70,6 +66,12 @@ void freeDetails(RecDetails* d) {
     free(d->stationName);
     free(d->prgName);
     free(d);
+}
+using Details = std::unique_ptr<RecDetails, decltype(&freeDetails)>;
+
+// What the clip player's opening of `path` gives; null when the path opens no clip.
+Details clipDetails(const std::string& path) {
+    return {RecPlayerBinder_GetRecClipDetails(path.c_str(), 1), freeDetails};
 }
 
 // Every test has a recordings folder of its own and leaves the service idle.
@@ -88,7 +90,7 @@ protected:
             1);
         EXPECT_EQ(RecPlayerBinder_AnyMoreRecordings(), 1);
         EXPECT_EQ(RecPlayerBinder_StartTSRecorder(), 1);
-        RecDetails* d = RecPlayerBinder_GetCurrTSRecDetails();
+        const Details d(RecPlayerBinder_GetCurrTSRecDetails(), freeDetails);
         EXPECT_NE(d, nullptr);
         if (d == nullptr)
             return 0;
@@ -100,17 +102,24 @@ protected:
         copy.prgName = programme;
         copy.prgNameLength = sizeof programme - 1;
         EXPECT_EQ(RecPlayerBinder_SetCurrTSRecDetails(&copy), 1);
-        const int number = d->fileNumName;
-        freeDetails(d);
+        return d->fileNumName;
+    }
+    // Records the whole of `source`, unpaced, until the demux ends under the
+    // recording; returns the recording's number.
+    int recordWhole(const std::string& source) {
+        ScopedDemuxSource demux("file:" + source + "?pace=none");
+        EventLog events;
+        const int number = record(events);
+        EXPECT_TRUE(events.waitFor(kRecEventDemuxLost));
+        EXPECT_EQ(RecPlayerBinder_StopTSRecorder(), 1);
+        EXPECT_EQ(RecPlayerBinder_DeleteTSRecorder(), 1);
         return number;
     }
     std::string file(int number) const { return dir + "/" + std::to_string(number) + ".ts"; }
-    RecordingCatalog::Entry row(int number) {
+    std::optional<RecordingCatalog::Entry> row(int number) {
         RecordingCatalog catalog(dir);
         EXPECT_EQ(catalog.open(), RecordingCatalog::Status::kOk);
-        auto e = catalog.get(number);
-        EXPECT_TRUE(e.has_value()) << "no row " << number;
-        return e.value_or(RecordingCatalog::Entry());
+        return catalog.get(number);
     }
     ScopedRecordingsDir recordings;
     const std::string dir = recordings.path();
@@ -118,14 +127,8 @@ protected:
 
 TEST_F(RecordingServiceTest, RecordsTheLivePacketsOfItsPidsUnchangedInOrderInAPlayableFile) {
     const std::string& source = tsgenStream(20);
-    ScopedDemuxSource demux("file:" + source + "?pace=none");
-    EventLog events;
-    const int number = record(events);
+    const int number = recordWhole(source);
     ASSERT_GT(number, 0);
-    // The whole file flows; its end is the demux ending under the recording.
-    ASSERT_TRUE(events.waitFor(kRecEventDemuxLost));
-    EXPECT_EQ(RecPlayerBinder_StopTSRecorder(), 1);
-    EXPECT_EQ(RecPlayerBinder_DeleteTSRecorder(), 1);
 
     const std::string path = file(number);
     const std::vector<uint8_t> live = fileBytes(source);
@@ -134,8 +137,8 @@ TEST_F(RecordingServiceTest, RecordsTheLivePacketsOfItsPidsUnchangedInOrderInAPl
     // PID by PID, the recording holds the live packets from the moment it started
     // to the end, unchanged; the PAT and PMT are the recording's own.
     for (uint16_t pid : {kVideo, kAudio, kCaptions}) {
-        const auto want = summary(packetsOf(live, pid));
-        const auto got = summary(packetsOf(recorded, pid));
+        const auto want = summary(toPackets(bytesOfPid(live, pid)));
+        const auto got = summary(toPackets(bytesOfPid(recorded, pid)));
         ASSERT_FALSE(got.empty()) << "PID " << pid;
         const auto start = std::find(want.begin(), want.end(), got.front());
         ASSERT_NE(start, want.end()) << "PID " << pid;
@@ -144,18 +147,18 @@ TEST_F(RecordingServiceTest, RecordsTheLivePacketsOfItsPidsUnchangedInOrderInAPl
             << "PID " << pid;
         EXPECT_EQ(got, std::vector<std::string>(start, want.end())) << "PID " << pid;
     }
-    for (const TsPacket& p : toPackets(recorded)) {
-        const uint16_t pid = pidOf(p.data());
-        ASSERT_TRUE(pid == 0 || pid == 0x1000 || pid == kVideo || pid == kAudio || pid == kCaptions)
-            << "PID " << pid;
-    }
+    std::vector<uint16_t> pids;  // and the recording's own PAT and PMT, and nothing else
+    for (const auto& [pid, packets] : packetsByPid(recorded))
+        pids.push_back(pid);
+    EXPECT_EQ(pids, (std::vector<uint16_t>{0, kVideo, kAudio, kCaptions, 0x1000}));
     EXPECT_EQ(pidOf(recorded.data()), 0) << "the file starts with its PAT";
 
     EXPECT_NE(probe(path).find("h264\naac_latm\narib_caption\n"), std::string::npos) << probe(path);
 
     // The names, state, size and duration are checked where a clip is opened, killed or
     // cut short; the caption PID is what the clip's playback takes from here.
-    EXPECT_EQ(row(number).captionPid, kCaptions);
+    ASSERT_TRUE(row(number).has_value());
+    EXPECT_EQ(row(number)->captionPid, kCaptions);
     RecordingCatalog catalog(dir);
     ASSERT_EQ(catalog.open(), RecordingCatalog::Status::kOk);
     const auto index = catalog.loadIndex(number);
@@ -177,9 +180,7 @@ TEST_F(RecordingServiceTest, CancelLeavesNoFileAndNoRow) {
     EXPECT_EQ(RecPlayerBinder_CancelTSRecorder(), 1);
     EXPECT_EQ(RecPlayerBinder_DeleteTSRecorder(), 1);
     EXPECT_FALSE(fs::exists(file(number)));
-    RecordingCatalog catalog(dir);
-    ASSERT_EQ(catalog.open(), RecordingCatalog::Status::kOk);
-    EXPECT_FALSE(catalog.get(number).has_value());
+    EXPECT_FALSE(row(number).has_value());
 }
 
 // A recording in a child process of its own, started from a demux source. The shell
@@ -225,11 +226,13 @@ TEST_F(RecordingServiceTest, AKilledRecordingLeavesAPlayableFileMarkedIncomplete
     child.killNow();
 
     const auto e = row(number);  // as the next start of the service opens the catalog
-    EXPECT_EQ(e.state, RecordingCatalog::kIncomplete);
-    EXPECT_EQ(e.sizeBytes, fs::file_size(path));
+    ASSERT_TRUE(e.has_value());
+    EXPECT_EQ(e->state, RecordingCatalog::kIncomplete);
+    EXPECT_EQ(e->sizeBytes, fs::file_size(path));
     EXPECT_EQ(fs::file_size(path) % 188, 0u);
-    EXPECT_GT(e.playbackDuration, 1000u);
-    EXPECT_NEAR(std::atof(probe(path, "format=duration").c_str()) * 1000, e.playbackDuration, 1000);
+    EXPECT_GT(e->playbackDuration, 1000u);
+    EXPECT_NEAR(std::atof(probe(path, "format=duration").c_str()) * 1000, e->playbackDuration,
+                1000);
 }
 
 TEST_F(RecordingServiceTest, AFullDiskStopsTheRecordingCleanlyWithItsEvent) {
@@ -244,8 +247,9 @@ TEST_F(RecordingServiceTest, AFullDiskStopsTheRecordingCleanlyWithItsEvent) {
     EXPECT_LE(fs::file_size(path), kLimit);
     EXPECT_EQ(fs::file_size(path) % 188, 0u);
     const auto e = row(number);
-    EXPECT_EQ(e.state, RecordingCatalog::kComplete);
-    EXPECT_EQ(e.sizeBytes, fs::file_size(path));
+    ASSERT_TRUE(e.has_value());
+    EXPECT_EQ(e->state, RecordingCatalog::kComplete);
+    EXPECT_EQ(e->sizeBytes, fs::file_size(path));
     EXPECT_NE(probe(path).find("h264"), std::string::npos);
 }
 
@@ -269,17 +273,9 @@ int64_t firstPcrMs(int handle, uint64_t clipFirstPcr) {
 // A 40-second recording, played back. Pausing is run end to end by the service's
 // tests; here, where each reposition lands.
 TEST_F(RecordingServiceTest, AClipRepositionsWhileFilteringOrStoppedAndReportsItsEnd) {
-    int number = 0;
-    {
-        ScopedDemuxSource demux("file:" + tsgenStream(40) + "?pace=none");
-        EventLog recorder;
-        number = record(recorder);
-        ASSERT_GT(number, 0);
-        ASSERT_TRUE(recorder.waitFor(kRecEventDemuxLost));
-        ASSERT_EQ(RecPlayerBinder_StopTSRecorder(), 1);
-        ASSERT_EQ(RecPlayerBinder_DeleteTSRecorder(), 1);
-    }
-    const std::vector<TsPacket> video = packetsOf(fileBytes(file(number)), kVideo);
+    const int number = recordWhole(tsgenStream(40));
+    ASSERT_GT(number, 0);
+    const std::vector<TsPacket> video = toPackets(bytesOfPid(fileBytes(file(number)), kVideo));
     const TsFile recorded(concatPackets(video));
     const auto withPcr = std::ranges::find_if(recorded.packets, &ParsedPacket::hasPcr);
     ASSERT_NE(withPcr, recorded.packets.end());
@@ -288,17 +284,14 @@ TEST_F(RecordingServiceTest, AClipRepositionsWhileFilteringOrStoppedAndReportsIt
     ASSERT_EQ(RecPlayerBinder_IsTSPlayerActive(EventLog::callback, &events), 1);
     auto open = [&] {
         // As the URI parser leaves a FILE path: without its last character.
-        RecDetails* d = RecPlayerBinder_GetRecClipDetails(
-            (dir + "/" + std::to_string(number) + ".t").c_str(), 1);
+        const Details d = clipDetails(dir + "/" + std::to_string(number) + ".t");
         EXPECT_NE(d, nullptr);
-        const int duration = d != nullptr ? static_cast<int>(d->playbackDuration) : 0;
-        if (d != nullptr) {
-            EXPECT_EQ(d->fileNumName, number);
-            EXPECT_STREQ(d->stationName, "TV Tavo");
-            EXPECT_STREQ(d->prgName, "News");
-        }
-        freeDetails(d);
-        return duration;
+        if (d == nullptr)
+            return 0;
+        EXPECT_EQ(d->fileNumName, number);
+        EXPECT_STREQ(d->stationName, "TV Tavo");
+        EXPECT_STREQ(d->prgName, "News");
+        return static_cast<int>(d->playbackDuration);
     };
     EXPECT_NEAR(open(), 40000, 1000);
     EXPECT_EQ(RecPlayerBinder_IsPossibleSeek(), 1);
@@ -330,9 +323,7 @@ TEST_F(RecordingServiceTest, AClipRepositionsWhileFilteringOrStoppedAndReportsIt
 }
 
 // Bad input: each row the designed result and event, nothing lost.
-class BadInputTest : public RecordingServiceTest {};
-
-TEST_F(BadInputTest, GivesTheDesignedFailure) {
+TEST_F(RecordingServiceTest, BadInputGivesTheDesignedFailure) {
     const std::vector<uint8_t> small =
         buildStream({.pids = {kVideo}, .rounds = 200, .pcrPid = kVideo});
     auto write = [](const std::string& file, const std::vector<uint8_t>& bytes) {
@@ -342,12 +333,7 @@ TEST_F(BadInputTest, GivesTheDesignedFailure) {
         return RecPlayerBinder_CreateTSRecorder(0, 0, kVideo, kAudio, 1, EventLog::callback,
                                                 &events);
     };
-    auto getClip = [](const std::string& text) {
-        RecDetails* d = RecPlayerBinder_GetRecClipDetails(text.c_str(), 1);
-        const int ok = d != nullptr ? 1 : 0;
-        freeDetails(d);
-        return ok;
-    };
+    auto getClip = [](const std::string& path) { return clipDetails(path) != nullptr ? 1 : 0; };
     sqlite3* lockHolder = nullptr;
     struct Row {
         const char* name;
@@ -368,10 +354,9 @@ TEST_F(BadInputTest, GivesTheDesignedFailure) {
              write(d + "/4.ts", small);
              write(d + "/" + RecordingCatalog::kFileName, std::vector<uint8_t>(8192, 'x'));
              const int ok = getClip(d + "/4.t");
-             bool asideKept = false;
-             for (const auto& f : fs::directory_iterator(d))
-                 asideKept = asideKept ||
-                             f.path().filename().string().find(".damaged-") != std::string::npos;
+             const bool asideKept = std::ranges::any_of(fs::directory_iterator(d), [](auto& f) {
+                 return f.path().filename().string().find(".damaged-") != std::string::npos;
+             });
              return ok == 1 && asideKept && fs::file_size(d + "/4.ts") == small.size() ? 1 : 0;
          },
          1, -1},
@@ -388,9 +373,8 @@ TEST_F(BadInputTest, GivesTheDesignedFailure) {
              const int started = RecPlayerBinder_StartTSRecorder();
              sqlite3_exec(lockHolder, "ROLLBACK;", nullptr, nullptr, nullptr);
              sqlite3_close(lockHolder);
-             bool noFile = true;
-             for (const auto& f : fs::directory_iterator(d))
-                 noFile = noFile && f.path().extension() != ".ts";
+             const bool noFile = std::ranges::none_of(
+                 fs::directory_iterator(d), [](auto& f) { return f.path().extension() == ".ts"; });
              return created == 1 && noFile ? started : -1;
          },
          0, -1},
@@ -415,12 +399,11 @@ TEST_F(BadInputTest, GivesTheDesignedFailure) {
              write(d + "/6.ts", cut);
              ScopedEnv pace("TAVOPLAYER_PROP_tavoplayer_recordings_pace", "none");
              RecPlayerBinder_IsTSPlayerActive(EventLog::callback, &e);
-             RecDetails* details = RecPlayerBinder_GetRecClipDetails((d + "/6.t").c_str(), 1);
+             const Details details = clipDetails(d + "/6.t");
              const uint32_t duration = details != nullptr ? details->playbackDuration : 0;
-             freeDetails(details);
              const int handle = DemuxBinder_StartFiltering(kVideo, kDemuxFilterVideo);
              const size_t got = readFor(handle, 300ms).size();
-             e.waitFor(kClipEventEnd, 5s);
+             e.waitFor(kClipEventEnd);
              DemuxBinder_StopFiltering(handle);
              // 100 whole packets, 40 ms of PCR each.
              return got == 100 && duration == 99 * 40 ? 1 : 0;

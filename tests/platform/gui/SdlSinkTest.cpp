@@ -86,8 +86,7 @@ protected:
     void showAndWait(const SurfacePicture& picture) {
         const uint64_t before = mSurface->showLog().shownCount();
         ASSERT_EQ(mSurface->showPicture(picture), 0);
-        for (int i = 0; i < 500 && mSurface->showLog().shownCount() == before; ++i)
-            std::this_thread::sleep_for(std::chrono::milliseconds(10));
+        TavoPlayer::test::waitUntil([&] { return mSurface->showLog().shownCount() > before; });
         ASSERT_EQ(mSurface->showLog().shownCount(), before + 1);
     }
 

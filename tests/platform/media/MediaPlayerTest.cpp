@@ -7,10 +7,9 @@
 #include <sys/socket.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <chrono>
 #include <future>
-#include <mutex>
-#include <thread>
 #include <vector>
 
 #include "platform/media/MediaPlayerOutputs.h"
@@ -28,11 +27,14 @@ using android::MediaPlayer;
 using android::sp;
 
 struct Note {
-    int msg;
-    int ext1;
-    int ext2;
+    int msg, ext1, ext2;
     std::string thread;
 };
+
+// Notes `msg`, and `ext1` unless it is -1.
+auto matching(int msg, int ext1) {
+    return [=](const Note& note) { return note.msg == msg && (ext1 == -1 || note.ext1 == ext1); };
+}
 
 class RecordingListener : public android::MediaPlayerListener, public test::Recorded<Note> {
 public:
@@ -44,11 +46,8 @@ public:
     // Index of the first note `msg` (and `ext1` unless -1) so far; -1 if none.
     int find(int msg, int ext1 = -1) {
         const std::vector<Note> all = snapshot();
-        for (size_t i = 0; i < all.size(); ++i) {
-            if (all[i].msg == msg && (ext1 == -1 || all[i].ext1 == ext1))
-                return static_cast<int>(i);
-        }
-        return -1;
+        const auto it = std::ranges::find_if(all, matching(msg, ext1));
+        return it == all.end() ? -1 : static_cast<int>(it - all.begin());
     }
     // The same, once it has come.
     int waitFor(int msg) {
@@ -57,18 +56,9 @@ public:
         return found;
     }
     int count(int msg, int ext1 = -1) {
-        int n = 0;
-        for (const Note& note : snapshot())
-            n += note.msg == msg && (ext1 == -1 || note.ext1 == ext1);
-        return n;
+        return static_cast<int>(std::ranges::count_if(snapshot(), matching(msg, ext1)));
     }
 };
-
-int position(const sp<MediaPlayer>& player) {
-    int ms = -1;
-    EXPECT_EQ(player->getCurrentPosition(&ms), android::OK);
-    return ms;
-}
 
 class MediaPlayerTest : public ::testing::Test {
 protected:
@@ -94,9 +84,8 @@ MediaTestFiles* MediaPlayerTest::sFiles = nullptr;
 struct PlaybackCase {
     const char* name;
     std::string (MediaTestFiles::*file)() const;
-    int width;  // 0: no video
-    int height;
-    bool intact;  // the whole file is there: its duration is the encoded one
+    int width, height;  // 0: no video
+    bool intact;        // the whole file is there: its duration is the encoded one
 };
 
 class MediaPlayerPlaybackTest : public MediaPlayerTest,
@@ -134,8 +123,10 @@ TEST_P(MediaPlayerPlaybackTest, PreparesPlaysToTheEndAndNotifiesInOrder) {
     }
     EXPECT_EQ(mListener->count(android::MEDIA_SET_VIDEO_SIZE), 1);
     EXPECT_EQ(mListener->count(android::MEDIA_ERROR), 0);
+    int positionMs = -1;
+    EXPECT_EQ(mPlayer->getCurrentPosition(&positionMs), android::OK);
     if (c.intact) {
-        EXPECT_NEAR(position(mPlayer), durationMs, 100);
+        EXPECT_NEAR(positionMs, durationMs, 100);
     }
     for (const Note& note : mListener->snapshot())
         EXPECT_EQ(note.thread, "MediaPlayerCB") << "message " << note.msg;
@@ -150,31 +141,26 @@ INSTANTIATE_TEST_SUITE_P(
     [](const auto& info) { return std::string(info.param.name); });
 
 // A server that accepts the connection and never answers: prepare waits on it.
-class SilentServer {
-public:
+struct SilentServer {
     SilentServer() {
-        mListen = socket(AF_INET, SOCK_STREAM, 0);
         sockaddr_in addr{};
         addr.sin_family = AF_INET;
         addr.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
         socklen_t len = sizeof addr;
-        bind(mListen, reinterpret_cast<sockaddr*>(&addr), len);
-        listen(mListen, 4);
-        getsockname(mListen, reinterpret_cast<sockaddr*>(&addr), &len);
-        mUrl = "http://127.0.0.1:" + std::to_string(ntohs(addr.sin_port)) + "/a.mp4";
+        bind(listenFd, reinterpret_cast<sockaddr*>(&addr), len);
+        listen(listenFd, 4);
+        getsockname(listenFd, reinterpret_cast<sockaddr*>(&addr), &len);
+        url = "http://127.0.0.1:" + std::to_string(ntohs(addr.sin_port)) + "/a.mp4";
     }
     ~SilentServer() {
-        if (mClient >= 0)
-            close(mClient);
-        close(mListen);
+        if (client >= 0)
+            close(client);
+        close(listenFd);
     }
-    void acceptOne() { mClient = accept(mListen, nullptr, nullptr); }
-    const std::string& url() const { return mUrl; }
-
-private:
-    int mListen = -1;
-    int mClient = -1;
-    std::string mUrl;
+    void acceptOne() { client = accept(listenFd, nullptr, nullptr); }
+    int listenFd = socket(AF_INET, SOCK_STREAM, 0);
+    int client = -1;
+    std::string url;
 };
 
 class MediaPlayerInterruptTest : public MediaPlayerTest,
@@ -184,7 +170,7 @@ TEST_P(MediaPlayerInterruptTest, StopOrDisconnectEndsAPrepareThatWaitsOnTheNetwo
     const bool disconnect = GetParam();
     TraceCapture trace;
     SilentServer server;
-    open(server.url());
+    open(server.url);
     auto prepared = std::async(std::launch::async, [&] { return mPlayer->prepare(); });
     server.acceptOne();  // the player is connected and waiting for an answer
     if (disconnect)

@@ -22,7 +22,7 @@ protected:
     test::ScopedEnv mProperties{"TAVOPLAYER_PROPERTIES", mFile.path()};
 };
 
-TEST_F(PropertiesTest, ValuesComeFromTheFileTrimmedAndLastOneWins) {
+TEST_F(PropertiesTest, ValuesComeFromTheFileTrimmedLastOneWinsAndAMissingFileGivesTheDefault) {
     write(
         "# comment\n\n tavoplayer.video.sink = null \nnot a property\n"
         "tavoplayer.video.sink=y4m:/tmp/out.y4m\nk=" +
@@ -39,12 +39,10 @@ TEST_F(PropertiesTest, ValuesComeFromTheFileTrimmedAndLastOneWins) {
     EXPECT_EQ(kPropertyValueMax - 1, property_get("k", value, ""));
     EXPECT_EQ(std::string(kPropertyValueMax - 1, 'v'), value);
     EXPECT_EQ(std::string(200, 'v'), propertyGetString("k", ""));
-}
 
-// Every test sets properties through the environment; a missing file is the default.
-TEST_F(PropertiesTest, AMissingFileGivesTheDefault) {
+    // Every test sets properties through the environment; a missing file is the default.
     setenv("TAVOPLAYER_PROPERTIES", "/nonexistent/dir/system.prop", 1);
-    EXPECT_EQ("stdin", propertyGetString("tavoplayer.demux.source", "stdin"));
+    EXPECT_EQ("sdl", propertyGetString("tavoplayer.video.sink", "sdl"));
 }
 
 // ---------------------------------------------------------------------------------

@@ -10,36 +10,29 @@
 namespace android {
 namespace {
 
-struct LibcTable {
-    decltype(&::strlen) strlen;
-};
-struct MissingFunctionTable {
-    decltype(&::strlen) strlen;
-};
-struct MissingLibraryTable {
+// One table type per soname: loadOnce keeps one result per type.
+template <int>
+struct StrlenTable {
     decltype(&::strlen) strlen;
 };
 
 TEST(SharedLibraryTest, ResolvesOnceOrGivesNoTable) {
-    const auto resolveLibc = [](void* handle, LibcTable& table) {
+    const auto resolveStrlen = [](void* handle, auto& table) {
         return TAVO_RESOLVE(handle, table, strlen);
     };
-    const LibcTable* libc = SharedLibrary::loadOnce<LibcTable>("libc.so.6", resolveLibc);
+    const auto* libc = SharedLibrary::loadOnce<StrlenTable<0>>("libc.so.6", resolveStrlen);
     ASSERT_NE(libc, nullptr);
     EXPECT_EQ(libc->strlen("ISDB-Tb"), 7u);
-    EXPECT_EQ(SharedLibrary::loadOnce<LibcTable>("libc.so.6", resolveLibc), libc);
+    EXPECT_EQ(SharedLibrary::loadOnce<StrlenTable<0>>("libc.so.6", resolveStrlen), libc);
 
-    EXPECT_EQ(SharedLibrary::loadOnce<MissingFunctionTable>(
+    EXPECT_EQ(SharedLibrary::loadOnce<StrlenTable<1>>(
                   "libc.so.6",
-                  [](void* handle, MissingFunctionTable& table) {
+                  [](void* handle, StrlenTable<1>& table) {
                       return SharedLibrary::resolve(handle, "no_such_function", &table.strlen);
                   }),
               nullptr);
     EXPECT_EQ(
-        SharedLibrary::loadOnce<MissingLibraryTable>("libtavo-no-such-library.so.1",
-                                                     [](void* handle, MissingLibraryTable& table) {
-                                                         return TAVO_RESOLVE(handle, table, strlen);
-                                                     }),
+        SharedLibrary::loadOnce<StrlenTable<2>>("libtavo-no-such-library.so.1", resolveStrlen),
         nullptr);
 }
 

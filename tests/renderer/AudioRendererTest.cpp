@@ -107,7 +107,7 @@ protected:
     test::TempDir mDir{"tavo-arend"};
     test::ScopedEnv mProperties{"TAVOPLAYER_PROPERTIES", mDir / "none.prop"};
     std::optional<test::ScopedEnv> mSink, mDevices;
-    // Last, so that it goes first, before what its threads use.
+    // Declared last, so destroyed first: its threads use everything above.
     android::sp<AudioRenderer> mRenderer;
 };
 

@@ -2,9 +2,9 @@
 // 3) -> "CCPES" -> ClosedCaptionDecoder -> "CCRaw" -> ClosedCaptionRenderer ->
 // listener, on streams written by tsgen; and the decoder on real Japanese caption
 // streams, which share the data group and data unit framing.
-#include <dirent.h>
 #include <gtest/gtest.h>
 
+#include <filesystem>
 #include <map>
 #include <string>
 #include <vector>
@@ -104,20 +104,17 @@ TEST(ClosedCaptionChainTest, TsgenCaptionsReachTheListenerOnTime) {
 TEST(ClosedCaptionChainTest, JapaneseCaptionStreamsDecodeWithoutFault) {
     const std::string dir = std::string(TAVO_SHARED_STREAMS_DIR) + "/arib_caption_es";
     std::vector<std::string> files;
-    if (DIR* d = opendir(dir.c_str())) {
-        while (dirent* e = readdir(d)) {
-            const std::string name = e->d_name;
-            if (name.size() > 3 && name.compare(name.size() - 3, 3, ".es") == 0)
-                files.push_back(name);
-        }
-        closedir(d);
+    std::error_code missing;
+    for (const auto& entry : std::filesystem::directory_iterator(dir, missing)) {
+        if (entry.path().extension() == ".es")
+            files.push_back(entry.path());
     }
     if (files.empty())
         GTEST_SKIP() << "no caption streams (*.es) in " << dir;
 
-    for (const std::string& name : files) {
-        SCOPED_TRACE(name);
-        const std::vector<Bytes> units = splitCaptionEs(fileBytes(dir + "/" + name));
+    for (const std::string& path : files) {
+        SCOPED_TRACE(path);
+        const std::vector<Bytes> units = splitCaptionEs(fileBytes(path));
         TraceCapture trace;
         android::sp<RingBuffer> output = makeRing("CCRaw", 1 << 16);
         android::sp<ClosedCaptionDecoder> decoder = new ClosedCaptionDecoder();

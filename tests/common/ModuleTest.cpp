@@ -1,8 +1,7 @@
 #include "common/Module.h"
 
+#include <gmock/gmock.h>
 #include <gtest/gtest.h>
-
-#include <vector>
 
 namespace TavoPlayer {
 namespace {
@@ -14,45 +13,20 @@ public:
     unsigned int stop() override { return 0; }
 };
 
-struct Call {
-    int listener;
-    unsigned int code;
-    const Module* module;
+struct MockErrorListener : ErrorListener {
+    MOCK_METHOD(void, onError, (unsigned int code, const Module* module), (const, override));
 };
 
-class RecordingListener : public ErrorListener {
-public:
-    RecordingListener(int id, std::vector<Call>* calls) : mId(id), mCalls(calls) {}
-    void onError(unsigned int code, const Module* module) const override {
-        mCalls->push_back({mId, code, module});
-    }
-
-private:
-    int mId;
-    std::vector<Call>* mCalls;
-};
-
-class ModuleTest : public ::testing::Test {
-protected:
+TEST(ModuleTest, OnErrorReachesListenersInOrderWithTheModule) {
     android::sp<TestModule> module = new TestModule("TS Parser");
-    std::vector<Call> calls;
-};
-
-TEST_F(ModuleTest, OnErrorReachesListenersInOrderWithTheModule) {
     EXPECT_EQ(0u, module->onError(0x21003));  // none yet
-    EXPECT_TRUE(calls.empty());
-    RecordingListener first(1, &calls);
-    RecordingListener second(2, &calls);
+    MockErrorListener first, second;
     module->addErrorListener(first);
     module->addErrorListener(second);
+    ::testing::InSequence firstAddedFirst;
+    EXPECT_CALL(first, onError(0x21003u, module.get()));
+    EXPECT_CALL(second, onError(0x21003u, module.get()));
     EXPECT_EQ(0u, module->onError(0x21003));
-    ASSERT_EQ(2u, calls.size());
-    EXPECT_EQ(1, calls[0].listener);
-    EXPECT_EQ(2, calls[1].listener);
-    for (const Call& call : calls) {
-        EXPECT_EQ(0x21003u, call.code);
-        EXPECT_EQ(module.get(), call.module);
-    }
 }
 
 }  // namespace

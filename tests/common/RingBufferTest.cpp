@@ -19,6 +19,16 @@ using test::TraceCapture;
 
 const unsigned int kPage = static_cast<unsigned int>(sysconf(_SC_PAGE_SIZE));
 
+// Writes, or reads, `bytes` that the ring has room, or data, for.
+void put(RingBuffer& ring, uint32_t bytes) {
+    ASSERT_TRUE(ring.waitForSpace(bytes));
+    ring.commitWrite(bytes);
+}
+void take(RingBuffer& ring, uint32_t bytes) {
+    ASSERT_TRUE(ring.waitForData(bytes));
+    ring.consume(bytes);
+}
+
 // ---------------------------------------------------------------------------------
 // Configuration
 
@@ -49,10 +59,8 @@ protected:
     void advanceTo(uint32_t position) {
         while (ring->head() < position) {
             const uint32_t step = std::min<uint32_t>(position - ring->head(), kPage / 2);
-            ASSERT_TRUE(ring->waitForSpace(step));
-            ring->commitWrite(step);
-            ASSERT_TRUE(ring->waitForData(step));
-            ring->consume(step);
+            ASSERT_NO_FATAL_FAILURE(put(*ring, step));
+            ASSERT_NO_FATAL_FAILURE(take(*ring, step));
         }
     }
 
@@ -60,8 +68,7 @@ protected:
 };
 
 TEST_F(RingBufferAccessTest, CommitRoundsUpToFourAndUsedPlusFreeIsTheSize) {
-    ASSERT_TRUE(ring->waitForSpace(2001));
-    ring->commitWrite(2001);
+    put(*ring, 2001);
     EXPECT_EQ(2004u, ring->head());
     EXPECT_EQ(2004u, ring->usedSpace());
     EXPECT_EQ(kPage, ring->usedSpace() + ring->freeSpace());
@@ -102,11 +109,9 @@ TEST_F(RingBufferAccessTest, WaitsGiveUpAfterOneTimeOut) {
     const auto empty = timed([&] { return ring->waitForData(40); });
     EXPECT_GE(empty, 95ms);
     EXPECT_LT(empty, 5s);
-    ASSERT_TRUE(ring->waitForSpace(kPage));
-    ring->commitWrite(kPage);
+    put(*ring, kPage);
     EXPECT_GE(timed([&] { return ring->waitForSpace(4); }), 95ms);
-    ASSERT_TRUE(ring->waitForData(kPage));
-    ring->consume(kPage);
+    take(*ring, kPage);
     EXPECT_TRUE(ring->waitForSpace(4));
     ring->abortWrite();
 }
@@ -127,18 +132,8 @@ struct WakeCase {
 
 TEST(RingBufferWakeTest, TheOtherSideOrAResetEndsTheWait) {
     const WakeCase cases[] = {
-        {"commit wakes a reader", false, true, 40,
-         [](RingBuffer& r) {
-             ASSERT_TRUE(r.waitForSpace(40));
-             r.commitWrite(40);
-         },
-         true},
-        {"consume wakes a writer", true, false, 400,
-         [](RingBuffer& r) {
-             ASSERT_TRUE(r.waitForData(400));
-             r.consume(400);
-         },
-         true},
+        {"commit wakes a reader", false, true, 40, [](RingBuffer& r) { put(r, 40); }, true},
+        {"consume wakes a writer", true, false, 400, [](RingBuffer& r) { take(r, 400); }, true},
         {"reset wakes a writer", true, false, kPage, [](RingBuffer& r) { r.reset(); }, true},
         // The ring is empty after the reset: still nothing to read.
         {"reset wakes a reader", false, true, 40, [](RingBuffer& r) { r.reset(); }, false},
@@ -147,25 +142,18 @@ TEST(RingBufferWakeTest, TheOtherSideOrAResetEndsTheWait) {
         SCOPED_TRACE(c.name);
         android::sp<RingBuffer> ring = new RingBuffer;
         ASSERT_EQ(0u, ring->configureWithSize("wait", kPage));
-        if (c.fullFirst) {
-            ASSERT_TRUE(ring->waitForSpace(kPage));
-            ring->commitWrite(kPage);
-        }
+        if (c.fullFirst)
+            put(*ring, kPage);
         std::atomic<bool> started{false};
         bool result = !c.result;
         std::chrono::steady_clock::duration waited{};
         std::thread waiter([&] {
             started = true;
             const auto start = std::chrono::steady_clock::now();
-            if (c.readerWaits) {
-                result = ring->waitForData(c.bytes);
-                if (result)
-                    ring->abortRead();
-            } else {
-                result = ring->waitForSpace(c.bytes);
-                if (result)
-                    ring->abortWrite();
-            }
+            result = c.readerWaits ? ring->waitForData(c.bytes) : ring->waitForSpace(c.bytes);
+            // Release the lock the successful wait took.
+            if (result)
+                c.readerWaits ? ring->abortRead() : ring->abortWrite();
             waited = std::chrono::steady_clock::now() - start;
         });
         while (!started)

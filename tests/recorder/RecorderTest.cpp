@@ -2,11 +2,9 @@
 
 #include <gtest/gtest.h>
 
-#include <condition_variable>
 #include <cstdlib>
 #include <filesystem>
 #include <memory>
-#include <mutex>
 #include <string>
 #include <vector>
 
@@ -27,10 +25,6 @@ public:
     void onRecorderStarted(int fileNumName) override { started.push_back(fileNumName); }
     void onRecorderStopped(int result) override { stopped.push_back(result); }
     void onError(int code) override { errors.push(code); }
-    std::vector<int> waitForErrors() {
-        errors.waitFor([](auto& all) { return !all.empty(); });
-        return errors.snapshot();
-    }
     std::vector<int> started, stopped;
     test::Recorded<int> errors;
 };
@@ -123,9 +117,9 @@ TEST_F(RecorderServiceTest, StartFillsTheDetailsFromTheQueryAndStopKeepsOrCancel
         EXPECT_EQ(d->isLATM, 1);
         auto text = [](const char* name) { return std::string(name ? name : "(null)"); };
         EXPECT_EQ(text(d->stationName), text(c.station));
-        EXPECT_EQ(d->stationNameLength, text(c.station) == "(null)" ? 0u : strlen(c.station));
+        EXPECT_EQ(d->stationNameLength, c.station ? strlen(c.station) : 0u);
         EXPECT_EQ(text(d->prgName), text(c.programme));
-        EXPECT_EQ(d->prgNameLength, text(c.programme) == "(null)" ? 0u : strlen(c.programme));
+        EXPECT_EQ(d->prgNameLength, c.programme ? strlen(c.programme) : 0u);
         free(d->stationName);
         free(d->prgName);
         free(d);
@@ -148,7 +142,8 @@ TEST_F(RecorderServiceTest, ARefusedSecondRecordingReportsZeroOnceAndItsError) {
     TraceCapture trace;
     refused->start(uri.get(), kVideo, kAudio, kCaptions, 1);
     EXPECT_EQ(second.started, std::vector<int>{0});
-    EXPECT_EQ(second.waitForErrors(), std::vector<int>{0x60004});
+    EXPECT_TRUE(second.errors.waitFor([](auto& all) { return !all.empty(); }));
+    EXPECT_EQ(second.errors.snapshot(), std::vector<int>{0x60004});
 
     // The refused attempt's stop fails: it reports 0 and attempts no delete;
     // the first recording then stops normally.

@@ -1,12 +1,11 @@
 #include "renderer/AudioRenderer.h"
 
 #include <gtest/gtest.h>
-#include <stdlib.h>
 
 #include <atomic>
 #include <cstring>
 #include <functional>
-#include <mutex>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -47,18 +46,11 @@ class AudioRendererTest : public ::testing::Test {
 protected:
     void SetUp() override {
         ASSERT_FALSE(mDir.path().empty());
-        setenv("TAVOPLAYER_PROPERTIES", (mDir / "none.prop").c_str(), 1);
         setSink("wav:" + mDir / "out.wav");
         ASSERT_EQ(0u, mRing->configure("AudioRaw", 19));
     }
-    void TearDown() override {
-        mRenderer.clear();
-        for (const char* name : {"TAVOPLAYER_PROPERTIES", "TAVOPLAYER_PROP_tavoplayer_audio_sink",
-                                 "TAVOPLAYER_PROP_tavoplayer_audio_devices"})
-            unsetenv(name);
-    }
-    static void setSink(const std::string& sink) {
-        setenv("TAVOPLAYER_PROP_tavoplayer_audio_sink", sink.c_str(), 1);
+    void setSink(const std::string& sink) {
+        mSink.emplace("TAVOPLAYER_PROP_tavoplayer_audio_sink", sink);
     }
     // Builds, configures and enables the renderer, and anchors the clock.
     unsigned int build(Uint33 anchor = kAnchor) {
@@ -113,6 +105,9 @@ protected:
     Listener mListener;
     TraceCapture mTrace;
     test::TempDir mDir{"tavo-arend"};
+    test::ScopedEnv mProperties{"TAVOPLAYER_PROPERTIES", mDir / "none.prop"};
+    std::optional<test::ScopedEnv> mSink, mDevices;
+    // Declared last, so destroyed first: its threads use everything above.
     android::sp<AudioRenderer> mRenderer;
 };
 
@@ -135,7 +130,7 @@ class AudioTimingTest : public AudioRendererTest,
 TEST_P(AudioTimingTest, EarlyGetsSilenceLateLosesItsHead) {
     const TimingCase& c = GetParam();
     if (c.bluetooth)
-        setenv("TAVOPLAYER_PROP_tavoplayer_audio_devices", "0x80", 1);
+        mDevices.emplace("TAVOPLAYER_PROP_tavoplayer_audio_devices", "0x80");
     ASSERT_EQ(0u, build(c.anchor));
     // The output device thread has seen the Bluetooth output once the change is flagged.
     if (c.bluetooth) {

@@ -3,7 +3,6 @@
 // series, bad records, and a stop that cuts a long wait short.
 #include <chrono>
 #include <cstring>
-#include <mutex>
 #include <thread>
 #include <vector>
 
@@ -37,19 +36,16 @@ struct FakeVideoListener : VideoFrameData::VideoListener {
     bool captureSucceeds = true;
 };
 
-struct FakeRenderedListener : VideoRenderer::FrameRenderedListener {
+struct FakeRenderedListener : VideoRenderer::FrameRenderedListener, ErrorListener {
     void onFrameRendered(int width, int height, Uint33 pts) override {
         EXPECT_EQ(width, 1920);
         EXPECT_EQ(height, 1080);
         reports.push_back(pts);
     }
     void onFirstFrameRendered(int, int) override {}
+    void onError(unsigned int code, const Module*) const override { errors.push_back(code); }
     std::vector<Uint33> reports;
-};
-
-struct FakeErrorListener : ErrorListener {
-    void onError(unsigned int code, const Module*) const override { codes.push_back(code); }
-    mutable std::vector<unsigned int> codes;
+    mutable std::vector<unsigned int> errors;
 };
 
 // One renderer on a ring, its clock driven by the real PCR, and fake listeners.
@@ -63,7 +59,7 @@ public:
         mRenderer->setInput(mRing);
         mRenderer->setOutputEnable(true);
         mRenderer->setFrameRenderedListener(&mRendered);
-        mRenderer->addErrorListener(mErrors);
+        mRenderer->addErrorListener(mRendered);
         mClock->setBasePCR(kBasePCR, Synchronization::RealPCR);
     }
     ~Harness() { mRenderer->stop(); }
@@ -109,14 +105,9 @@ public:
         return mVideo.calls.snapshot().size() == before + 1 &&
                mVideo.calls.snapshot().back().render;
     }
-    bool clockRunning() {
-        Uint33 pcr = 0;
-        return mClock->getPCR(&pcr);
-    }
 
     FakeVideoListener mVideo;
     FakeRenderedListener mRendered;
-    FakeErrorListener mErrors;
     android::sp<Synchronization> mClock;
     android::sp<RingBuffer> mRing;
     android::sp<VideoRenderer> mRenderer;
@@ -165,14 +156,16 @@ TEST(VideoRendererTimingTest, LateAndEarlyFramesAgainstTheClock) {
         EXPECT_EQ(h.mVideo.calls.snapshot()[0].render, c.shown);
         EXPECT_EQ(h.mRendered.reports,
                   c.reported ? std::vector<Uint33>{pts} : std::vector<Uint33>{});
-        EXPECT_EQ(h.clockRunning(), c.clockSource && !c.clockReset);
+        Uint33 pcr = 0;
+        EXPECT_EQ(h.mClock->getPCR(&pcr), c.clockSource && !c.clockReset);
         EXPECT_EQ(h.mRing->usedSpace(), 0u);
     }
 }
 
-// Steps of `step` ticks after `head`.
-std::vector<int64_t> steps(std::vector<int64_t> head, int repeats, int64_t step = 3003) {
-    head.insert(head.end(), repeats, step);
+// `head`, then `repeats` steps of one frame at 29.97 Hz (3003 ticks), then `tail`.
+std::vector<int64_t> steps(std::vector<int64_t> head, int repeats, std::vector<int64_t> tail = {}) {
+    head.insert(head.end(), repeats, 3003);
+    head.insert(head.end(), tail.begin(), tail.end());
     return head;
 }
 
@@ -192,24 +185,21 @@ TEST(VideoRendererPTSTest, StepsOf25TimesTheSpacingSkipUntilAKeyFrameOrOneSecond
         {"one second without a key frame", kBasePCR, steps({3003, 3003, 75075}, 31), -1, 3, 32},
         {"a key frame ends the skipping", kBasePCR, steps({3003, 3003, 75075}, 3), 5, 3, 4},
         // Across 2^33 the step is still 3003; a step back is no step at all.
-        {"wrap and a step back", 0x1FFFFFFFFull - 3 * 3003, steps({}, 7), -1, -1, -1},
+        {"wrap, a step back", 0x1FFFFFFFFull - 3 * 3003, steps({}, 7, {-6005, 3003}), -1, -1, -1},
     };
     for (const PTSCase& c : cases) {
         SCOPED_TRACE(c.name);
         Harness h;
         test::TraceCapture trace;
         h.rebase(c.first);
-        std::vector<int64_t> all = c.steps;
-        if (c.firstDropped < 0)
-            all.insert(all.end(), {-6005, 3003});
         Uint33 pts = c.first;
-        for (size_t i = 0; i <= all.size(); ++i) {
+        for (size_t i = 0; i <= c.steps.size(); ++i) {
             const bool dropped =
                 static_cast<int>(i) >= c.firstDropped && static_cast<int>(i) <= c.lastDropped;
             ASSERT_EQ(h.renderDue(pts, static_cast<int>(i) == c.keyFrame), !dropped)
                 << "frame " << i;
-            if (i < all.size())
-                pts = mask33(pts + all[i]);
+            if (i < c.steps.size())
+                pts = mask33(pts + c.steps[i]);
         }
     }
 }
@@ -259,7 +249,7 @@ TEST(VideoRendererRecordTest, BadRecordsAreSkippedAndTheNextFrameIsShown) {
         h.writeRaw(c.type, c.claimed, c.written);
         h.writeFrame(kBasePCR);
         h.mRenderer->render();
-        EXPECT_EQ(h.mErrors.codes,
+        EXPECT_EQ(h.mRendered.errors,
                   c.reported ? std::vector<unsigned int>{0x41003} : std::vector<unsigned int>{});
         // An inconsistent ring is emptied, so the frame written after it was lost too.
         if (!c.reported)

@@ -8,16 +8,12 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include <chrono>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <filesystem>
 #include <fstream>
-#include <sstream>
 #include <string>
-
-#include <thread>
 #include <vector>
 
 #include "platform/binder/IServiceManager.h"
@@ -26,30 +22,31 @@
 #include "support/RecordingPlayerClient.h"
 #include "support/RunCommand.h"
 #include "support/ScopedEnv.h"
+#include "support/TsTestUtil.h"
 
 namespace {
 
 namespace fs = std::filesystem;
 using TavoPlayer::test::runCommand;
+using TavoPlayer::test::waitUntil;
 
 const std::string kBin = TAVO_BINARY_DIR "/apps/";
-constexpr const char* kLive =
-    "open 5 MTV://tuner/live?pcrPid=273;videoPid=273;audioPid=274;IsLATMAudio=1;"
-    "subtitlePid=304;";
+const std::string kLiveUri =
+    "MTV://tuner/live?pcrPid=273;videoPid=273;audioPid=274;IsLATMAudio=1;subtitlePid=304;";
+// tavoctl's command that opens the live broadcast, quoted for the shell.
+const std::string kOpen = "'open 5 " + kLiveUri + "' ";
 
 class ServiceSession : public testing::Test {
 protected:
+    // The folder goes with the test program.
     static void SetUpTestSuite() {
-        sDir = fs::temp_directory_path() / ("tavo-session-" + std::to_string(getpid()));
+        sDir = TavoPlayer::test::tempPath("session");
         fs::create_directories(sDir);
-        std::string out;
-        ASSERT_EQ(runCommand(std::string(TAVO_TSGEN_PATH) + " -o " + (sDir / "live.ts").string() +
-                                 " -d 14 --caption 2:Olá --caption 5:'Ação, você'",
-                             &out),
-                  0)
-            << out;
+        const auto made =
+            runCommand(std::string(TAVO_TSGEN_PATH) + " -o " + (sDir / "live.ts").string() +
+                       " -d 14 --caption 2:Olá --caption 5:'Ação, você'");
+        ASSERT_EQ(made.exitCode, 0) << made.err;
     }
-    static void TearDownTestSuite() { fs::remove_all(sDir); }
 
     void SetUp() override {
         const std::string env = environment();
@@ -64,9 +61,7 @@ protected:
             _exit(127);
         }
         // The service is there once its socket is.
-        for (int i = 0; i < 100 && !fs::exists(sDir / "svc" / "TavoPlayer"); ++i)
-            std::this_thread::sleep_for(std::chrono::milliseconds(50));
-        ASSERT_TRUE(fs::exists(sDir / "svc" / "TavoPlayer"));
+        ASSERT_TRUE(waitUntil([] { return fs::exists(sDir / "svc" / "TavoPlayer"); }));
     }
     void TearDown() override {
         if (mDaemon > 0) {
@@ -94,31 +89,29 @@ protected:
             "timeout 90 env " + environment() + " " + kBin + "tavoctl/tavoctl " + commands, output);
     }
 
-    static std::string daemonLog() {
-        std::ifstream log(sDir / "daemon.log");
-        std::stringstream text;
-        text << log.rdbuf();
-        return text.str();
+    static std::string daemonLog() { return TavoPlayer::test::fileText(sDir / "daemon.log"); }
+    // The state a client left is Closed, and the next client plays.
+    void expectClosedAndReadyForTheNext() const {
+        std::string next;
+        EXPECT_EQ(
+            tavoctl("state " + kOpen + "start 'waitfor onStartVideoTask 20' stop close", &next), 0)
+            << next;
+        // The first line is the state the gone client left.
+        EXPECT_NE(next.find("state 1 Closed"), std::string::npos) << next;
     }
 
-    static fs::path sDir;
+    static inline fs::path sDir;
     pid_t mDaemon = -1;
 };
-
-fs::path ServiceSession::sDir;
 
 TEST_F(ServiceSession, AWholeSessionGivesItsCallbacksInOrderAndAReadablePicture) {
     const std::string png = (sDir / "capture.png").string();
     std::string out;
-    const int status = tavoctl(std::string("'") + kLive +
-                                   "' start 'waitfor onStartVideoTask 20' 'waitfor onBufferingEnd "
-                                   "20' 'capture 320 240 " +
-                                   png +
-                                   "' pause resume 'record FILE://rec/session?channelName=t;' "
-                                   "'waitfor closedCaptionText 20' "
-                                   "'wait 1' stoprecord 'waitfor onRecorderStopped 10' stop close",
-                               &out);
-    EXPECT_EQ(status, 0) << out;
+    const std::string commands =
+        "start 'waitfor onStartVideoTask 20' 'waitfor onBufferingEnd 20' 'capture 320 240 " + png +
+        "' pause resume 'record FILE://rec/session?channelName=t;' 'waitfor closedCaptionText 20' "
+        "'wait 1' stoprecord 'waitfor onRecorderStopped 10' stop close";
+    EXPECT_EQ(tavoctl(kOpen + commands, &out), 0) << out;
     // Each callback in the order the session must see them.
     size_t at = 0;
     for (const char* expected :
@@ -141,17 +134,10 @@ TEST_F(ServiceSession, AWholeSessionGivesItsCallbacksInOrderAndAReadablePicture)
 TEST_F(ServiceSession, AClientThatDiesMidPlaybackLeavesTheServiceReadyForTheNext) {
     std::string out;
     // Killed by timeout while playing: the service sees the hang-up as a death.
-    runCommand("timeout -s KILL 6 env " + environment() + " " + kBin + "tavoctl/tavoctl '" + kLive +
-                   "' start 'wait 30'",
+    runCommand("timeout -s KILL 6 env " + environment() + " " + kBin + "tavoctl/tavoctl " + kOpen +
+                   "start 'wait 30'",
                &out);
-    std::string next;
-    EXPECT_EQ(tavoctl(std::string("state '") + kLive +
-                          "' start 'waitfor onStartVideoTask 20' stop close state",
-                      &next),
-              0)
-        << next;
-    // The first line is the state the dead client left: Closed.
-    EXPECT_NE(next.find("state 1 Closed"), std::string::npos) << next;
+    expectClosedAndReadyForTheNext();
 }
 
 using SilentClient = TavoPlayer::test::RecordingPlayerClient;
@@ -166,8 +152,7 @@ TEST_F(ServiceSession, AClientThatDiesDuringOpenLeavesTheServiceClosedAndReady) 
         setenv("TAVOPLAYER_SERVICE_DIR", (sDir / "svc").c_str(), 1);
         android::sp<android::IBinder> binder =
             android::defaultServiceManager()->getService(android::String16("TavoPlayer"));
-        android::sp<TavoPlayer::ICTavoPlayer> service =
-            android::interface_cast<TavoPlayer::ICTavoPlayer>(binder);
+        const auto service = android::interface_cast<TavoPlayer::ICTavoPlayer>(binder);
         if (service == nullptr)
             _exit(3);
         android::sp<SilentClient> me = new SilentClient();
@@ -175,7 +160,7 @@ TEST_F(ServiceSession, AClientThatDiesDuringOpenLeavesTheServiceClosedAndReady) 
         android::Parcel open;
         open.writeInterfaceToken(TavoPlayer::ICTavoPlayer::descriptor);
         open.writeInt32(5);
-        open.writeString16(android::String16(kLive + 7));  // the URI after "open 5 "
+        open.writeString16(android::String16(kLiveUri.c_str()));
         binder->transact(TavoPlayer::ICTavoPlayer::OPEN_URI, open, nullptr,
                          android::IBinder::FLAG_ONEWAY);
         service->getState();
@@ -184,17 +169,10 @@ TEST_F(ServiceSession, AClientThatDiesDuringOpenLeavesTheServiceClosedAndReady) 
     int status = -1;
     waitpid(client, &status, 0);
     ASSERT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << status;
-    for (int i = 0; i < 200 && daemonLog().find("binderDied") == std::string::npos; ++i)
-        std::this_thread::sleep_for(std::chrono::milliseconds(50));
-    ASSERT_NE(daemonLog().find("binderDied"), std::string::npos) << daemonLog();
-    std::string next;
-    EXPECT_EQ(
-        tavoctl(std::string("state '") + kLive + "' start 'waitfor onStartVideoTask 20' stop close",
-                &next),
-        0)
-        << next;
+    ASSERT_TRUE(waitUntil([] { return daemonLog().find("binderDied") != std::string::npos; }))
+        << daemonLog();
     // The open of the dead client was closed with it.
-    EXPECT_NE(next.find("state 1 Closed"), std::string::npos) << next;
+    expectClosedAndReadyForTheNext();
 }
 
 // Datagrams that break the frame rules of docs/protocol.md, each on a connection of
@@ -213,10 +191,9 @@ TEST_F(ServiceSession, MalformedFramesHangUpTheirConnectionOnly) {
         memcpy(f.data() + 4 * word, &value, 4);
         return f;
     };
-    std::vector<uint8_t> pastData = with(9, 1);  // one object, its offset beyond the data
-    const uint32_t offset = 4096;
-    pastData.insert(pastData.end(), reinterpret_cast<const uint8_t*>(&offset),
-                    reinterpret_cast<const uint8_t*>(&offset) + 4);
+    // One object, its offset (4096, in the host's little-endian order) beyond the data.
+    std::vector<uint8_t> pastData = with(9, 1);
+    pastData.insert(pastData.end(), {0x00, 0x10, 0x00, 0x00});
     const struct {
         const char* what;
         std::vector<uint8_t> frame;
@@ -263,9 +240,8 @@ protected:
 
 TEST_F(ServiceOnANonTsSource, ReportsTheSignalLostAndLogsTheLostSync) {
     std::string out;
-    EXPECT_EQ(tavoctl(std::string("'") + kLive +
-                          "' start 'waitfor onSignalStatusChanged 20' 'waitfor "
-                          "onSignalStatusChanged 20' stop close",
+    EXPECT_EQ(tavoctl(kOpen + "start 'waitfor onSignalStatusChanged 20' "
+                              "'waitfor onSignalStatusChanged 20' stop close",
                       &out),
               0)
         << out;
@@ -275,40 +251,23 @@ TEST_F(ServiceOnANonTsSource, ReportsTheSignalLostAndLogsTheLostSync) {
 }
 
 TEST(TavoplayerdDirectory, ADirectoryThatCannotBeMadeIsOneLineAndStatus1) {
-    const TavoPlayer::test::TempDir made("tavo-svcdir");
-    const fs::path dir = made.path();
+    const TavoPlayer::test::TempDir dir("tavo-svcdir");
     std::ofstream(dir / "file") << "x";
-    const struct {
-        std::string serviceDir;
-        const char* reason;
-    } cases[] = {
-        {(dir / "file").string(), "Not a directory"},
-        {(dir / "file" / "svc").string(), "Not a directory"},
-    };
-    for (const auto& c : cases) {
+    // A file where the folder should be, and a file on the folder's path.
+    const std::string daemon = "timeout 20 " + kBin + "tavoplayerd/tavoplayerd --service-dir ";
+    for (const std::string& serviceDir : {dir / "file", dir / "file/svc"}) {
         std::string out;
-        EXPECT_EQ(runCommand("timeout 20 " + kBin + "tavoplayerd/tavoplayerd --service-dir " +
-                                 c.serviceDir,
-                             &out),
-                  1)
-            << out;
-        EXPECT_EQ(out, "tavoplayerd: cannot create the service directory " + c.serviceDir + ": " +
-                           c.reason + "\n");
+        EXPECT_EQ(runCommand(daemon + serviceDir, &out), 1) << out;
+        EXPECT_EQ(out, "tavoplayerd: cannot create the service directory " + serviceDir +
+                           ": Not a directory\n");
     }
 }
 
 TEST_F(ServiceSession, CommandsThatFailGiveANonZeroExit) {
-    const struct {
-        const char* commands;
-        int status;
-    } cases[] = {
-        {"start", 1},  // Closed: startComplete(1)
-        {"bogus", 1},
-        {"'seek abc'", 1},
-    };
-    for (const auto& c : cases) {
+    // start while Closed answers startComplete(1).
+    for (const char* commands : {"start", "bogus", "'seek abc'"}) {
         std::string out;
-        EXPECT_EQ(tavoctl(c.commands, &out), c.status) << c.commands << "\n" << out;
+        EXPECT_EQ(tavoctl(commands, &out), 1) << commands << "\n" << out;
     }
     kill(mDaemon, SIGTERM);
     waitpid(mDaemon, nullptr, 0);

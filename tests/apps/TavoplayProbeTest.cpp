@@ -1,8 +1,6 @@
 // tavoplay's discovery of the programme: what it finds in the PAT and PMT of each
 // stream, and where the audio payload overrules a mislabelling PMT.
 #include <gtest/gtest.h>
-#include <sys/wait.h>
-#include <unistd.h>
 
 #include <cstdio>
 #include <filesystem>

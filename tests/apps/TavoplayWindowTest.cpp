@@ -8,9 +8,6 @@
 
 #include <chrono>
 #include <cstdio>
-#include <filesystem>
-#include <fstream>
-#include <iterator>
 #include <set>
 #include <sstream>
 #include <string>
@@ -21,8 +18,6 @@
 #include "support/ScopedEnv.h"
 
 namespace {
-
-namespace fs = std::filesystem;
 
 struct Screen {
     int width, height;
@@ -56,10 +51,9 @@ TEST_P(TavoplayWindow, ShowsTheTestPatternFittedAndPrintsCaptions) {
         GTEST_SKIP() << "Xvfb, ffmpeg or xwininfo is not installed";
     const TavoPlayer::test::TempDir dir("tavo-window");
     const std::string ts = dir / "s.ts";
-    ASSERT_EQ(system((std::string(TAVO_TSGEN_PATH) + " -o " + ts +
-                      " -d 8 --caption '2:Olá' >/dev/null 2>&1")
-                         .c_str()),
-              0);
+    const auto made = TavoPlayer::test::runCommand(std::string(TAVO_TSGEN_PATH) + " -o " + ts +
+                                                   " -d 8 --caption '2:Olá'");
+    ASSERT_EQ(made.exitCode, 0) << made.err;
     const std::string display = ":" + std::to_string(100 + getpid() % 100);
     const pid_t xvfb = fork();
     if (xvfb == 0) {

@@ -5,9 +5,7 @@
 #include <gtest/gtest.h>
 
 #include <functional>
-#include <mutex>
 #include <string>
-#include <utility>
 #include <vector>
 
 #include "support/RecordingPlayerClient.h"
@@ -124,19 +122,11 @@ TEST(CTavoPlayerTest, ServiceControllerEventsBecomeClientCallbacks) {
 // the process on purpose; any other code reaches the client.
 TEST(CTavoPlayerDeathTest, StopWhileClosedAndFatalCodesEndTheProcess) {
     GTEST_FLAG_SET(death_test_style, "threadsafe");
-    EXPECT_EXIT(
-        {
-            android::sp<CTavoPlayer> player = new CTavoPlayer();
-            player->stop();
-        },
-        testing::ExitedWithCode(CTavoPlayer::kSuicideExitStatus & 0xFF),
-        "Commiting suicide due to unknown error");
-    EXPECT_EXIT(
-        {
-            android::sp<CTavoPlayer> player = new CTavoPlayer();
-            player->onError(0x31004u, nullptr);
-        },
-        testing::ExitedWithCode(CTavoPlayer::kSuicideExitStatus & 0xFF), "<200708>");
+    const auto suicide = testing::ExitedWithCode(CTavoPlayer::kSuicideExitStatus & 0xFF);
+    EXPECT_EXIT(android::sp<CTavoPlayer>(new CTavoPlayer())->stop(), suicide,
+                "Commiting suicide due to unknown error");
+    EXPECT_EXIT(android::sp<CTavoPlayer>(new CTavoPlayer())->onError(0x31004u, nullptr), suicide,
+                "<200708>");
     android::sp<CTavoPlayer> player = new CTavoPlayer();
     android::sp<test::RecordingPlayerClient> client = new test::RecordingPlayerClient();
     player->registerClient(client);

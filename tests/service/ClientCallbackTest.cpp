@@ -38,7 +38,7 @@ protected:
     android::status_t onTransact(uint32_t code, const Parcel& data, Parcel*,
                                  uint32_t flags) override {
         Call call{code, flags, {}};
-        if (!data.enforceInterface(String16("TavoPlayerClient")))
+        if (!data.enforceInterface(android::String16("TavoPlayerClient")))
             return -1;
         if (code == ICTavoPlayerClient::ON_CAPTURE_FRAME) {
             for (int i = 0; i < 3; ++i)
@@ -52,7 +52,6 @@ protected:
         calls.push_back(call);
         return android::OK;
     }
-    using String16 = android::String16;
 };
 
 struct CallbackCase {

@@ -2,9 +2,9 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <chrono>
 #include <map>
-#include <mutex>
 #include <string>
 #include <thread>
 #include <vector>
@@ -79,24 +79,24 @@ protected:
     void TearDown() override {
         if (mController != nullptr)
             mController->stop();
-        mController.clear();
     }
-    unsigned int open(std::map<std::string, std::string> config) {
-        const unsigned int result = mController->configure(config);
-        mController->setAudioEnable(1);  // as the service does right after open
-        return result;
+    // Opens the H.264 + AAC file as the service does (audio enabled right after) and
+    // plays it.
+    void play() {
+        std::map<std::string, std::string> config = {{"path", sFiles->mp4()}};
+        ASSERT_EQ(mController->configure(config), 0u);
+        mController->setAudioEnable(1);
+        ASSERT_EQ(mController->start(), 0u);
     }
 
-    static MediaTestFiles* sFiles;
+    static inline MediaTestFiles* sFiles = nullptr;
     TraceCapture mTrace;
     Listeners mListeners;
     sp<MP4Controller> mController;
 };
-MediaTestFiles* MP4ControllerFileTest::sFiles = nullptr;
 
 TEST_F(MP4ControllerFileTest, PlaysAFileAndReportsFrameTimeAndEnd) {
-    ASSERT_EQ(open({{"path", sFiles->mp4()}}), 0u);
-    ASSERT_EQ(mController->start(), 0u);
+    ASSERT_NO_FATAL_FAILURE(play());
     ASSERT_TRUE(waitUntil([&] { return !mListeners["end"].empty(); }));
     EXPECT_EQ(mListeners["session"].size(), 1u);
     EXPECT_GT(mListeners["session"].at(0), 0);
@@ -104,15 +104,13 @@ TEST_F(MP4ControllerFileTest, PlaysAFileAndReportsFrameTimeAndEnd) {
     // Seconds rounded up, never going back, up to the file's length.
     const std::vector<int> times = mListeners["time"];
     ASSERT_FALSE(times.empty());
-    for (size_t i = 1; i < times.size(); ++i)
-        EXPECT_LE(times[i - 1], times[i]) << "at " << i;
+    EXPECT_TRUE(std::ranges::is_sorted(times)) << testing::PrintToString(times);
     EXPECT_EQ(times.back(), MediaTestFiles::kSeconds);
     EXPECT_TRUE(mListeners["error"].empty());
 }
 
 TEST_F(MP4ControllerFileTest, PauseStopsTheTimeAndResumeAndSeekMoveIt) {
-    ASSERT_EQ(open({{"path", sFiles->mp4()}}), 0u);
-    ASSERT_EQ(mController->start(), 0u);
+    ASSERT_NO_FATAL_FAILURE(play());
     ASSERT_TRUE(waitUntil([&] { return !mListeners["time"].empty(); }));
     ASSERT_EQ(mController->pause(), 0u);
     std::this_thread::sleep_for(std::chrono::milliseconds(150));  // a trigger under way ends
@@ -154,7 +152,7 @@ INSTANTIATE_TEST_SUITE_P(Paths, MP4ControllerBadPathTest,
 
 // A media player that plays nothing: it records the calls made to it and reports the
 // position it is given.
-class FakeMediaPlayer : public android::MediaPlayer {
+class FakeMediaPlayer : public android::MediaPlayer, public test::Recorded<std::string> {
 public:
     android::status_t prepare() override { return record("prepare"); }
     android::status_t start() override { return record("start"); }
@@ -173,51 +171,41 @@ public:
         *msec = positionMs;
         return android::OK;
     }
-    std::vector<std::string> calls() { return mCalls.snapshot(); }
     std::atomic<int> positionMs{0};
 
 private:
-    android::status_t record(const std::string& call) {
-        mCalls.push(call);
+    android::status_t record(std::string call) {
+        push(std::move(call));
         return android::OK;
     }
-    test::Recorded<std::string> mCalls;
 };
 
 class MP4ControllerFakeTest : public ::testing::Test {
 protected:
-    void SetUp() override {
-        mPlayer = new FakeMediaPlayer();
-        mController = new MP4Controller(mPlayer);
-        attach(*mController, mListeners);
-    }
-    void TearDown() override {
-        mController->stop();
-        mController.clear();
-    }
+    void SetUp() override { attach(*mController, mListeners); }
+    // The controller goes before the listeners it reports to.
+    void TearDown() override { mController->stop(); }
     TraceCapture mTrace;
     Listeners mListeners;
-    sp<FakeMediaPlayer> mPlayer;
-    sp<MP4Controller> mController;
+    sp<FakeMediaPlayer> mPlayer = new FakeMediaPlayer();
+    sp<MP4Controller> mController = new MP4Controller(mPlayer);
 };
 
-TEST_F(MP4ControllerFakeTest, StartsMutedUntilAudioIsEnabledAndStopClearsTheListener) {
+// The calls reach the player in order: muted until audio is enabled, the listener
+// cleared on stop, and a seek to the position asked for (the file test only seeks
+// back to the start).
+TEST_F(MP4ControllerFakeTest, StartsMutedUntilAudioIsEnabledStopClearsTheListenerAndSeeks) {
     SKIP_IF_TIMERS_UNSUPPORTED();
     mController->start();
     mController->stop();
     mController->setAudioEnable(1);
     mController->start();
     mController->setAudioEnable(0);
-    EXPECT_EQ(mPlayer->calls(),
+    EXPECT_EQ(mController->seek(1500), 0u);
+    EXPECT_EQ(mPlayer->snapshot(),
               (std::vector<std::string>{"listener", "volume off", "prepare", "start", "stop",
                                         "no listener", "volume on", "listener", "volume on",
-                                        "prepare", "start", "volume off"}));
-}
-
-// The file test seeks back to the start; a seek elsewhere must reach the player too.
-TEST_F(MP4ControllerFakeTest, SeeksToTheGivenPosition) {
-    EXPECT_EQ(mController->seek(1500), 0u);
-    EXPECT_EQ(mPlayer->calls(), std::vector<std::string>{"seekTo 1500"});
+                                        "prepare", "start", "volume off", "seekTo 1500"}));
 }
 
 class MP4ControllerTimeTest : public MP4ControllerFakeTest,

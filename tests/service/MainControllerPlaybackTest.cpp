@@ -4,7 +4,6 @@
 // own so that CTest runs them side by side, each in its own process (one demux
 // source per process).
 #include <gtest/gtest.h>
-#include <unistd.h>
 
 #include <algorithm>
 #include <atomic>
@@ -14,7 +13,6 @@
 #include <fstream>
 #include <iterator>
 #include <map>
-#include <mutex>
 #include <string>
 #include <thread>
 #include <vector>
@@ -53,15 +51,13 @@ public:
     }
     void onFrameRendered(int, int, Uint33) override { ++frames; }
     void onFirstFrameRendered(int, int) override {}
+    // The text comes as 4-byte code points; the captions here are ASCII.
     void onClosedCaptionReceived(unsigned char* text, int length) override {
         std::string utf8;
         for (int i = 0; i + 4 <= length; i += 4) {
             uint32_t cp;
             memcpy(&cp, text + i, 4);
-            if (cp < 0x80)
-                utf8 += static_cast<char>(cp);
-            else
-                utf8 += '?';
+            utf8 += cp < 0x80 ? static_cast<char>(cp) : '?';
         }
         add("CAPTION " + utf8);
     }
@@ -140,6 +136,9 @@ protected:
     android::sp<MainController> mController;
 };
 
+// Test names from the rows' names.
+const auto kByName = [](const auto& info) { return std::string(info.param.name); };
+
 // One row per way a programme carries its audio and clock.
 struct Carriage {
     const char* name;
@@ -180,7 +179,7 @@ INSTANTIATE_TEST_SUITE_P(
                     // the extractor finds the real one.
                     Carriage{"LatmAsAdts", "--latm-as-adts", {{"IsLATMAudio", "0"}}},
                     Carriage{"AdtsAsLatm", "--audio adts --adts-as-latm", {{"IsLATMAudio", "1"}}}),
-    [](const testing::TestParamInfo<Carriage>& info) { return std::string(info.param.name); });
+    kByName);
 
 TEST_F(LivePlayback, WithoutAudioThePlaybackTimerEnablesTheOutputs) {
     // An audio PID that no packet carries (PID 0 would feed the PAT to the audio chain).
@@ -233,7 +232,7 @@ INSTANTIATE_TEST_SUITE_P(
         Fault{"DroppedPackets", "--drop 0x111:13500:40 --drop 0x112:240:3"},
         // The time stamps wrap at 2^33 (ISO/IEC 13818-1, 2.4.3.7) 3 s into the stream.
         Fault{"PtsWrapsAt2Pow33", "--start-pts 8589664592"}),
-    [](const testing::TestParamInfo<Fault>& info) { return std::string(info.param.name); });
+    kByName);
 
 // The audio that reaches the output is FFmpeg's decode of the same frames: from 2 s to
 // 6 s of the stream every sample is FFmpeg's, give or take the last bit of its float to
@@ -244,10 +243,10 @@ TEST_F(LivePlayback, TheSoundIsFFmpegsDecodeOfTheStream) {
     sleepUntil(10.5);
     ASSERT_EQ(mController->stop(), 0u);
     const std::string reference = mDir / "ref.pcm";
-    ASSERT_EQ(system(("ffmpeg -v error -i " + (mDir / "s.ts") +
-                      " -map 0:a:0 -f s16le -acodec pcm_s16le " + reference)
-                         .c_str()),
-              0);
+    const test::CommandResult ffmpeg =
+        test::runCommand("ffmpeg -v error -i " + (mDir / "s.ts") +
+                         " -map 0:a:0 -f s16le -acodec pcm_s16le " + reference);
+    ASSERT_EQ(ffmpeg.exitCode, 0) << ffmpeg.err;
     auto samples = [](const std::string& path, size_t skip) {
         const std::string bytes = test::fileText(path);
         std::vector<int16_t> out((bytes.size() - std::min(skip, bytes.size())) / 2);
@@ -340,25 +339,18 @@ TEST_F(LivePlayback, RepeatedCyclesLeaveNothingBehind) {
         ASSERT_EQ(mController->stop(), 0u);
     }
     mController.clear();
-    std::map<std::string, std::string> config = {{"pcrPid", "273"}, {"videoPid", "273"}};
     for (int i = 0; i < 100; ++i) {
         android::sp<MainController> controller = new MainController();
-        std::map<std::string, std::string> map = config;
-        ASSERT_EQ(controller->configure(map), 0u);
+        std::map<std::string, std::string> config = {{"pcrPid", "273"}, {"videoPid", "273"}};
+        ASSERT_EQ(controller->configure(config), 0u);
     }
     // The controller's own rings and threads are gone with it.
     EXPECT_LE(count("/proc/self/fd"), fds);
     EXPECT_EQ(sharedMappings(), 0u);
     EXPECT_GT(whilePlaying, 0u);  // the count sees the rings at all
-    size_t threads = 0;
-    for (int i = 0; i < 50; ++i) {
-        threads = count("/proc/self/task");
-        if (threads <= threadsBefore + 1)
-            break;
-        std::this_thread::sleep_for(std::chrono::milliseconds(100));
-    }
     // glibc keeps one SIGEV_THREAD helper for the playback timer.
-    EXPECT_LE(threads, threadsBefore + 1);
+    EXPECT_TRUE(test::waitUntil([&] { return count("/proc/self/task") <= threadsBefore + 1; }))
+        << count("/proc/self/task") << " threads, " << threadsBefore << " before";
 }
 
 // What a viewer's application may hand over or tune to that cannot play: each row
@@ -410,9 +402,7 @@ INSTANTIATE_TEST_SUITE_P(Tsgen, LiveBadInput,
                              BadInput{"EmptySourceType", "", {{"sourceType", ""}}, 0},
                              BadInput{"SourceWithoutPackets", "udp://127.0.0.1:45987", {}, 0},
                              BadInput{"OnlyNullPackets", "nulls", {}, 0}),
-                         [](const testing::TestParamInfo<BadInput>& info) {
-                             return std::string(info.param.name);
-                         });
+                         kByName);
 
 // Streams that no one here wrote, from ../shared/streams: every packet of their video
 // and audio PIDs reaches the receiver's rings (a capture's 16-byte ISDB-T trailers

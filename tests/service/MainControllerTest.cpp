@@ -5,7 +5,6 @@
 #include <map>
 #include <memory>
 #include <string>
-#include <vector>
 
 #include "support/ScopedEnv.h"
 #include "support/TraceCapture.h"

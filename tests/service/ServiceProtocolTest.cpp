@@ -8,8 +8,8 @@
 
 #include <chrono>
 #include <cstring>
-#include <filesystem>
 #include <string>
+#include <variant>
 #include <vector>
 
 #include "platform/binder/BBinder.h"
@@ -17,6 +17,7 @@
 #include "platform/binder/Parcel.h"
 #include "service/BnCTavoPlayer.h"
 #include "support/Recorded.h"
+#include "support/RunCommand.h"
 
 namespace TavoPlayer {
 namespace {
@@ -116,38 +117,28 @@ private:
     size_t mTaken = 0;
 };
 
-// One service for the whole program, served on a socket in a folder of its own.
+// One service for the whole program, served on a socket in a folder of its own that
+// goes with the program.
 class ServiceProtocolTest : public ::testing::Test {
 protected:
     static void SetUpTestSuite() {
-        char dir[] = "/tmp/tavo-binder-XXXXXX";
-        ASSERT_NE(nullptr, mkdtemp(dir));
-        sDir = dir;
-        setenv("TAVOPLAYER_SERVICE_DIR", dir, 1);
+        sDir = test::tempPath("binder");
+        setenv("TAVOPLAYER_SERVICE_DIR", sDir.c_str(), 1);
         sService = new RecordingService();
         ASSERT_EQ(0,
                   android::defaultServiceManager()->addService(String16("TavoPlayer"), sService));
     }
-    static void TearDownTestSuite() { std::filesystem::remove_all(sDir); }
 
-    static std::string sDir;
-    static sp<RecordingService> sService;
+    static inline std::string sDir;
+    static inline sp<RecordingService> sService;
 };
-std::string ServiceProtocolTest::sDir;
-sp<RecordingService> ServiceProtocolTest::sService;
 
-// One request: arguments after the token, the call the service saw, the reply.
-struct Arg {
-    enum Kind { INT, UINT, TEXT, BINDER } kind;
-    int32_t value = 0;
-    const char* text = nullptr;
-};
-const auto I = [](int32_t v) { return Arg{Arg::INT, v}; };
-const auto U = [](uint32_t v) { return Arg{Arg::UINT, static_cast<int32_t>(v)}; };
-const auto S = [](const char* t) { return Arg{Arg::TEXT, 0, t}; };
-const auto B = [](bool present) { return Arg{Arg::BINDER, present ? 1 : 0}; };
+// One request: arguments after the token, the call the service saw, the reply. A
+// bool argument is a binder: present or null.
+using Arg = std::variant<int32_t, uint32_t, const char*, bool>;
 
-enum ReplyKind { NONE, INT32, INT64 };
+// The reply's kind is its size in bytes.
+enum ReplyKind { NONE = 0, INT32 = 4, INT64 = 8 };
 
 struct Request {
     uint32_t code;
@@ -159,42 +150,47 @@ struct Request {
     bool token = true;
 };
 
+template <typename... Writers>
+struct Overloaded : Writers... {
+    using Writers::operator()...;
+};
+
 TEST_F(ServiceProtocolTest, EveryCodeReadsItsArgumentsInOrderAndReplies) {
     sp<IBinder> token = new android::BBinder();
     const android::status_t unknown = android::UNKNOWN_TRANSACTION;
     const std::vector<Request> table = {
-        {1, {B(true)}, "registerClient(client)", 0, NONE, 0},
+        {1, {true}, "registerClient(client)", 0, NONE, 0},
         {2, {}, "start()", 0, NONE, 0},
         {3, {}, "stop()", 0, NONE, 0},
         {4, {}, "pause()", 0, NONE, 0},
         {5, {}, "resume()", 0, NONE, 0},
-        {6, {I(1500)}, "seek(1500)", 0, NONE, 0},
-        {7, {I(5), S("MTV://a?pcr=256")}, "openUri(MTV://a?pcr=256,5)", 0, NONE, 0},
+        {6, {1500}, "seek(1500)", 0, NONE, 0},
+        {7, {5, "MTV://a?pcr=256"}, "openUri(MTV://a?pcr=256,5)", 0, NONE, 0},
         {8, {}, "close()", 0, NONE, 0},
-        {9, {S("sf"), S(""), I(3), U(0xffffffffu), B(false)}, "setSurface(null)", 0, INT32, 109},
-        {9, {S("sf"), S("x"), I(0), U(0), B(true)}, "setSurface(surface)", 0, INT32, 109},
-        {10, {I(320), I(240)}, "getFrame(320,240)", 0, NONE, 0},
-        {11, {I(2), I(-5)}, "setSoundEffect(2,-5)", 0, INT32, 111},
-        {12, {I(1)}, nullptr, unknown, NONE, 0},
-        {13, {S("MTV://rec")}, "startRecorder(MTV://rec)", 0, INT32, 113},
-        {14, {I(1)}, "stopRecorder(1)", 0, INT32, 114},
+        {9, {"sf", "", 3, 0xffffffffu, false}, "setSurface(null)", 0, INT32, 109},
+        {9, {"sf", "x", 0, 0u, true}, "setSurface(surface)", 0, INT32, 109},
+        {10, {320, 240}, "getFrame(320,240)", 0, NONE, 0},
+        {11, {2, -5}, "setSoundEffect(2,-5)", 0, INT32, 111},
+        {12, {1}, nullptr, unknown, NONE, 0},
+        {13, {"MTV://rec"}, "startRecorder(MTV://rec)", 0, INT32, 113},
+        {14, {1}, "stopRecorder(1)", 0, INT32, 114},
         {15, {}, nullptr, unknown, NONE, 0},
         {16, {}, nullptr, unknown, NONE, 0},
-        {17, {I(150)}, "setAVSync(150)", 0, INT32, 117},
-        {18, {I(-3)}, "setCaptionSync(-3)", 0, INT32, 118},
-        {19, {I(2)}, "setCaptionLanguage(2)", 0, NONE, 0},
-        {20, {I(0)}, "setAudioEnable(0)", 0, NONE, 0},
-        {21, {I(0x111)}, "setAudioPID(273)", 0, NONE, 0},
-        {22, {I(1)}, "setAudioPathForce(1)", 0, NONE, 0},
-        {23, {I(0x130)}, "setCCPID(304)", 0, NONE, 0},
+        {17, {150}, "setAVSync(150)", 0, INT32, 117},
+        {18, {-3}, "setCaptionSync(-3)", 0, INT32, 118},
+        {19, {2}, "setCaptionLanguage(2)", 0, NONE, 0},
+        {20, {0}, "setAudioEnable(0)", 0, NONE, 0},
+        {21, {0x111}, "setAudioPID(273)", 0, NONE, 0},
+        {22, {1}, "setAudioPathForce(1)", 0, NONE, 0},
+        {23, {0x130}, "setCCPID(304)", 0, NONE, 0},
         {24, {}, "getFrameRate()", 0, INT32, 124},
         {25, {}, "getState()", 0, INT32, 125},
-        {26, {I(1), I(2), I(3), I(4), I(5)}, "setCropRect(1,2,3,4,5)", 0, INT32, 126},
-        {27, {I(1)}, "setAudioOnlyMode(1)", 0, INT32, 127},
+        {26, {1, 2, 3, 4, 5}, "setCropRect(1,2,3,4,5)", 0, INT32, 126},
+        {27, {1}, "setAudioOnlyMode(1)", 0, INT32, 127},
         {28, {}, "getPCRValue()", 0, INT64, 0x123456789ABLL},
         {29, {}, nullptr, unknown, NONE, 0},
         // A request too short for its arguments is refused without a call.
-        {26, {I(1), I(2)}, nullptr, android::BAD_VALUE, NONE, 0},
+        {26, {1, 2}, nullptr, android::BAD_VALUE, NONE, 0},
         {2, {}, nullptr, -1, NONE, 0, false},
         // The last row calls, so no stray call from the rows above goes unseen.
         {2, {}, "start()", 0, NONE, 0},
@@ -203,26 +199,19 @@ TEST_F(ServiceProtocolTest, EveryCodeReadsItsArgumentsInOrderAndReplies) {
         SCOPED_TRACE("code " + std::to_string(row.code));
         Parcel data, reply;
         data.writeInterfaceToken(String16(row.token ? "TavoPlayer" : "TavoPlayerX"));
-        for (const Arg& arg : row.args) {
-            if (arg.kind == Arg::INT)
-                data.writeInt32(arg.value);
-            else if (arg.kind == Arg::UINT)
-                data.writeUint32(static_cast<uint32_t>(arg.value));
-            else if (arg.kind == Arg::TEXT)
-                data.writeString16(String16(arg.text));
-            else
-                data.writeStrongBinder(arg.value != 0 ? token : nullptr);
-        }
+        const Overloaded write{
+            [&](int32_t v) { data.writeInt32(v); }, [&](uint32_t v) { data.writeUint32(v); },
+            [&](const char* text) { data.writeString16(String16(text)); },
+            [&](bool binder) { data.writeStrongBinder(binder ? token : nullptr); }};
+        for (const Arg& arg : row.args)
+            std::visit(write, arg);
         EXPECT_EQ(row.status, sService->transact(row.code, data, &reply));
         if (row.call != nullptr) {
             EXPECT_EQ(row.call, sService->next());
         }
-        const size_t replyBytes = row.reply == NONE ? 0 : row.reply == INT32 ? 4 : 8;
-        EXPECT_EQ(replyBytes, reply.dataSize());
-        if (row.reply == INT32) {
-            EXPECT_EQ(row.value, reply.readInt32());
-        } else if (row.reply == INT64) {
-            EXPECT_EQ(row.value, reply.readInt64());
+        EXPECT_EQ(static_cast<size_t>(row.reply), reply.dataSize());
+        if (row.reply != NONE) {
+            EXPECT_EQ(row.value, row.reply == INT32 ? reply.readInt32() : reply.readInt64());
         }
     }
 }
@@ -236,40 +225,31 @@ TEST_F(ServiceProtocolTest, ClientThatNeverReadsDoesNotBlockTheService) {
     addr.sun_family = AF_UNIX;
     snprintf(addr.sun_path, sizeof addr.sun_path, "%s/TavoPlayer", sDir.c_str());
     ASSERT_EQ(0, connect(fd, reinterpret_cast<sockaddr*>(&addr), sizeof addr));
-    auto frame = [](uint32_t code, uint64_t tid, const Parcel& body, bool withBinder) {
-        // The frame layout of docs/protocol.md, built without the library.
-        std::vector<uint8_t> f(40 + body.dataSize() + (withBinder ? 4 : 0), 0);
-        const uint32_t header[] = {0x31425654,
-                                   1,
-                                   0,
-                                   code,
-                                   1,
-                                   0,
-                                   static_cast<uint32_t>(tid),
-                                   0,
-                                   static_cast<uint32_t>(body.dataSize()),
-                                   withBinder ? 1u : 0u};
+    // Sends one frame in the layout of docs/protocol.md, built without the library.
+    auto send = [fd](uint32_t code, uint32_t tid, const Parcel& body, bool withBinder) {
+        const uint32_t size = static_cast<uint32_t>(body.dataSize());
+        std::vector<uint8_t> f(40 + size + (withBinder ? 4 : 0), 0);
+        const uint32_t header[] = {0x31425654, 1,   0, code, 1,
+                                   0,          tid, 0, size, withBinder ? 1u : 0u};
         memcpy(f.data(), header, sizeof header);
-        memcpy(f.data() + 40, body.data(), body.dataSize());
+        memcpy(f.data() + 40, body.data(), size);
         if (withBinder) {
-            const uint32_t offset = static_cast<uint32_t>(body.dataSize() - 24);
+            const uint32_t offset = size - 24;
             const uint32_t flat[] = {0x73622a85, 0, 2, 0, 0, 0};  // our object, id 2
             memcpy(f.data() + 40 + offset, flat, sizeof flat);
-            memcpy(f.data() + 40 + body.dataSize(), &offset, 4);
+            memcpy(f.data() + 40 + size, &offset, 4);
         }
-        return f;
+        return ::send(fd, f.data(), f.size(), 0) == static_cast<ssize_t>(f.size());
     };
     Parcel reg;
     reg.writeInterfaceToken(String16("TavoPlayer"));
     reg.write(std::vector<uint8_t>(24, 0).data(), 24);
-    const std::vector<uint8_t> f1 = frame(1, 1, reg, true);
-    ASSERT_EQ(static_cast<ssize_t>(f1.size()), send(fd, f1.data(), f1.size(), 0));
+    ASSERT_TRUE(send(1, 1, reg, true));
     EXPECT_EQ("registerClient(client)", sService->next());
     Parcel flood;
     flood.writeInterfaceToken(String16("TavoPlayer"));
     flood.writeInt32(5000);
-    const std::vector<uint8_t> f2 = frame(19, 2, flood, false);
-    ASSERT_EQ(static_cast<ssize_t>(f2.size()), send(fd, f2.data(), f2.size(), 0));
+    ASSERT_TRUE(send(19, 2, flood, false));
     const std::string result = sService->next();
     int sent = -1, dropped = -1;
     ASSERT_EQ(2, sscanf(result.c_str(), "flood sent=%d dropped=%d", &sent, &dropped)) << result;

@@ -11,20 +11,12 @@
 
 #include "support/MediaTestFiles.h"
 #include "support/NamedRow.h"
+#include "support/Sanitizers.h"
 #include "support/TraceCapture.h"
 #include "support/TsTestUtil.h"
 
 namespace TavoPlayer::test {
 namespace {
-
-// glibc runs a timer's notifications from a helper thread that ThreadSanitizer never
-// sees created, and its runtime crashes there at the first expiry: tests that arm the
-// controller's timer run in the other builds only.
-#if defined(__SANITIZE_THREAD__)
-#define SKIP_IF_TIMERS_UNSUPPORTED() GTEST_SKIP() << "SIGEV_THREAD timers under ThreadSanitizer"
-#else
-#define SKIP_IF_TIMERS_UNSUPPORTED() (void)0
-#endif
 
 using android::sp;
 

@@ -10,7 +10,7 @@ packages=(
   libgtest-dev libgmock-dev libbenchmark-dev
   android-libutils-dev android-libcutils-dev
   libavcodec-dev libavformat-dev libavutil-dev libswscale-dev libswresample-dev
-  ffmpeg libdvbpsi-dev libsqlite3-dev libdvbv5-dev
+  ffmpeg libdvbpsi-dev libsqlite3-dev libdvbv5-dev zlib1g-dev
   libsdl2-dev libasound2-dev libmpv-dev mpv xvfb xauth x11-utils
 )
 

@@ -9,8 +9,8 @@
 #include <cstdlib>
 #include <cstring>
 
+#include "QuietFuzzInitialize.h"
 #include "platform/binder/Parcel.h"
-#include "platform/os/Trace.h"
 #include "service/BnCTavoPlayer.h"
 
 namespace {
@@ -51,12 +51,6 @@ private:
 };
 
 }  // namespace
-
-extern "C" int LLVMFuzzerInitialize(int*, char***) {
-    setenv("TAVOPLAYER_LOG_LEVEL", "none", 0);
-    OneSegPGL_InitializeDebug();
-    return 0;
-}
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     if (size < 4 || size > (1u << 16))

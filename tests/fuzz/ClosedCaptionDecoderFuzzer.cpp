@@ -4,12 +4,11 @@
 // empty screen. A written caption must be at most three rows of 32 code points.
 #include <cstdint>
 #include <cstdlib>
-#include <cstring>
-#include <memory>
 
 #include "common/data/ClosedCaptionFragmentData.h"
 #include "decoder/ClosedCaptionDecoder.h"
 #include "platform/os/Trace.h"
+#include "support/CaptionBuilder.h"
 
 namespace {
 
@@ -28,23 +27,12 @@ extern "C" int LLVMFuzzerInitialize(int*, char***) {
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     using TavoPlayer::ClosedCaptionDecoder;
-    using TavoPlayer::PESData;
     if (size > (1u << 16))
         return 0;
-    const size_t recordSize = PESData::kHeaderSize + size;
-    auto record = std::make_unique<uint8_t[]>(recordSize);
-    PESData header;
-    header.mSize = static_cast<uint32_t>(recordSize);
-    header.mPTS = 12345;
-    header.mOffsetES = PESData::kHeaderSize;
-    header.mSizeES = static_cast<uint32_t>(size);
-    memcpy(record.get(), static_cast<const void*>(&header), PESData::kHeaderSize);
-    if (size != 0)
-        memcpy(record.get() + PESData::kHeaderSize, data, size);
-
+    TavoPlayer::test::OwnedPesRecord record(std::vector<uint8_t>(data, data + size), 12345);
     android::sp<ClosedCaptionDecoder> decoder = new ClosedCaptionDecoder();
     decoder->addOutput(*gOutput, nullptr);
-    const unsigned int result = decoder->processPacket(reinterpret_cast<PESData*>(record.get()));
+    const unsigned int result = decoder->processPacket(record.get());
     TavoPlayer::RingBuffer& output = **gOutput;
     const bool written = output.usedSpace() > 0;
     if ((result == ClosedCaptionDecoder::RESULT_WRITTEN) != written)

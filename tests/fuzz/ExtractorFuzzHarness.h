@@ -5,6 +5,7 @@
 // beyond the record's end, which must never be read) and that many ES bytes.
 #pragma once
 
+#include <algorithm>
 #include <cstdint>
 #include <cstdlib>
 #include <cstring>
@@ -42,9 +43,7 @@ inline void writeRecord(RingBuffer& ring, const uint8_t* es, uint32_t size, bool
     record->mOffsetES = PESData::kHeaderSize;
     record->mSizeES = lie ? size * 7 + 1000 : size;
     record->mPTS = pts;
-    if (size > 0) {
-        std::memcpy(record->pesBytes(), es, size);
-    }
+    std::memcpy(record->pesBytes(), es, size);  // `es` is inside the input: never null
     ring.commitWrite(recordSize);
 }
 
@@ -57,9 +56,7 @@ void feedRecords(RingBuffer& ring, const uint8_t* data, size_t size, size_t at, 
         const bool lie = (data[at] & 0x80) != 0;
         uint32_t length = ((data[at] & 0x7F) << 8) | data[at + 1];
         at += 2;
-        if (length > size - at) {
-            length = static_cast<uint32_t>(size - at);
-        }
+        length = std::min(length, static_cast<uint32_t>(size - at));
         writeRecord(ring, data + at, length, lie, pts);
         at += length;
         if (!afterEach()) {

@@ -7,7 +7,6 @@
 #include <cstdio>
 #include <filesystem>
 #include <fstream>
-#include <iterator>
 #include <vector>
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size);
@@ -16,11 +15,11 @@ extern "C" __attribute__((weak)) int LLVMFuzzerInitialize(int* argc, char*** arg
 namespace {
 
 void runFile(const std::filesystem::path& path) {
-    std::ifstream in(path, std::ios::binary);
-    const std::vector<char> bytes((std::istreambuf_iterator<char>(in)),
-                                  std::istreambuf_iterator<char>());
-    // An exact-size heap copy, so that a sanitizer build sees any read past the end.
-    std::vector<uint8_t> input(bytes.begin(), bytes.end());
+    // Exactly the file's size on the heap, so that a sanitizer build sees any read past
+    // the end.
+    std::vector<uint8_t> input(std::filesystem::file_size(path));
+    std::ifstream(path, std::ios::binary)
+        .read(reinterpret_cast<char*>(input.data()), static_cast<std::streamsize>(input.size()));
     LLVMFuzzerTestOneInput(input.empty() ? nullptr : input.data(), input.size());
 }
 

@@ -7,16 +7,8 @@
 #include <cstring>
 #include <memory>
 
-#include "platform/os/Trace.h"
+#include "QuietFuzzInitialize.h"
 #include "tsparser/TSPacketParser.h"
-
-extern "C" int LLVMFuzzerInitialize(int*, char***) {
-    // The parsers log every broken input; the fuzzer wants speed, not text. A level
-    // set in the environment still wins, for debugging a reproducer.
-    setenv("TAVOPLAYER_LOG_LEVEL", "none", 0);
-    OneSegPGL_InitializeDebug();
-    return 0;
-}
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     using TavoPlayer::TSPacketParser;

@@ -50,8 +50,7 @@ OwnedPesRecord::OwnedPesRecord(const Bytes& es, uint64_t pts)
     header.mOffsetES = PESData::kHeaderSize;
     header.mSizeES = static_cast<uint32_t>(es.size());
     memcpy(mBytes.get(), static_cast<const void*>(&header), PESData::kHeaderSize);
-    if (!es.empty())
-        memcpy(mBytes.get() + PESData::kHeaderSize, es.data(), es.size());
+    std::copy(es.begin(), es.end(), mBytes.get() + PESData::kHeaderSize);
 }
 
 std::u32string toU32(const unsigned char* bytes, int length) {
@@ -84,8 +83,7 @@ bool writeCaption(RingBuffer& ring, const std::u32string& text, uint64_t pts) {
     auto* record = new (ring.writePointer()) ClosedCaptionFragmentData();
     record->mSize = size;
     record->mPTS = pts;
-    if (!text.empty())
-        memcpy(record->textBytes(), text.data(), text.size() * 4);
+    memcpy(record->textBytes(), text.data(), text.size() * 4);  // data() is never null
     ring.commitWrite(size);
     return true;
 }

@@ -4,6 +4,7 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <vector>
 
 #include "support/TsTestUtil.h"
@@ -11,7 +12,9 @@
 
 namespace TavoPlayer::test {
 
-// The records a TS parser module of `kind` writes for `packets`, given in one batch.
+// The records a TS parser module of `kind` writes for `packets`, given in uneven
+// batches of 1 to 40 packets, as the receiver's reads cut a stream, so that PES
+// packets run across batches.
 inline std::vector<PesRecord> parseTs(const std::vector<uint8_t>& packets, int kind) {
     auto input = makeRing("TS", 1 << 23);
     auto output = makeRing("PES", 1 << 24);
@@ -19,7 +22,12 @@ inline std::vector<PesRecord> parseTs(const std::vector<uint8_t>& packets, int k
     parser->setInput(input);
     parser->addOutput(output, nullptr);
     EXPECT_EQ(parser->start(), 0u);
-    EXPECT_TRUE(writeAll(*input, packets));
+    for (size_t at = 0, step = 1; at < packets.size(); step = step % 37 + 3) {
+        const size_t end = std::min(packets.size(), at + 188 * step);
+        EXPECT_TRUE(
+            writeAll(*input, std::vector<uint8_t>(packets.begin() + at, packets.begin() + end)));
+        at = end;
+    }
     EXPECT_TRUE(waitConsumed(*input));
     auto records = drainRecords(*output);
     EXPECT_EQ(parser->stop(), 0u);

@@ -14,10 +14,6 @@ TraceCapture::~TraceCapture() {
     setTraceSink(std::move(mPrevious));
 }
 
-size_t TraceCapture::count(const std::string& fragment) const {
-    return count(kAnySeverity, fragment);
-}
-
 size_t TraceCapture::count(uint32_t severity, const std::string& fragment) const {
     return mLines.read([&](const std::vector<Line>& lines) {
         return std::ranges::count_if(lines, [&](const Line& line) {

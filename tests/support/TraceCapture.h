@@ -24,7 +24,7 @@ public:
 
     std::vector<Line> lines() const { return mLines.snapshot(); }
     // Number of captured messages whose text contains `fragment`.
-    size_t count(const std::string& fragment) const;
+    size_t count(const std::string& fragment) const { return count(kAnySeverity, fragment); }
     bool contains(const std::string& fragment) const { return count(fragment) > 0; }
     // Number of captured messages of this severity containing `fragment`.
     size_t count(uint32_t severity, const std::string& fragment) const;

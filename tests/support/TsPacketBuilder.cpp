@@ -1,6 +1,7 @@
 #include "TsPacketBuilder.h"
 
 #include <algorithm>
+#include <numeric>
 #include <stdexcept>
 
 namespace TavoPlayer::test {
@@ -87,14 +88,12 @@ std::vector<TsPacket> packetizePes(uint16_t pid, const std::vector<uint8_t>& pes
 
 std::vector<uint8_t> ramp(size_t n, uint8_t first) {
     std::vector<uint8_t> v(n);
-    for (size_t i = 0; i < n; ++i)
-        v[i] = static_cast<uint8_t>(first + i);
+    std::iota(v.begin(), v.end(), first);  // wraps after 0xFF
     return v;
 }
 
 std::vector<uint8_t> concatPackets(const std::vector<TsPacket>& packets) {
     std::vector<uint8_t> bytes;
-    bytes.reserve(packets.size() * 188);
     for (const auto& p : packets)
         bytes.insert(bytes.end(), p.begin(), p.end());
     return bytes;

@@ -11,7 +11,6 @@
 #include <filesystem>
 #include <fstream>
 #include <future>
-#include <iterator>
 #include <stdexcept>
 
 namespace TavoPlayer::test {
@@ -22,15 +21,6 @@ size_t payloadOffset(const uint8_t* packet) {
     if (control == 1)
         return 4;
     return control == 3 ? 5u + packet[4] : 188;
-}
-
-void writeFd(int fd, const std::vector<uint8_t>& bytes) {
-    for (size_t done = 0; done < bytes.size();) {
-        const ssize_t n = ::write(fd, bytes.data() + done, bytes.size() - done);
-        if (n <= 0)
-            throw std::runtime_error("write failed");
-        done += static_cast<size_t>(n);
-    }
 }
 
 }  // namespace
@@ -166,12 +156,7 @@ std::map<uint16_t, std::vector<TsPacket>> packetsByPid(const std::vector<uint8_t
 }
 
 std::vector<uint8_t> bytesOfPid(const std::vector<uint8_t>& ts, uint16_t pid) {
-    std::vector<uint8_t> out;
-    for (size_t at = 0; at + 188 <= ts.size(); at += 188) {
-        if (ts[at] == 0x47 && pidOf(ts.data() + at) == pid)
-            out.insert(out.end(), ts.begin() + at, ts.begin() + at + 188);
-    }
-    return out;
+    return concatPackets(packetsByPid(ts)[pid]);
 }
 
 std::vector<std::string> summary(const std::vector<TsPacket>& packets) {
@@ -189,14 +174,11 @@ std::vector<std::string> summary(const std::vector<TsPacket>& packets) {
 }
 
 TempFile::TempFile(const std::vector<uint8_t>& bytes, const std::string& suffix) {
-    const char* dir = getenv("TMPDIR");
-    std::string name = std::string(dir != nullptr ? dir : "/tmp") + "/tavo_ts_XXXXXX" + suffix;
-    const int fd = mkstemps(name.data(), static_cast<int>(suffix.size()));
-    if (fd < 0)
-        throw std::runtime_error("mkstemps failed");
-    mPath = name;
-    writeFd(fd, bytes);
-    close(fd);
+    static std::atomic<int> count{0};
+    mPath = tempPath("file" + std::to_string(++count) + suffix);
+    std::ofstream(mPath, std::ios::binary)
+        .write(reinterpret_cast<const char*>(bytes.data()),
+               static_cast<std::streamsize>(bytes.size()));
 }
 
 TempFile::~TempFile() {
@@ -222,7 +204,12 @@ StdinPipe::~StdinPipe() {
 }
 
 void StdinPipe::write(const std::vector<uint8_t>& bytes) {
-    writeFd(mWriteFd, bytes);
+    for (size_t done = 0; done < bytes.size();) {
+        const ssize_t n = ::write(mWriteFd, bytes.data() + done, bytes.size() - done);
+        if (n <= 0)
+            throw std::runtime_error("write failed");
+        done += static_cast<size_t>(n);
+    }
 }
 
 void StdinPipe::closeWriter() {

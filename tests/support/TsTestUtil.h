@@ -5,13 +5,11 @@
 
 #include <atomic>
 #include <chrono>
-#include <condition_variable>
 #include <cstdint>
 #include <cstdio>
 #include <cstdlib>
 #include <functional>
 #include <map>
-#include <mutex>
 #include <optional>
 #include <string>
 #include <thread>
@@ -104,7 +102,6 @@ private:
 class ScopedDemuxSource {
 public:
     explicit ScopedDemuxSource(const std::string& value) : mEnv(kVariable, value) {}
-    void set(const std::string& value) { setenv(kVariable, value.c_str(), 1); }
 
 private:
     static constexpr const char* kVariable = "TAVOPLAYER_PROP_tavoplayer_demux_source";

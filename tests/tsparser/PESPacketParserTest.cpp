@@ -13,11 +13,8 @@
 namespace TavoPlayer {
 namespace {
 
+using namespace test;
 using test::PrintTo;
-
-using test::PesBuilder;
-using test::ramp;
-using test::TraceCapture;
 
 // --- where the elementary stream starts, by stream id and header ---------------------
 
@@ -39,20 +36,16 @@ TEST_P(PESPacketParserLayoutTest, ElementaryStreamPosition) {
     EXPECT_EQ(data.mElementaryStreamSize, c.pes.size() - c.esOffset);
 }
 
-PesBuilder pes(uint8_t streamId) {
-    return PesBuilder(streamId);
-}
-
 // The common layouts (video with PTS and DTS, audio, private_stream_1) are the real
 // captures' in TSParserSharedStreamsTest, padding (0xBE) too; these rows are the
 // rarer rules.
 const LayoutCase kLayouts[] = {
-    {"PrivateStream2AtByte6", pes(0xBF).noOptionalHeader().payload(ramp(50)).build(), 6},
-    {"StuffingInHeader", pes(0xE0).pts(1).stuffing(7).payload(ramp(20)).build(), 21},
+    {"PrivateStream2AtByte6", PesBuilder(0xBF).noOptionalHeader().payload(ramp(50)).build(), 6},
+    {"StuffingInHeader", PesBuilder(0xE0).pts(1).stuffing(7).payload(ramp(20)).build(), 21},
     // The header data length alone places the payload, whatever the flags say.
-    {"LengthWinsOverFlags", pes(0xE0).pts(1).dts(2).headerDataLength(3).payload(ramp(20)).build(),
-     12},
-    {"BadStartBitsAccepted", pes(0xE0).byte6(0x40).pts(1).payload(ramp(20)).build(), 6},
+    {"LengthWinsOverFlags",
+     PesBuilder(0xE0).pts(1).dts(2).headerDataLength(3).payload(ramp(20)).build(), 12},
+    {"BadStartBitsAccepted", PesBuilder(0xE0).byte6(0x40).pts(1).payload(ramp(20)).build(), 6},
     {"TruncatedOptionalHeader", {0, 0, 1, 0xE0, 0, 2, 0x80, 0x80}, 6},
 };
 INSTANTIATE_TEST_SUITE_P(StreamIds, PESPacketParserLayoutTest, ::testing::ValuesIn(kLayouts),

@@ -12,12 +12,8 @@
 namespace TavoPlayer {
 namespace {
 
+using namespace test;
 using test::PrintTo;
-
-using test::ramp;
-using test::TraceCapture;
-using test::TsPacket;
-using test::TsPacketBuilder;
 
 constexpr uint32_t kPayload = TSPacketParser::RESULT_PAYLOAD;
 constexpr uint32_t kNewPES = TSPacketParser::RESULT_NEW_PES;
@@ -81,15 +77,12 @@ TEST_P(TSPacketParserSequenceTest, ResultsFollowTheCounter) {
     std::vector<TsPacket> packets;  // kept alive: the record points into them
     for (size_t i = 0; i < c.steps.size(); ++i) {
         const Step& s = c.steps[i];
+        // An adaptation field (a random access flag) for controls 2 and 3, a payload
+        // for 1 and 3.
         TsPacketBuilder b;
-        b.pid(0x111).continuity(s.counter).unitStart(s.unitStart);
-        if (s.control == 2) {
-            b.randomAccess();
-        } else if (s.control == 3) {
-            b.randomAccess().payload(ramp(50, static_cast<uint8_t>(i)));
-        } else {
-            b.payload(ramp(184, static_cast<uint8_t>(i)));
-        }
+        b.pid(0x111).continuity(s.counter).unitStart(s.unitStart).randomAccess(s.control != 1);
+        if (s.control != 2)
+            b.payload(ramp(s.control == 3 ? 50 : 184, static_cast<uint8_t>(i)));
         packets.push_back(b.build());
         EXPECT_EQ(parser.parse(packets.back().data(), &data), s.result) << "step " << i;
     }

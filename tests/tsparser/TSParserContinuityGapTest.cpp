@@ -27,11 +27,9 @@ class TSParserContinuityGapTest : public ::testing::TestWithParam<GapCase> {};
 
 TEST_P(TSParserContinuityGapTest, OnlyThePesWithALostPacketIsMissing) {
     const GapCase& c = GetParam();
-    const test::TempFile out({}, ".ts");
-    const auto run =
-        test::runCommand(std::string(TAVO_TSGEN_PATH) + " -d 3 --seed 7 -o " + out.path());
-    ASSERT_EQ(run.exitCode, 0) << "tsgen failed: " << run.err;
-    const std::vector<uint8_t> intact = test::bytesOfPid(test::fileBytes(out.path()), c.pid);
+    const std::string& stream = test::tsgenStream(3, "--seed 7");
+    ASSERT_FALSE(stream.empty()) << "tsgen failed";
+    const std::vector<uint8_t> intact = test::bytesOfPid(test::fileBytes(stream), c.pid);
     const size_t count = intact.size() / 188;
     auto unitStart = [&](size_t i) { return (intact[i * 188 + 1] & 0x40) != 0; };
     // A packet without payload (a PCR alone) does not advance the continuity

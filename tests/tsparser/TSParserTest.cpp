@@ -16,9 +16,8 @@
 namespace TavoPlayer {
 namespace {
 
-using test::PrintTo;
-
 using namespace test;
+using test::PrintTo;
 
 constexpr uint16_t kPid = 0x111;
 

@@ -13,6 +13,14 @@
 // read-modify-write does, then calls libutils' decStrong. Other builds compile nothing.
 
 #if defined(__SANITIZE_THREAD__)
+#define TAVO_TSAN_BUILD 1
+#elif defined(__has_feature)
+#if __has_feature(thread_sanitizer)
+#define TAVO_TSAN_BUILD 1
+#endif
+#endif
+
+#ifdef TAVO_TSAN_BUILD
 
 #include <dlfcn.h>
 #include <utils/RefBase.h>
